@@ -1,0 +1,138 @@
+#include "daemon_log.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <chrono>
+#include <cstdio>
+#include <cstring>
+#include <ctime>
+#include <utility>
+
+#include "file.h"
+#include "ha_log.h"
+#include "terncore.h"
+
+namespace TERN::HA::Daemon {
+
+namespace {
+
+constexpr char BUFFER_DIR[] = "/tmp/ha";
+constexpr char XZ[] = "/bin/xz";
+constexpr char XZ_SUFFIX[] = ".xz";
+constexpr int ARCHIVES = 40;
+constexpr std::int32_t LOCK_TIMEOUT = 60;
+constexpr std::size_t READ_SIZE = 64 * 1024;
+
+using Lock = std::unique_lock<std::timed_mutex>;
+
+// Appends every line of `from` to `to`, each with a newline and a write of its own.
+void moveLines(const File& from, const File& to) {
+    std::string chunk(READ_SIZE, '\0');
+    std::string beginning;  // of a line whose end has not been read yet
+    ssize_t count = 0;
+    while ((count = from.read(chunk.data(), chunk.size())) > 0) {
+        const char* const end = chunk.data() + count;
+        const char* line = chunk.data();
+        while (line != end) {
+            const auto rest = static_cast<std::size_t>(end - line);
+            const auto* const newline = static_cast<const char*>(std::memchr(line, '\n', rest));
+            if (newline == nullptr) {
+                beginning.append(line, rest);
+                break;
+            }
+            const auto size = static_cast<std::size_t>(newline + 1 - line);
+            if (beginning.empty()) {
+                to.write(line, size);
+            } else {
+                beginning.append(line, size);
+                to.write(beginning.data(), beginning.size());
+                beginning.clear();
+            }
+            line = newline + 1;
+        }
+    }
+    if (!beginning.empty()) {
+        beginning += '\n';
+        to.write(beginning.data(), beginning.size());
+    }
+}
+
+}  // namespace
+
+DaemonLog::DaemonLog(std::string directory, std::string fileName)
+    : _logPath(std::move(directory) + fileName),
+      _bufferPath(BUFFER_DIR + std::move(fileName)),
+      _lockTimeout(LOCK_TIMEOUT) {
+    _rotateFiles.reserve(1 + ARCHIVES);
+    _rotateFiles.push_back(_logPath);
+    for (int number = 0; number < ARCHIVES; ++number) {
+        _rotateFiles.push_back(_logPath + "." + std::to_string(number));
+    }
+}
+
+void DaemonLog::set(const std::string& text) {
+    const Lock lock(_mutex, std::chrono::seconds(_lockTimeout));
+    std::string line = _formatedTime();
+    line.reserve(line.size() + text.size() + 2);
+    line += ' ';
+    line += text;
+    line += '\n';
+    const File buffer(_bufferPath.c_str(), O_WRONLY | O_APPEND | O_CREAT);
+    if (buffer.isOpen()) {
+        buffer.write(line.data(), line.size());
+    }
+}
+
+void DaemonLog::writeLogToDisk() {
+    const Lock lock(_mutex, std::chrono::seconds(_lockTimeout));
+    const File log(_logPath.c_str(), O_WRONLY | O_APPEND | O_CREAT);
+    const File buffer(_bufferPath.c_str(), O_RDONLY);
+    if (log.isOpen() && buffer.isOpen()) {
+        moveLines(buffer, log);
+    }
+    // Right after the last read: what others append in between is lost.
+    const File emptied(_bufferPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC);
+}
+
+void DaemonLog::rotate() {
+    const Lock lock(_mutex, std::chrono::seconds(_lockTimeout));
+    for (const std::string& file : _rotateFiles) {
+        if (access(file.c_str(), F_OK) == 0) {
+            _xz(file);
+        }
+    }
+    for (std::size_t i = _rotateFiles.size() - 1; i > 0; --i) {
+        _rename(_rotateFiles[i - 1] + XZ_SUFFIX, _rotateFiles[i] + XZ_SUFFIX);
+    }
+}
+
+std::int64_t DaemonLog::size() const {
+    struct stat info = {};
+    return stat(_logPath.c_str(), &info) == 0 ? info.st_size : 0;
+}
+
+std::string DaemonLog::_formatedTime() const {
+    const std::time_t now = std::time(nullptr);
+    std::tm local = {};
+    tzset();  // localtime_r need not notice that the zone was changed
+    localtime_r(&now, &local);
+
+    std::array<char, 20> dateTime = {};
+    std::array<char, 8> zone = {};
+    std::strftime(dateTime.data(), dateTime.size(), "%Y-%m-%dT%H:%M:%S", &local);
+    std::strftime(zone.data(), zone.size(), "%z", &local);
+    return std::string(dateTime.data()) + std::string(zone.data()).insert(3, ":");
+}
+
+bool DaemonLog::_xz(const std::string& path) const {
+    const std::array<const char*, 3> argv = {XZ, path.c_str(), nullptr};
+    return PLATExecv(XZ, argv.data(), 1) != 0;
+}
+
+bool DaemonLog::_rename(const std::string& from, const std::string& to) const {
+    return std::rename(from.c_str(), to.c_str()) != 0;
+}
+
+}  // namespace TERN::HA::Daemon

@@ -1,0 +1,38 @@
+#pragma once
+
+#include <fcntl.h>
+#include <sys/types.h>
+
+#include <cstddef>
+#include <string>
+
+namespace TERN::HA::Daemon {
+
+// An open file, closed with its scope.
+class File {
+ public:
+    // Opened close-on-exec; `flags` and `mode` as for open(2).
+    File(const char* path, int flags, mode_t mode = 0666);
+    ~File();
+
+    File(const File&) = delete;
+    File& operator=(const File&) = delete;
+
+    bool isOpen() const { return _fd >= 0; }
+
+    // One read(2), begun again when a signal interrupts it. Returns the bytes read, 0 at the end, -1 on
+    // failure.
+    ssize_t read(char* buffer, std::size_t size) const;
+
+    // Writes all of `data`: one write(2), more only where the kernel took part of it. False on failure.
+    bool write(const char* data, std::size_t size) const;
+
+ private:
+    int _fd;
+};
+
+// Puts the bytes of the file at `path`, as far as they can be read, into `content`. False when it cannot be
+// opened.
+bool readFile(const char* path, std::string& content);
+
+}  // namespace TERN::HA::Daemon

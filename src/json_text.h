@@ -1,0 +1,22 @@
+#pragma once
+
+#include <json/json.h>
+
+#include <string>
+
+// JSON as all units read and write it. jsoncpp throws where a value has the wrong shape or nests too deep; no
+// exception passes here.
+
+namespace TERN::HA::Daemon {
+
+// Parses `text`, comments allowed. False, with `value` as it was, when that is no JSON or nests too deep.
+bool parseJson(const std::string& text, Json::Value& value);
+
+// The text of `value`: compact, without line end, keys sorted.
+std::string jsonText(const Json::Value& value);
+
+// `value` read as a string or a bool. False, with `result` as it was, when it cannot be read as one.
+bool readString(const Json::Value& value, std::string& result);
+bool readBool(const Json::Value& value, bool& result);
+
+}  // namespace TERN::HA::Daemon

@@ -1,0 +1,147 @@
+#include "status.h"
+
+#include <chrono>
+#include <ctime>
+
+#include "ha_log.h"
+#include "json_text.h"
+
+namespace TERN::HA::Daemon {
+
+namespace {
+
+using Lock = std::unique_lock<std::timed_mutex>;
+
+// Now by the wall clock. Asked of the kernel here because the standard library's own clock fails after 2038
+// on 32-bit machines.
+std::chrono::system_clock::time_point wallClock() {
+    timespec now = {};
+    clock_gettime(CLOCK_REALTIME, &now);
+    return std::chrono::system_clock::time_point(std::chrono::seconds(now.tv_sec) +
+                                                 std::chrono::nanoseconds(now.tv_nsec));
+}
+
+// Waits up to `timeout` seconds for `mutex`. The lock may come back without it: whoever asked goes ahead all
+// the same.
+Lock lockFor(std::timed_mutex& mutex, std::int32_t timeout) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(timeout);
+    Lock lock(mutex, std::defer_lock);
+    (void)lock.try_lock_until(wallClock() + (deadline - std::chrono::steady_clock::now()));
+    return lock;
+}
+
+Json::Value toArray(const std::set<std::string>& names) {
+    Json::Value array(Json::arrayValue);
+    for (const std::string& name : names) {
+        array.append(name);
+    }
+    return array;
+}
+
+std::set<std::string> toSet(const Json::Value& array) {
+    std::set<std::string> names;
+    for (const Json::Value& element : array) {
+        std::string name;
+        if (readString(element, name)) {
+            names.insert(name);
+        }
+    }
+    return names;
+}
+
+}  // namespace
+
+Status::Status()
+    : isRemoteMDResync(false),
+      isRemoteDiskErrHandling(false),
+      isMDResync(false),
+      isDiskErrHandling(false),
+      isDRBDConnect(true),
+      heartbeatPacketFailRate(0),
+      heartbeatLatency(0),
+      remoteNodeState(0),
+      lockTimeout(5) {}
+
+bool Status::addRemoteNodeState(NodeState state) {
+    const Lock lock = lockFor(remoteNodeStateMutex, lockTimeout);
+    remoteNodeState |= state;
+    return true;
+}
+
+bool Status::delRemoteNodeState(NodeState state) {
+    const Lock lock = lockFor(remoteNodeStateMutex, lockTimeout);
+    remoteNodeState &= ~static_cast<std::uint32_t>(state);
+    return true;
+}
+
+bool Status::isRemoteNodeState(NodeState state) const {
+    return (remoteNodeState & state) != 0;
+}
+
+bool Status::isRemoteAlive() const {
+    return isRemoteNodeState(NodeAlive);
+}
+
+bool Status::isRemoteRebooting() const {
+    return isRemoteNodeState(NodeRebooting) || isRemoteNodeState(NodeRebootPending);
+}
+
+NodeState Status::getRemoteNodeState() const {
+    return static_cast<NodeState>(remoteNodeState.load());
+}
+
+bool Status::setRemoteAlive(bool alive) {
+    if (isRemoteNodeState(NodeAlive) != alive) {
+        HA_LOG(std::string("Remote server status changed to ") + (alive ? "alive" : "dead"));
+    }
+    if (alive) {
+        addRemoteNodeState(NodeAlive);
+        if (isRemoteNodeState(NodeRebooting)) {
+            delRemoteNodeState(NodeRebooting);
+        }
+    } else {
+        delRemoteNodeState(NodeAlive);
+    }
+    return true;
+}
+
+Json::Value Status::getErrHandlingDisk() {
+    const Lock lock = lockFor(errHandlingDiskMutex, lockTimeout);
+    return toArray(errHandlingDisk);
+}
+
+Json::Value Status::getErrHandlingDiskRemote() {
+    const Lock lock = lockFor(errHandlingDiskRemoteMutex, lockTimeout);
+    return toArray(errHandlingDiskRemote);
+}
+
+bool Status::setErrHandlingDisk(const Json::Value& disks) {
+    std::set<std::string> names = toSet(disks);
+    const Lock lock = lockFor(errHandlingDiskMutex, lockTimeout);
+    errHandlingDisk.swap(names);
+    return true;
+}
+
+bool Status::setErrHandlingDiskRemote(const Json::Value& disks) {
+    std::set<std::string> names = toSet(disks);
+    const Lock lock = lockFor(errHandlingDiskRemoteMutex, lockTimeout);
+    errHandlingDiskRemote.swap(names);
+    return true;
+}
+
+Json::Value Status::toJson() {
+    Json::Value json(Json::objectValue);
+    json["isRemoteAlive"] = isRemoteAlive();
+    json["isRemoteMDResync"] = isRemoteMDResync.load();
+    json["isRemoteDiskErrHandling"] = isRemoteDiskErrHandling.load();
+    json["isMDResync"] = isMDResync.load();
+    json["isDiskErrHandling"] = isDiskErrHandling.load();
+    json["isDRBDConnect"] = isDRBDConnect.load();
+    json["heartbeatPacketFailRate"] = static_cast<double>(heartbeatPacketFailRate.load());
+    json["heartbeatLatency"] = static_cast<double>(heartbeatLatency.load());
+    json["diskErrorHandlingDisk"] = getErrHandlingDisk();
+    json["diskErrorHandlingDiskRemote"] = getErrHandlingDiskRemote();
+    return json;
+}
+
+}  // namespace TERN::HA::Daemon
