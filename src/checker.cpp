@@ -1,0 +1,474 @@
+#include "checker.h"
+
+#include <glob.h>
+#include <libgen.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <climits>
+#include <cstdlib>
+#include <cstring>
+#include <mutex>
+#include <sstream>
+#include <string_view>
+#include <vector>
+
+#include "file.h"
+#include "ha_log.h"
+#include "json_text.h"
+#include "terncore.h"
+
+namespace TERN::HA::Daemon {
+
+namespace {
+
+constexpr char ALIVE[] = "alive";
+constexpr char RESYNC[] = "resync";
+constexpr char NOT_RESYNC[] = "not_resync";
+constexpr char DISK_ERR_FLAG[] = "isDiskErrHandling";
+constexpr char DISK_ERR_LIST[] = "errHandlingDisk";
+
+constexpr int REBOOT_ROUNDS = 30;  // a second each
+
+constexpr std::size_t LINE_SIZE = 512;
+using Line = std::array<char, LINE_SIZE>;
+
+const char* const PS_ARGV[] = {"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args", nullptr};
+
+// The paths that match a pattern, sorted.
+class Glob {
+ public:
+    explicit Glob(const char* pattern) : _paths(), _matched(glob64(pattern, 0, nullptr, &_paths) == 0) {}
+    ~Glob() { globfree64(&_paths); }
+
+    Glob(const Glob&) = delete;
+    Glob& operator=(const Glob&) = delete;
+
+    // False when nothing matched or the search failed.
+    bool matched() const { return _matched; }
+    char** begin() const { return _paths.gl_pathv; }
+    char** end() const { return _paths.gl_pathv + _paths.gl_pathc; }
+
+ private:
+    glob64_t _paths;
+    bool _matched;
+};
+
+// The next line, or the next 511 bytes of a longer one, with its newline; false at the end of the output.
+bool readLine(const CommandPipe& pipe, Line& line) {
+    return std::fgets(line.data(), static_cast<int>(line.size()), pipe._fp) != nullptr;
+}
+
+std::vector<std::string> split(const char* line) {
+    std::istringstream stream(line);
+    std::vector<std::string> tokens;
+    std::string token;
+    while (stream >> token) {
+        tokens.push_back(token);
+    }
+    return tokens;
+}
+
+bool startsWith(std::string_view text, std::string_view prefix) {
+    return text.substr(0, prefix.size()) == prefix;
+}
+
+// Counters are whatever a program printed: their sums and differences wrap around instead of overflowing.
+long long add(long long a, long long b) {
+    return static_cast<long long>(static_cast<unsigned long long>(a) + static_cast<unsigned long long>(b));
+}
+
+long long subtract(long long a, long long b) {
+    return static_cast<long long>(static_cast<unsigned long long>(a) - static_cast<unsigned long long>(b));
+}
+
+}  // namespace
+
+// The registrations, in the order in which the checks are documented. This file comes last among the
+// library's sources, so that every source file has its log objects by now.
+CheckerRegister<IsRemoteAlive> IsRemoteAlive::reg(IsRemoteAlive().getType());
+CheckerRegister<IsRemoteMDResync> IsRemoteMDResync::reg(IsRemoteMDResync().getType());
+CheckerRegister<IsRemoteDiskErrHandling> IsRemoteDiskErrHandling::reg(IsRemoteDiskErrHandling().getType());
+CheckerRegister<RebootRemote> RebootRemote::reg(RebootRemote().getType());
+CheckerRegister<GetRemoteHostname> GetRemoteHostname::reg(GetRemoteHostname().getType());
+
+// ---- Liveness ----
+
+std::string IsRemoteAlive::getType() {
+    return "is_alive";
+}
+
+std::string IsRemoteAlive::handle(Status&) {
+    return ALIVE;
+}
+
+bool IsRemoteAlive::operator()() {
+    std::string reply;
+    return _sendToRemote(reply) && reply == ALIVE;
+}
+
+// ---- Host name of the peer ----
+
+std::string GetRemoteHostname::getType() {
+    return "remote_hostname";
+}
+
+std::string GetRemoteHostname::handle(Status&) {
+    return getLocalHostname();
+}
+
+bool GetRemoteHostname::operator()(std::string& hostname) {
+    if (!_sendToRemote(hostname)) {
+        HA_LOG("Failed to get remote hostname");
+        return false;
+    }
+    return true;
+}
+
+// ---- The peer's md resync ----
+
+std::string IsRemoteMDResync::getType() {
+    return "is_md_resync";
+}
+
+std::string IsRemoteMDResync::handle(Status& status) {
+    return status.isMDResync ? RESYNC : NOT_RESYNC;
+}
+
+bool IsRemoteMDResync::operator()() {
+    std::string reply;
+    if (!_sendToRemote(reply)) {
+        HA_LOG("Failed to recv remote md resync responce");
+        return false;
+    }
+    return reply == RESYNC;
+}
+
+// ---- The peer's disk error handling ----
+
+std::string IsRemoteDiskErrHandling::getType() {
+    return "is_disk_err_handling";
+}
+
+std::string IsRemoteDiskErrHandling::handle(Status& status) {
+    Json::Value report(Json::objectValue);
+    report[DISK_ERR_FLAG] = status.isDiskErrHandling.load();
+    report[DISK_ERR_LIST] = status.getErrHandlingDisk();
+    return jsonText(report);
+}
+
+bool IsRemoteDiskErrHandling::operator()(Json::Value& disks) {
+    std::string reply;
+    if (!_sendToRemote(reply)) {
+        HA_LOG("Failed to recv remote disk error handling responce");
+        return false;
+    }
+    Json::Value report;
+    bool isHandling = false;
+    const bool isReadable = parseJson(reply, report) && (report.isObject() || report.isNull()) &&
+                            readBool(report[DISK_ERR_FLAG], isHandling);
+    if (!isReadable) {
+        HA_LOG("Failed to parse remote disk error info");
+        return false;
+    }
+    disks = report[DISK_ERR_LIST];
+    return isHandling;
+}
+
+// ---- Reboot of the peer ----
+
+std::string RebootRemote::getType() {
+    return "reboot_remote";
+}
+
+std::string RebootRemote::handle(Status&) {
+    daemonLog->writeLogToDisk();
+    recordLog->writeLogToDisk();
+    sync();  // the kernel restarts without flushing or unmounting anything
+    const File trigger("/proc/sysrq-trigger", O_WRONLY | O_CREAT | O_TRUNC);
+    if (trigger.isOpen()) {
+        trigger.write("b", 1);
+    }
+    return "";
+}
+
+bool RebootRemote::operator()(Status& status) {
+    std::string ignored;
+    if (!_sendToRemote(ignored)) {
+        HA_LOG("Failed to reboot remote, but keep checking");
+    }
+    status.addRemoteNodeState(NodeRebootPending);
+    for (int round = 0; round < REBOOT_ROUNDS; ++round) {
+        if (!status.isRemoteAlive()) {
+            HA_LOG("Remote offline");
+            break;
+        }
+        sleep(1);
+    }
+    status.addRemoteNodeState(NodeRebooting);
+    status.delRemoteNodeState(NodeRebootPending);
+    return true;
+}
+
+// ---- DRBD ----
+
+bool isDRBDConnect() {
+    // The connection states in which both nodes are linked. Other states contain none of these words.
+    static constexpr std::array<std::string_view, 13> LINKED = {
+        "WFReportParams", "Connected",  "StartingSyncS", "StartingSyncT", "WFBitMapS",
+        "WFBitMapT",      "WFSyncUUID", "SyncSource",    "SyncTarget",    "PausedSyncS",
+        "PausedSyncT",    "VerifyS",    "VerifyT"};
+
+    std::string text;
+    if (!readFile("/proc/drbd", text)) {
+        HA_LOG("Failed to open /proc/drbd");
+        return false;
+    }
+    // No word spans two lines, so that the lines need not be told apart.
+    return std::any_of(LINKED.begin(), LINKED.end(), [&text](std::string_view word) {
+        return memmem(text.data(), text.size(), word.data(), word.size()) != nullptr;
+    });
+}
+
+// ---- md resync and ATA error handling ----
+
+bool isSysfsValue(const std::string& path, const std::string& expected) {
+    const File file(path.c_str(), O_RDONLY);
+    if (!file.isOpen()) {
+        HA_LOG("Failed to open sysfs file " + path);
+        return false;
+    }
+    std::string line;
+    std::array<char, 64> buffer = {};
+    ssize_t count = 0;
+    // More than expected is no match any more, whatever follows.
+    while (line.size() <= expected.size() && (count = file.read(buffer.data(), buffer.size())) > 0) {
+        line.append(buffer.data(), static_cast<std::size_t>(count));
+        const std::size_t newline = line.find('\n');
+        if (newline != std::string::npos) {
+            line.resize(newline);
+            break;
+        }
+    }
+    return line == expected;
+}
+
+bool isMDResync() {
+    const Glob arrays("/sys/block/md*");
+    if (!arrays.matched()) {
+        HA_LOG("Failed to set globBuf from /sys/block/md*");
+        return false;
+    }
+    return std::any_of(arrays.begin(), arrays.end(), [](const char* array) {
+        return isSysfsValue(std::string(array) + "/md/sync_action", RESYNC);
+    });
+}
+
+bool isDiskErrHandling(Json::Value& disks) {
+    const Glob ports("/sys/class/ata_port/ata*");
+    if (!ports.matched()) {
+        HA_LOG("Failed to set globBuf from /sys/class/ata_port/ata*");
+        return false;
+    }
+    disks = Json::Value(Json::arrayValue);
+    for (char* const port : ports) {
+        if (!isSysfsValue(std::string(port) + "/error_handling", "1")) {
+            continue;
+        }
+        std::string name;
+        if (devNameByAtaPath(port, name)) {
+            disks.append(name);
+        } else {
+            HA_LOG(std::string("Failed to get dev name by ata path: ") + port);
+        }
+    }
+    return !disks.empty();
+}
+
+bool devNameByAtaPath(char* path, std::string& name) {
+    std::array<char, 8> buffer = {};
+    if (TERNDiskGetDevnamebyAtaPort(buffer.data(), static_cast<int>(buffer.size()), __xpg_basename(path)) ==
+        -1) {
+        return false;
+    }
+    name = buffer.data();
+    return true;
+}
+
+// ---- External programs ----
+
+CommandPipe::CommandPipe(const char* const* argv) : _fp(nullptr), _failed(false), _command(argv[0]) {
+    _fp = PLATPopenv(argv[0], "r", argv);
+    if (_fp == nullptr) {
+        HA_LOG("Failed to exec command: " + _command);
+        _failed = true;
+    }
+}
+
+CommandPipe::~CommandPipe() {
+    if (_fp == nullptr) {
+        return;
+    }
+    const int status = PLATPclose(_fp);
+    if (WIFEXITED(status) && WEXITSTATUS(status) == 0) {
+        _fp = nullptr;
+        return;
+    }
+    HA_LOG("Failed to exec " + _command + " return code: " + std::to_string(status));
+}
+
+float heartbeatLatency() {
+    const std::string peer = remoteIP("");
+    const std::array<const char*, 10> argv = {"/bin/ping", peer.c_str(), "-c",  "3",  "-w",
+                                              "10",        "-i",         "0.2", "-q", nullptr};
+    Line line = {};
+    const CommandPipe ping(argv.data());
+    if (ping._failed) {
+        HA_LOG("Failed to exec ifconfig to get interface status");
+        return 0.0F;
+    }
+    float average = 0.0F;
+    while (readLine(ping, line)) {
+        if (std::sscanf(line.data(), "rtt min/avg/max/mdev = %*f/%f/%*f/%*f ms", &average) == 1) {
+            break;
+        }
+    }
+    return average;
+}
+
+// ---- Interface counters ----
+
+bool InterfaceChecker::networkNonOkRate(float& rate) {
+    std::map<std::string, long long> counters;
+    const std::string ifname = drbdIF("");
+    if (!_interfaceDetail(ifname, counters)) {
+        HA_LOG("Failed to get interface detail");
+        return false;
+    }
+    rate = _rateGet(counters);
+    return true;
+}
+
+bool InterfaceChecker::_interfaceDetail(const std::string& ifname,
+                                        std::map<std::string, long long>& counters) {
+    const std::array<const char*, 3> argv = {"/sbin/ifconfig", "-s", nullptr};
+    const CommandPipe ifconfig(argv.data());
+    if (ifconfig._failed) {
+        HA_LOG("Failed to exec ifconfig to get interface status");
+        return false;
+    }
+    Line line = {};
+    if (!readLine(ifconfig, line)) {
+        HA_LOG("Failed to get title from ifconfig output");
+        return false;
+    }
+    std::map<std::string, long long> columns;  // index of each counter's column, until its value is known
+    if (startsWith(line.data(), "Iface")) {
+        const std::vector<std::string> title = split(line.data());
+        for (std::size_t i = 0; i < title.size(); ++i) {
+            if (startsWith(title[i], "RX") || startsWith(title[i], "TX")) {
+                columns[title[i]] = static_cast<long long>(i);
+            }
+        }
+    }
+    bool isFound = false;
+    while (readLine(ifconfig, line)) {
+        // A prefix suffices (eth1 finds eth10 as well); the first such line counts.
+        if (isFound || columns.empty() || !startsWith(line.data(), ifname)) {
+            continue;
+        }
+        isFound = true;
+        const std::vector<std::string> tokens = split(line.data());
+        for (auto& [name, value] : columns) {
+            const auto index = static_cast<std::size_t>(value);
+            if (index >= tokens.size()) {
+                return false;
+            }
+            value = std::strtoll(tokens[index].c_str(), nullptr, 0);
+            if (value == LLONG_MAX || value == LLONG_MIN) {
+                HA_LOG("strtoll failed: " + tokens[index]);
+                return false;
+            }
+        }
+    }
+    counters = columns;
+    return true;
+}
+
+float InterfaceChecker::_rateGet(const std::map<std::string, long long>& counters) {
+    long long ok = 0;
+    long long nonOk = 0;
+    for (const auto& [name, value] : counters) {
+        long long& total = name.find("OK") != std::string::npos ? ok : nonOk;
+        total = add(total, value);
+    }
+    const float rate = _rateCaculate(subtract(nonOk, _lastNonOkTotal), subtract(ok, _lastOkTotal));
+    _lastOkTotal = ok;
+    _lastNonOkTotal = nonOk;
+    return rate;
+}
+
+float InterfaceChecker::_rateCaculate(long long nonOk, long long ok) {
+    const long long sum = add(nonOk, ok);
+    return sum == 0 ? 0.0F : static_cast<float>(nonOk) / static_cast<float>(sum);
+}
+
+// ---- Recording ----
+
+void recordStatus(Status& status) {
+    recordLog->set("\n" + jsonText(status.toJson()));
+}
+
+void recordCMD(const char* const* argv) {
+    Line line = {};
+    const CommandPipe command(argv);
+    if (command._failed) {
+        HA_LOG("Failed to exec ifconfig to get interface status");
+        return;
+    }
+    std::string output;
+    while (readLine(command, line)) {
+        output += line.data();
+    }
+    // Before the pipe closes: what a failing program printed is recorded, then its failure is reported.
+    recordLog->set("\n" + output);
+}
+
+void recordPS() {
+    recordCMD(static_cast<const char* const*>(PS_ARGV));
+}
+
+void recordDF() {
+    const std::array<const char*, 2> argv = {"/bin/df", nullptr};
+    recordCMD(argv.data());
+}
+
+void recordMemoryInfo() {
+    std::string content;
+    if (!readFile("/proc/meminfo", content)) {
+        HA_LOG("Failed to get meminfo");
+        return;
+    }
+    recordLog->set("\n" + content);
+}
+
+// ---- Host identity ----
+
+std::string getLocalHostname() {
+    static std::mutex mutex;
+    static std::string cache;
+    const std::lock_guard<std::mutex> lock(mutex);
+    if (cache.empty()) {
+        readFile("/tmp/.ha.hostname.original", cache);
+    }
+    return cache;
+}
+
+bool isHadConstraints() {
+    return PLATExec("/var/packages/FailoverPair/target/sbin/ternha", "--local-has-constraint",
+                    static_cast<const char*>(nullptr)) == 0;
+}
+
+}  // namespace TERN::HA::Daemon

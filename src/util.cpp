@@ -1,0 +1,71 @@
+#include "util.h"
+
+#include <array>
+
+#include "file.h"
+#include "ha_log.h"
+#include "json_text.h"
+#include "terncore.h"
+
+namespace TERN::HA::Daemon::Util {
+
+namespace {
+
+constexpr char PACKAGE_CONFIG[] = "/usr/tern/etc/packages/FailoverPair/ha.conf";
+constexpr char DISK_TABLE[] = "/tmp/ha/info_hd.remote";
+
+// The peer's disks, a JSON object by position; null when there is none.
+Json::Value readDiskTable() {
+    Json::Value table;
+    if (PLATFileExist(DISK_TABLE) == 0) {
+        return table;
+    }
+    std::string text;
+    if (!readFile(DISK_TABLE, text) || !parseJson(text, table) || !(table.isObject() || table.isNull())) {
+        HA_LOG(std::string("Failed to read HD info json: ") + DISK_TABLE);
+        return Json::Value();
+    }
+    return table;
+}
+
+// What a user calls the disk at `position`: a slot of the main unit (M or 0-M) or of an enclosure (N-M).
+std::string readableName(const std::string& position, const std::string& container) {
+    const std::size_t dash = position.find('-');
+    if (dash == std::string::npos) {
+        return "Disk " + position;
+    }
+    const std::string slot = "disk " + position.substr(dash + 1);
+    return position.substr(0, dash) == "0" ? slot : slot + "(" + container + ")";
+}
+
+}  // namespace
+
+std::string getHAHostname() {
+    std::array<char, 64> name = {};
+    if (PLATFileGetKeyValue(PACKAGE_CONFIG, "ha_hostname", name.data(), static_cast<int>(name.size()), 0) <
+        1) {
+        HA_LOG("Failed to get ha hostname");
+    }
+    return name.data();
+}
+
+std::vector<std::string> devListToHumanReadable(const std::vector<std::string>& devices) {
+    const Json::Value table = readDiskTable();
+    if (table.empty()) {
+        return devices;
+    }
+    std::vector<std::string> names;
+    for (const std::string& device : devices) {
+        for (auto member = table.begin(); member != table.end(); ++member) {
+            std::string memberDevice;
+            std::string container;
+            if (member->isObject() && readString((*member)["HD_DEVNAME"], memberDevice) &&
+                memberDevice == device && readString((*member)["HD_CONTAINER"], container)) {
+                names.push_back(readableName(member.name(), container));
+            }
+        }
+    }
+    return names;
+}
+
+}  // namespace TERN::HA::Daemon::Util
