@@ -1,0 +1,208 @@
+#include "socket.h"
+
+#include <sys/socket.h>
+#include <sys/time.h>
+#include <sys/un.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstddef>
+#include <cstring>
+#include <utility>
+
+#include "ha_log.h"
+#include "json_text.h"
+
+namespace TERN::HA::Daemon {
+
+namespace {
+
+constexpr int BACKLOG = 100;
+constexpr std::size_t PATH_LIMIT = sizeof(sockaddr_un::sun_path) - 1;
+
+struct Address {
+    explicit Address(const std::string& path) : name(), size(0) {
+        name.sun_family = AF_UNIX;
+        const std::size_t length = path.copy(static_cast<char*>(name.sun_path), PATH_LIMIT);
+        size = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + length);
+    }
+
+    const sockaddr* get() const { return reinterpret_cast<const sockaddr*>(&name); }
+
+    sockaddr_un name;
+    socklen_t size;
+};
+
+class Connection {
+ public:
+    explicit Connection(int fd) : _fd(fd) {}
+    ~Connection() { close(_fd); }
+
+    Connection(const Connection&) = delete;
+    Connection& operator=(const Connection&) = delete;
+
+ private:
+    int _fd;
+};
+
+// One send. The other side may have gone, which must not end the process and is not the business of the
+// host's own handling of SIGPIPE: the signal is held back in this thread and taken back if this send raised
+// it.
+ssize_t sendText(int fd, const std::string& text) {
+    sigset_t pipeSignal;
+    sigset_t oldMask;
+    sigset_t pending;
+    sigemptyset(&pipeSignal);
+    sigaddset(&pipeSignal, SIGPIPE);
+    sigpending(&pending);
+    const bool wasPending = sigismember(&pending, SIGPIPE) == 1;
+    pthread_sigmask(SIG_BLOCK, &pipeSignal, &oldMask);
+
+    const ssize_t sent = send(fd, text.data(), text.size(), 0);
+    const int error = errno;
+
+    if (sent == -1 && error == EPIPE && !wasPending) {
+        const timespec now = {};
+        sigtimedwait(&pipeSignal, nullptr, &now);
+    }
+    pthread_sigmask(SIG_SETMASK, &oldMask, nullptr);
+    errno = error;
+    return sent;
+}
+
+}  // namespace
+
+DaemonLocalSocket::DaemonLocalSocket(std::string path, unsigned int timeout)
+    : _path(std::move(path)),
+      _timeout(timeout),
+      _hasError(false),
+      _fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)),
+      _buffer() {
+    if (_fd == -1) {
+        _hasError = true;
+        syslog(LOG_ERR, "%s:%d Failed to set socket", __FILE_NAME__, __LINE__);
+    }
+}
+
+DaemonLocalSocket::~DaemonLocalSocket() {
+    if (_fd != -1) {
+        close(_fd);
+    }
+}
+
+bool DaemonLocalSocket::hasError() const {
+    return _hasError;
+}
+
+bool DaemonLocalSocket::serverBind() {
+    const Address address(_path);
+    unlink(static_cast<const char*>(address.name.sun_path));  // left by a server that has gone
+    if (bind(_fd, address.get(), address.size) == -1) {
+        syslog(LOG_ERR, "%s:%d Failed to bind socket %s: %m", __FILE_NAME__, __LINE__, _path.c_str());
+        _hasError = true;
+        return false;
+    }
+    if (listen(_fd, BACKLOG) == -1) {
+        syslog(LOG_ERR, "%s:%d Failed to set listen: %m", __FILE_NAME__, __LINE__);
+        _hasError = true;
+        return false;
+    }
+    return true;
+}
+
+bool DaemonLocalSocket::serverListen() {
+    if (_hasError) {
+        syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
+        return false;
+    }
+    const int fd = accept4(_fd, nullptr, nullptr, SOCK_CLOEXEC);
+    if (fd == -1) {
+        syslog(LOG_ERR, "%s:%d Failed to accept: %m", __FILE_NAME__, __LINE__);
+        return false;
+    }
+    const Connection connection(fd);
+    return _serverListen(fd);
+}
+
+bool DaemonLocalSocket::_serverListen(int fd) {
+    std::fill(std::begin(_buffer), std::end(_buffer), '\0');
+    if (recv(fd, _buffer, sizeof _buffer - 1, 0) == -1) {
+        syslog(LOG_ERR, "%s:%d Failed to recv: %m", __FILE_NAME__, __LINE__);
+        return false;
+    }
+    const char* const text = static_cast<const char*>(_buffer);
+    Json::Value request;
+    if (!parseJson(text, request)) {
+        syslog(LOG_ERR, "%s:%d Failed to parse %s, %m", __FILE_NAME__, __LINE__, text);
+        return false;
+    }
+    Json::Value reply;
+    if (!serverHandle(request, reply)) {
+        syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__, text);
+        return false;
+    }
+    const std::string replyText = jsonText(reply);
+    if (sendText(fd, replyText) == -1) {
+        syslog(LOG_ERR, "%s:%d Failed to send output data: %m", __FILE_NAME__, __LINE__);
+        syslog(LOG_ERR, "%s:%d Data: %s", __FILE_NAME__, __LINE__, replyText.c_str());
+        return false;
+    }
+    return true;
+}
+
+bool DaemonLocalSocket::_clientConnect() {
+    if (static_cast<std::int32_t>(_timeout) >= 1) {
+        timeval timeout = {};
+        timeout.tv_sec = _timeout;
+        if (setsockopt(_fd, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout) == -1) {
+            syslog(LOG_ERR, "%s:%d Failed to set socket timeout", __FILE_NAME__, __LINE__);
+            _hasError = true;
+            return false;
+        }
+    }
+    const Address address(_path);
+    if (connect(_fd, address.get(), address.size) == -1) {
+        const int error = errno;
+        syslog(LOG_ERR, "%s:%d Failed to connect socket %s: %m", __FILE_NAME__, __LINE__, _path.c_str());
+        errno = error;  // for the caller's own line
+        _hasError = true;
+        return false;
+    }
+    return true;
+}
+
+bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& reply) {
+    if (_hasError) {
+        syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
+        return false;
+    }
+    if (!_clientConnect()) {
+        syslog(LOG_ERR, "%s:%d Failed to connect socket server: %m", __FILE_NAME__, __LINE__);
+        _hasError = true;
+        return false;
+    }
+    const std::string requestText = jsonText(request);
+    if (sendText(_fd, requestText) == -1) {
+        syslog(LOG_ERR, "%s:%d Failed to send content: %s", __FILE_NAME__, __LINE__, requestText.c_str());
+        _hasError = true;
+        return false;
+    }
+    std::fill(std::begin(_buffer), std::end(_buffer), '\0');
+    const char* const text = static_cast<const char*>(_buffer);
+    if (recv(_fd, _buffer, sizeof _buffer - 1, 0) == -1) {
+        syslog(LOG_ERR, "%s:%d Failed to recv %s, %m", __FILE_NAME__, __LINE__, text);
+        _hasError = true;
+        return false;
+    }
+    if (!parseJson(text, reply)) {
+        syslog(LOG_ERR, "%s:%d Failed to parse %s, %m", __FILE_NAME__, __LINE__, text);
+        _hasError = true;
+        return false;
+    }
+    return true;
+}
+
+}  // namespace TERN::HA::Daemon
