@@ -1,0 +1,62 @@
+#include "directories.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <iostream>
+
+#include "ha_log.h"
+
+namespace ternhad {
+
+namespace {
+
+constexpr char BUFFER_DIR[] = "/tmp/ha";
+constexpr mode_t PRIVATE_DIR = 0700;
+
+bool complain(const std::string& path, const std::string& reason) {
+    std::cerr << "ternhad: " << path << ": " << reason << '\n';
+    return false;
+}
+
+bool makeDirectory(const std::string& path) {
+    std::error_code error;
+    const std::filesystem::path parent = std::filesystem::path(path).parent_path();
+    std::filesystem::create_directories(parent, error);
+    if (error) {
+        return complain(parent, error.message());
+    }
+    if (mkdir(path.c_str(), PRIVATE_DIR) != 0 && errno != EEXIST) {
+        return complain(path, std::strerror(errno));
+    }
+    return true;
+}
+
+bool isOurs(const char* path) {
+    struct stat info = {};
+    if (lstat(path, &info) != 0) {
+        return complain(path, std::strerror(errno));
+    }
+    if (!S_ISDIR(info.st_mode)) {
+        return complain(path, "not a directory");
+    }
+    if (info.st_uid != geteuid()) {
+        return complain(path, "belongs to another user");
+    }
+    if ((info.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
+        return complain(path, "others can write to it");
+    }
+    return true;
+}
+
+}  // namespace
+
+bool prepareDirectories(const char* socketPath) {
+    return makeDirectory(BUFFER_DIR) && isOurs(BUFFER_DIR) && makeDirectory(TERN::HA::Daemon::LOG_DIR) &&
+           makeDirectory(std::filesystem::path(socketPath).parent_path());
+}
+
+}  // namespace ternhad

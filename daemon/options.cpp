@@ -1,0 +1,93 @@
+#include "options.h"
+
+#include <net/if.h>
+#include <sys/un.h>
+
+#include <CLI/CLI.hpp>
+
+namespace ternhad {
+
+namespace {
+
+constexpr int WRONG_USAGE = 2;
+
+// A path that is bound as it is: neither relative to wherever the process stands nor cut.
+std::string checkSocketPath(const std::string& path) {
+    if (path.empty() || path.front() != '/') {
+        return "not an absolute path: " + path;
+    }
+    if (path.size() >= sizeof(sockaddr_un::sun_path)) {
+        return "longer than 107 characters: " + path;
+    }
+    return {};
+}
+
+std::string checkInterfaceName(const std::string& name) {
+    if (name.empty() || name.size() >= IF_NAMESIZE || name.find_first_of("/ \t") != std::string::npos) {
+        return "not the name of a network interface: " + name;
+    }
+    return {};
+}
+
+void addInterval(CLI::App& app, const std::string& name, Seconds& value, const std::string& description) {
+    app.add_option_function<double>(
+           name, [&value](double seconds) { value = Seconds(seconds); },
+           description + ", seconds from 0.1 to 86400 (default " + CLI::detail::to_string(value.count()) +
+               ")")
+        ->check(CLI::Range(0.1, 86400.0))
+        ->type_name("SECONDS");
+}
+
+}  // namespace
+
+std::optional<int> parseOptions(int argc, const char* const* argv, Options& options) {
+    CLI::App app(
+        "High-availability daemon of one node: watches its peer over the replication link, answers the "
+        "peer's "
+        "questions and serves the control socket. Runs in the foreground until SIGTERM; SIGHUP moves and "
+        "rotates the logs.",
+        "ternhad");
+    app.set_version_flag("--version", std::string("ternhad ") + TERNHA_VERSION);
+    app.set_config("--config", "", "Read options from this file, a line NAME = VALUE each");
+    app.allow_config_extras(CLI::config_extras_mode::error);
+
+    app.add_option("--local-ip", options.localIp, "This node's address on the replication link")
+        ->required()
+        ->check(CLI::ValidIPV4)
+        ->type_name("ADDRESS");
+    app.add_option("--remote-ip", options.remoteIp, "The peer's address on the replication link")
+        ->required()
+        ->check(CLI::ValidIPV4)
+        ->type_name("ADDRESS");
+    app.add_option("--interface", options.interface, "The network interface of the replication link")
+        ->required()
+        ->check(checkInterfaceName)
+        ->type_name("NAME");
+    app.add_option("--socket", options.socket, "The control socket (default " + options.socket + ")")
+        ->check(checkSocketPath)
+        ->type_name("PATH");
+    addInterval(app, "--check-interval", options.checkInterval,
+                "Between two rounds of local and peer checks");
+    addInterval(app, "--heartbeat-interval", options.heartbeatInterval,
+                "Between two measurements of the link's latency and the interface's packet rate");
+    addInterval(app, "--log-interval", options.logInterval, "Between two moves of the logs to disk");
+    addInterval(app, "--snapshot-interval", options.snapshotInterval,
+                "Between two recordings of status, processes, file systems and memory");
+    app.add_option(
+           "--rotate-size", options.rotateSize,
+           "Size at which a log is rotated, bytes (default " + std::to_string(options.rotateSize) + ")")
+        ->check(CLI::Range(std::int64_t{4096}, std::int64_t{1} << 40))
+        ->type_name("BYTES");
+
+    try {
+        app.parse(argc, argv);
+        if (options.localIp == options.remoteIp) {
+            throw CLI::ValidationError("--remote-ip", "the same address as --local-ip");
+        }
+    } catch (const CLI::ParseError& error) {
+        return app.exit(error) == 0 ? 0 : WRONG_USAGE;
+    }
+    return std::nullopt;
+}
+
+}  // namespace ternhad

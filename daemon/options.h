@@ -1,0 +1,28 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+#include <string>
+
+namespace ternhad {
+
+using Seconds = std::chrono::duration<double>;
+
+struct Options {
+    std::string localIp;    // this node's address on the replication link, dotted quad
+    std::string remoteIp;   // the peer's
+    std::string interface;  // the network interface of that link
+    std::string socket = "/run/ternha/control.sock";
+    Seconds checkInterval = Seconds(1);        // local and peer checks
+    Seconds heartbeatInterval = Seconds(10);   // latency and the interface's rate
+    Seconds logInterval = Seconds(10);         // buffered lines to disk
+    Seconds snapshotInterval = Seconds(3600);  // recording of status, processes, file systems and memory
+    std::int64_t rotateSize = 1024 * 1024;     // bytes of a log at which it is rotated
+};
+
+// Reads the command line and the configuration file that it names. Returns the exit code when the process is
+// to end at once: 0 after --help and --version, 2 after a message on standard error about what is wrong.
+std::optional<int> parseOptions(int argc, const char* const* argv, Options& options);
+
+}  // namespace ternhad
