@@ -12,8 +12,8 @@ extern "C" {
 
 // Runs the program at `path` with the null-terminated argument vector `argv` (argv[0] included); no shell.
 // With `wait` other than 0 it returns after the program has ended: 0 when that exited with status 0, non-zero
-// when it exited otherwise, was ended by a signal or could not be started. With `wait` 0 it returns as soon as
-// the program runs: 0 when it was started, non-zero otherwise.
+// when it exited otherwise, was ended by a signal or could not be started. With `wait` 0 it returns as soon
+// as the program runs: 0 when it was started, non-zero otherwise.
 int PLATExecv(const char* path, const char* const argv[], int wait);
 
 // Runs the program at `path`, which is also its argv[0], with the `const char*` arguments that follow, up to
@@ -30,9 +30,10 @@ FILE* PLATPopenv(const char* path, const char* mode, const char* const argv[]);
 int PLATPclose(FILE* stream);
 
 // Copies the value of `key` in the key-value file `file` into `value`, `size` bytes, always terminated when
-// `size` is at least 1; a longer value is cut. Lines are key=value or key="value"; blanks around key and value,
-// empty lines and lines that begin with '#' do not count; the first line with the key does. `flags` must be 0.
-// Returns 1 on success, 0 when the key is missing, -1 when the file cannot be read or an argument is invalid.
+// `size` is at least 1; a longer value is cut. Lines are key=value or key="value"; blanks around key and
+// value, empty lines and lines that begin with '#' do not count; the first line with the key does. `flags`
+// must be 0. Returns 1 on success, 0 when the key is missing, -1 when the file cannot be read or an argument
+// is invalid.
 int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size, int flags);
 
 // Non-zero when something exists at `path` (links are followed).

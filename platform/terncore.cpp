@@ -1,0 +1,289 @@
+#include "terncore.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstdarg>
+#include <cstring>
+#include <fstream>
+#include <map>
+#include <mutex>
+#include <new>
+#include <string>
+#include <vector>
+
+namespace {
+
+constexpr int FAILURE = -1;
+constexpr int FIRST_PRIVATE_FD = 3;  // above standard input, output and error
+constexpr int NOT_STARTED = 127;     // exit code, as shells use it
+
+// Programs behind open streams.
+std::mutex streamsMutex;
+std::map<FILE*, pid_t>& streams() {
+    static auto* const map = new std::map<FILE*, pid_t>;  // never freed: streams may be closed during exit
+    return *map;
+}
+
+int waitForEnd(pid_t pid) {
+    int status = 0;
+    while (waitpid(pid, &status, 0) == -1) {
+        if (errno != EINTR) {
+            return FAILURE;
+        }
+    }
+    return status;
+}
+
+bool exitedWithSuccess(int status) {
+    return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+}
+
+// Emulators start programs in a way that cannot report a failed exec, so that the usual reasons are looked
+// for beforehand.
+int startError(const char* path) {
+    struct stat info = {};
+    if (stat(path, &info) != 0) {
+        return errno;
+    }
+    if (!S_ISREG(info.st_mode)) {
+        return EACCES;
+    }
+    return access(path, X_OK) == 0 ? 0 : errno;
+}
+
+// Starts a program with default signals, nothing blocked and no descriptor above standard error. `fd`, unless
+// negative, becomes its descriptor `target`. Returns 0 or the error number.
+int start(pid_t* pid, const char* path, const char* const argv[], int fd, int target) {
+    if (path == nullptr || argv == nullptr || argv[0] == nullptr) {
+        return EINVAL;
+    }
+    if (const int error = startError(path); error != 0) {
+        return error;
+    }
+    sigset_t none;
+    sigset_t all;
+    sigemptyset(&none);
+    sigfillset(&all);
+
+    posix_spawnattr_t attributes;
+    posix_spawnattr_init(&attributes);
+    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
+    posix_spawnattr_setsigmask(&attributes, &none);
+    posix_spawnattr_setsigdefault(&attributes, &all);
+
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    if (fd >= 0) {
+        posix_spawn_file_actions_adddup2(&actions, fd, target);
+    }
+    posix_spawn_file_actions_addclosefrom_np(&actions, FIRST_PRIVATE_FD);
+
+    const int error = posix_spawn(pid, path, &actions, &attributes, const_cast<char* const*>(argv), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    posix_spawnattr_destroy(&attributes);
+    return error;
+}
+
+// Runs a program whose end nobody waits for: an intermediate process starts it and ends, so that the system
+// reaps the program.
+int startDetached(const char* path, const char* const argv[]) {
+    const pid_t intermediate = fork();
+    if (intermediate == -1) {
+        return FAILURE;
+    }
+    if (intermediate == 0) {
+        pid_t pid = 0;
+        _exit(start(&pid, path, argv, -1, -1) == 0 ? 0 : NOT_STARTED);
+    }
+    return exitedWithSuccess(waitForEnd(intermediate)) ? 0 : FAILURE;
+}
+
+std::string trimmed(const std::string& text) {
+    constexpr char BLANKS[] = " \t\r";
+    const std::size_t begin = text.find_first_not_of(BLANKS);
+    if (begin == std::string::npos) {
+        return {};
+    }
+    return text.substr(begin, text.find_last_not_of(BLANKS) - begin + 1);
+}
+
+std::string unquoted(const std::string& text) {
+    const bool isQuoted = text.size() >= 2 && text.front() == '"' && text.back() == '"';
+    return isQuoted ? text.substr(1, text.size() - 2) : text;
+}
+
+// True when a component of `path` is `name`.
+bool hasComponent(const std::string& path, const std::string& name) {
+    return ("/" + path + "/").find("/" + name + "/") != std::string::npos;
+}
+
+std::vector<std::string> blockDevices() {
+    std::vector<std::string> names;
+    DIR* const directory = opendir("/sys/block");
+    if (directory == nullptr) {
+        return names;
+    }
+    while (const dirent* const entry = readdir(directory)) {
+        if (entry->d_name[0] != '.') {
+            names.emplace_back(static_cast<const char*>(entry->d_name));
+        }
+    }
+    closedir(directory);
+    std::sort(names.begin(), names.end());
+    return names;
+}
+
+bool isOpticalDrive(const std::string& device) {
+    constexpr char SCSI_CD_ROM[] = "5";
+    std::ifstream file("/sys/block/" + device + "/device/type");
+    std::string type;
+    std::getline(file, type);
+    return type == SCSI_CD_ROM;
+}
+
+std::string devicePath(const std::string& device) {
+    std::string target(4096, '\0');
+    const ssize_t size = readlink(("/sys/block/" + device).c_str(), target.data(), target.size());
+    target.resize(size < 0 ? 0 : static_cast<std::size_t>(size));
+    return target;
+}
+
+}  // namespace
+
+extern "C" {
+
+int PLATExecv(const char* path, const char* const argv[], int wait) {
+    if (wait == 0) {
+        return startDetached(path, argv);
+    }
+    pid_t pid = 0;
+    if (start(&pid, path, argv, -1, -1) != 0) {
+        return FAILURE;
+    }
+    return exitedWithSuccess(waitForEnd(pid)) ? 0 : FAILURE;
+}
+
+int PLATExec(const char* path, ...) try {
+    std::vector<const char*> argv = {path};
+    va_list arguments;
+    va_start(arguments, path);
+    while (argv.back() != nullptr) {
+        argv.push_back(va_arg(arguments, const char*));
+    }
+    va_end(arguments);
+    return PLATExecv(path, argv.data(), 1);
+} catch (const std::bad_alloc&) {
+    return FAILURE;
+}
+
+FILE* PLATPopenv(const char* path, const char* mode, const char* const argv[]) try {
+    const bool isRead = mode != nullptr && std::strcmp(mode, "r") == 0;
+    const bool isWrite = mode != nullptr && std::strcmp(mode, "w") == 0;
+    if (!isRead && !isWrite) {
+        errno = EINVAL;
+        return nullptr;
+    }
+    int ends[2] = {-1, -1};
+    if (pipe2(ends, O_CLOEXEC) != 0) {
+        return nullptr;
+    }
+    const int ours = isRead ? ends[0] : ends[1];
+    const int theirs = isRead ? ends[1] : ends[0];
+
+    pid_t pid = 0;
+    const int error = start(&pid, path, argv, theirs, isRead ? STDOUT_FILENO : STDIN_FILENO);
+    close(theirs);
+    if (error != 0) {
+        close(ours);
+        errno = error;
+        return nullptr;
+    }
+    FILE* const stream = fdopen(ours, mode);
+    if (stream == nullptr) {
+        close(ours);
+        waitForEnd(pid);
+        errno = ENOMEM;
+        return nullptr;
+    }
+    const std::lock_guard<std::mutex> lock(streamsMutex);
+    streams()[stream] = pid;
+    return stream;
+} catch (const std::bad_alloc&) {
+    errno = ENOMEM;
+    return nullptr;
+}
+
+int PLATPclose(FILE* stream) {
+    pid_t pid = 0;
+    {
+        const std::lock_guard<std::mutex> lock(streamsMutex);
+        const auto entry = streams().find(stream);
+        if (entry == streams().end()) {
+            errno = EINVAL;
+            return FAILURE;
+        }
+        pid = entry->second;
+        streams().erase(entry);
+    }
+    std::fclose(stream);
+    return waitForEnd(pid);
+}
+
+int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size, int flags) try {
+    if (file == nullptr || key == nullptr || value == nullptr || size < 1 || flags != 0) {
+        return FAILURE;
+    }
+    value[0] = '\0';
+    std::ifstream stream(file);
+    if (!stream) {
+        return FAILURE;
+    }
+    std::string line;
+    while (std::getline(stream, line)) {
+        line = trimmed(line);
+        const std::size_t separator = line.find('=');
+        if (line.empty() || line.front() == '#' || separator == std::string::npos ||
+            trimmed(line.substr(0, separator)) != key) {
+            continue;
+        }
+        const std::string found = unquoted(trimmed(line.substr(separator + 1)));
+        value[found.copy(value, static_cast<std::size_t>(size) - 1)] = '\0';
+        return 1;
+    }
+    return stream.bad() ? FAILURE : 0;
+} catch (const std::bad_alloc&) {
+    return FAILURE;
+}
+
+int PLATFileExist(const char* path) {
+    struct stat info = {};
+    return path != nullptr && stat(path, &info) == 0 ? 1 : 0;
+}
+
+int TERNDiskGetDevnamebyAtaPort(char* name, int size, const char* port) try {
+    if (name == nullptr || size < 1 || port == nullptr || port[0] == '\0') {
+        return FAILURE;
+    }
+    for (const std::string& device : blockDevices()) {
+        if (!hasComponent(devicePath(device), port) || isOpticalDrive(device)) {
+            continue;
+        }
+        if (device.size() >= static_cast<std::size_t>(size)) {
+            return FAILURE;
+        }
+        name[device.copy(name, static_cast<std::size_t>(size) - 1)] = '\0';
+        return 0;
+    }
+    return FAILURE;
+} catch (const std::bad_alloc&) {
+    return FAILURE;
+}
+}
