@@ -185,7 +185,7 @@ int run(int argc, char** argv) {
 
     CLI::App app("Asks the high-availability daemon of this node, or gives it an order.", "ternhactl");
     app.set_version_flag("--version", std::string("ternhactl ") + TERNHA_VERSION);
-    app.require_subcommand(1);
+    app.require_subcommand(0, 1);
     app.fallthrough();
     app.add_option("--socket", settings.socket,
                    "The daemon's control socket (default " + settings.socket + ")")
@@ -204,8 +204,10 @@ int run(int argc, char** argv) {
         add("status", "Show what the daemon knows of both nodes and the link", status);
     statusApp->add_flag("--json", settings.asJson, "Print the daemon's record as it is, one line of JSON");
     statusApp
-        ->add_flag("--watch{2}", settings.watchInterval,
-                   "Show it again every 2 seconds, or every SECONDS with --watch=SECONDS")
+        ->add_option("--watch", settings.watchInterval,
+                     "Show it again every SECONDS, 0.1 to 86400 (every 2 when none are given)")
+        ->expected(0, 1)
+        ->default_str("2")
         ->check(CLI::Range(0.1, 86400.0))
         ->type_name("SECONDS");
     add("rebooting", "Tell whether the peer is being rebooted: yes (exit code 0) or no (1)", rebooting);
@@ -218,6 +220,9 @@ int run(int argc, char** argv) {
 
     try {
         app.parse(argc, argv);
+        if (!command) {
+            throw CLI::RequiredError("A command");
+        }
     } catch (const CLI::ParseError& error) {
         return app.exit(error) == 0 ? 0 : static_cast<int>(ExitCode::WrongUsage);
     }
