@@ -235,5 +235,10 @@ int run(int argc, char** argv) {
 }  // namespace ternhactl
 
 int main(int argc, char** argv) {
-    return ternhactl::run(argc, argv);
+    try {
+        return ternhactl::run(argc, argv);
+    } catch (const std::exception& error) {
+        std::cerr << "ternhactl: " << error.what() << '\n';
+        return static_cast<int>(ternhactl::ExitCode::NoAnswer);
+    }
 }

@@ -187,10 +187,10 @@ std::string metrics(const Report& report) {
               "Share of packets of the replication interface that were not OK.", report.nonOkRate);
     text << "# HELP ternha_disk_error Disks under error handling.\n# TYPE ternha_disk_error gauge\n";
     for (const std::string& device : report.disks) {
-        text << "ternha_disk_error{node=\"local\",device=\"" << labelValue(device) << "\"} 1\n";
+        text << R"(ternha_disk_error{node="local",device=")" << labelValue(device) << "\"} 1\n";
     }
     for (const std::string& device : report.peerDisks) {
-        text << "ternha_disk_error{node=\"peer\",device=\"" << labelValue(device) << "\"} 1\n";
+        text << R"(ternha_disk_error{node="peer",device=")" << labelValue(device) << "\"} 1\n";
     }
     return text.str();
 }

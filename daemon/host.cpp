@@ -223,44 +223,55 @@ void Host::checkPeer() {
         return;  // other questions would only delay the next one for life
     }
 
-    bool hasBegun = false;
+    if (!askForDisks() || isStopping()) {
+        return;
+    }
+    askForResync();
+    if (!_isHostnameKnown && !isStopping()) {
+        askForHostname();
+    }
+}
+
+bool Host::askForDisks() {
     const Json::Value unanswered("unanswered");
     Json::Value disks = unanswered;
     const bool isHandling = TERN::HA::Daemon::IsRemoteDiskErrHandling()(disks);
     if (isStopping()) {
-        return;
+        return false;
     }
+    bool hasBegun = false;
     if (disks != unanswered) {
         _unreadableReports = 0;
         _status.setErrHandlingDiskRemote(disks);
         hasBegun = storeFlag(_status.isRemoteDiskErrHandling, isHandling);
-    } else {
-        // Once may be a lost datagram; a live peer whose reports cannot be read again and again has more
-        // disks in trouble than a datagram can list.
-        ++_unreadableReports;
-        if (_unreadableReports > 1) {
-            hasBegun = storeFlag(_status.isRemoteDiskErrHandling, true);
-        }
-        return;
+    } else if (++_unreadableReports > 1) {
+        // Alive in between, so that this is no lost answer: the report was cut because it has more disks than
+        // a datagram holds.
+        hasBegun = storeFlag(_status.isRemoteDiskErrHandling, true);
     }
+    if (hasBegun) {
+        requestSnapshot();
+    }
+    return _unreadableReports != 1;
+}
 
+void Host::askForResync() {
     const bool isResync = TERN::HA::Daemon::IsRemoteMDResync()();
     if (isStopping()) {
         return;
     }
     // No answer and "no resync" look alike: the end of a resync is believed when it is told twice.
-    hasBegun = storeFlag(_status.isRemoteMDResync, isResync || _wasPeerResync) || hasBegun;
-    _wasPeerResync = isResync;
-    if (hasBegun) {
+    if (storeFlag(_status.isRemoteMDResync, isResync || _wasPeerResync)) {
         requestSnapshot();
     }
+    _wasPeerResync = isResync;
+}
 
-    if (!_isHostnameKnown) {
-        std::string hostname;
-        _isHostnameKnown = TERN::HA::Daemon::GetRemoteHostname()(hostname);
-        if (_isHostnameKnown) {
-            HA_LOG("Remote hostname is " + withoutLineEnd(hostname));
-        }
+void Host::askForHostname() {
+    std::string hostname;
+    _isHostnameKnown = TERN::HA::Daemon::GetRemoteHostname()(hostname);
+    if (_isHostnameKnown) {
+        HA_LOG("Remote hostname is " + withoutLineEnd(hostname));
     }
 }
 

@@ -47,6 +47,9 @@ class Host {
     void runChecks();
     void checkLocal();
     void checkPeer();
+    bool askForDisks();  // false when the answer may have been lost: life is to be asked about first
+    void askForResync();
+    void askForHostname();
     void measureLink();
     void keepLogs();
 

@@ -18,7 +18,7 @@ struct Options {
     Seconds heartbeatInterval = Seconds(10);   // latency and the interface's rate
     Seconds logInterval = Seconds(10);         // buffered lines to disk
     Seconds snapshotInterval = Seconds(3600);  // recording of status, processes, file systems and memory
-    std::int64_t rotateSize = 1024 * 1024;     // bytes of a log at which it is rotated
+    std::int64_t rotateSize = 1048576;         // bytes of a log at which it is rotated
 };
 
 // Reads the command line and the configuration file that it names. Returns the exit code when the process is

@@ -23,7 +23,7 @@ constexpr char XZ[] = "/bin/xz";
 constexpr char XZ_SUFFIX[] = ".xz";
 constexpr int ARCHIVES = 40;
 constexpr std::int32_t LOCK_TIMEOUT = 60;
-constexpr std::size_t READ_SIZE = 64 * 1024;
+constexpr std::size_t READ_SIZE = 65536;
 
 using Lock = std::unique_lock<std::timed_mutex>;
 
@@ -121,8 +121,8 @@ std::string DaemonLog::_formatedTime() const {
 
     std::array<char, 20> dateTime = {};
     std::array<char, 8> zone = {};
-    std::strftime(dateTime.data(), dateTime.size(), "%Y-%m-%dT%H:%M:%S", &local);
-    std::strftime(zone.data(), zone.size(), "%z", &local);
+    (void)std::strftime(dateTime.data(), dateTime.size(), "%Y-%m-%dT%H:%M:%S", &local);
+    (void)std::strftime(zone.data(), zone.size(), "%z", &local);
     return std::string(dateTime.data()) + std::string(zone.data()).insert(3, ":");
 }
 

@@ -23,7 +23,7 @@ Json::Value readDiskTable() {
     std::string text;
     if (!readFile(DISK_TABLE, text) || !parseJson(text, table) || !(table.isObject() || table.isNull())) {
         HA_LOG(std::string("Failed to read HD info json: ") + DISK_TABLE);
-        return Json::Value();
+        return {};
     }
     return table;
 }
