@@ -7,7 +7,8 @@
 // The two logs, for every source file that includes this header. All names here have internal linkage: each
 // source file owns a pair of log objects, so that one file's lines never wait for another's. All pairs name
 // the same files. The objects are made while the program or library is loaded and are never freed, so that
-// lines can still be logged while it is being torn down.
+// lines can still be logged while it is being torn down; "used" keeps the pointers, and so the objects from
+// counting as leaks, in files that never log.
 
 namespace TERN::HA::Daemon {
 
@@ -16,10 +17,10 @@ constexpr char DAEMON_LOG_FILE[] = "/ha.daemon.log";
 constexpr char DAEMON_RECORD_FILE[] = "/ha.daemon.record";
 
 // Diagnostic messages.
-[[maybe_unused]] static DaemonLog* const daemonLog = new DaemonLog(LOG_DIR, DAEMON_LOG_FILE);
+[[gnu::used]] static DaemonLog* const daemonLog = new DaemonLog(LOG_DIR, DAEMON_LOG_FILE);
 
 // Snapshots of status, processes, file systems and memory.
-[[maybe_unused]] static DaemonLog* const recordLog = new DaemonLog(LOG_DIR, DAEMON_RECORD_FILE);
+[[gnu::used]] static DaemonLog* const recordLog = new DaemonLog(LOG_DIR, DAEMON_RECORD_FILE);
 
 // Use HA_LOG: it passes the place of its call.
 [[maybe_unused]] static void logAt(const char* file, int line, const std::string& message) {
