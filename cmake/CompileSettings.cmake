@@ -28,7 +28,8 @@ target_compile_options(
             $<$<CXX_COMPILER_ID:GNU>:-Wduplicated-cond>
             $<$<CXX_COMPILER_ID:GNU>:-Wduplicated-branches>
             $<$<CXX_COMPILER_ID:GNU>:-Wlogical-op>
-            $<$<CXX_COMPILER_ID:GNU>:-Wuseless-cast>
+            # A cast that 64-bit types need may be useless between 32-bit ones.
+            $<$<AND:$<CXX_COMPILER_ID:GNU>,$<EQUAL:${CMAKE_SIZEOF_VOID_P},8>>:-Wuseless-cast>
             $<$<BOOL:${TERNHA_WARNINGS_AS_ERRORS}>:-Werror>)
 
 if(TERNHA_SANITIZE)

@@ -1,0 +1,10 @@
+# Cross-compilation for 32-bit ARM (Debian's armhf); what is built runs here under user-mode emulation.
+set(CMAKE_SYSTEM_NAME Linux)
+set(CMAKE_SYSTEM_PROCESSOR arm)
+set(CMAKE_C_COMPILER arm-linux-gnueabihf-gcc)
+set(CMAKE_CXX_COMPILER arm-linux-gnueabihf-g++)
+set(CMAKE_LIBRARY_ARCHITECTURE arm-linux-gnueabihf)
+set(CMAKE_CROSSCOMPILING_EMULATOR qemu-arm;-L;/usr/arm-linux-gnueabihf)
+
+# Libraries come from Debian's foreign-architecture packages, whose headers and package files are shared.
+set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
