@@ -1,0 +1,32 @@
+#pragma once
+
+#include <chrono>
+#include <thread>
+
+namespace test {
+
+/// Asks `predicate` every few milliseconds until it holds or `deadline` has passed on the monotonic clock.
+/// Returns whether it held; it is asked at least once.
+template <typename Predicate>
+bool eventually(std::chrono::milliseconds deadline, Predicate&& predicate) {
+    constexpr std::chrono::milliseconds kInterval{3};
+    const auto end = std::chrono::steady_clock::now() + deadline;
+    while (!predicate()) {
+        if (std::chrono::steady_clock::now() >= end) {
+            return false;
+        }
+        std::this_thread::sleep_for(kInterval);
+    }
+    return true;
+}
+
+/// Measures on the monotonic clock from its construction on.
+class Stopwatch {
+ public:
+    std::chrono::nanoseconds elapsed() const { return std::chrono::steady_clock::now() - start_; }
+
+ private:
+    std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
+};
+
+}  // namespace test
