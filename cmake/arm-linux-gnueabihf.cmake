@@ -4,7 +4,8 @@ set(CMAKE_SYSTEM_PROCESSOR arm)
 set(CMAKE_C_COMPILER arm-linux-gnueabihf-gcc)
 set(CMAKE_CXX_COMPILER arm-linux-gnueabihf-g++)
 set(CMAKE_LIBRARY_ARCHITECTURE arm-linux-gnueabihf)
-set(CMAKE_CROSSCOMPILING_EMULATOR qemu-arm;-L;/usr/arm-linux-gnueabihf)
+# Without a prefix: the emulator would look every path up in it first, "/" included.
+set(CMAKE_CROSSCOMPILING_EMULATOR qemu-arm)
 
 # Libraries come from Debian's foreign-architecture packages, whose headers and package files are shared.
 set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
