@@ -1,0 +1,304 @@
+#include "daemon_log.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <filesystem>
+#include <thread>
+
+#include "daemon_log/clock.h"
+#include "daemon_log/other_unit.h"
+#include "ha_log.h"
+#include "support/files.h"
+#include "support/programs.h"
+#include "support/sandbox.h"
+
+namespace {
+
+using TERN::HA::Daemon::DaemonLog;
+using ::testing::Each;
+using ::testing::ElementsAre;
+using ::testing::MatchesRegex;
+using ::testing::Not;
+using ::testing::SizeIs;
+using ::testing::StartsWith;
+
+constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";
+constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
+
+class DaemonLogTest : public test::SandboxTest {
+ protected:
+    void SetUp() override {
+        test::SandboxTest::SetUp();
+        setenv("TZ", "UTC0", 1);
+    }
+
+    DaemonLog log{"/var/log/ha", "/ha.daemon.log"};
+};
+
+// ---- Lines and their time stamps ----
+
+TEST_F(DaemonLogTest, ALineIsTimeStampSpaceTextAndNewline) {
+    const test::FixedTime now(1794730821);
+    setenv("TZ", "CET-1", 1);
+    log.set("util.cpp:88 Failed to get ha hostname");
+    EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T09:20:21+01:00 util.cpp:88 Failed to get ha hostname\n");
+}
+
+struct Zone {
+    const char* tz;
+    const char* stamp;  // of 2026-11-15 08:20:21 UTC
+};
+
+class ZoneTest : public DaemonLogTest, public ::testing::WithParamInterface<Zone> {};
+
+TEST_P(ZoneTest, TheStampEndsInTheZone) {
+    const test::FixedTime now(1794730821);
+    setenv("TZ", GetParam().tz, 1);
+    log.set("x");
+    EXPECT_EQ(test::readFile(BUFFER), std::string(GetParam().stamp) + " x\n");
+}
+
+INSTANTIATE_TEST_SUITE_P(Zones, ZoneTest,
+                         ::testing::Values(Zone{"UTC0", "2026-11-15T08:20:21+00:00"},
+                                           Zone{"NST3:30", "2026-11-15T04:50:21-03:30"},
+                                           Zone{"IST-5:30", "2026-11-15T13:50:21+05:30"},
+                                           Zone{"NPT-5:45", "2026-11-15T14:05:21+05:45"},
+                                           Zone{"LINT-14", "2026-11-15T22:20:21+14:00"},
+                                           Zone{"AOE12", "2026-11-14T20:20:21-12:00"}));
+
+TEST_F(DaemonLogTest, StampsAreRightAfter2038) {
+    const test::FixedTime now(2177452799);
+    log.set("x");
+    EXPECT_EQ(test::readFile(BUFFER), "2038-12-31T23:59:59+00:00 x\n");
+}
+
+TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheProcess) {
+    const test::FixedTime now(1794730821);
+    log.set("first");
+    setenv("TZ", "CET-1", 1);
+    log.set("second");
+    EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T08:20:21+00:00 first\n2026-11-15T09:20:21+01:00 second\n");
+}
+
+TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheMachine) {
+    const test::FixedTime now(1794730821);
+    unsetenv("TZ");
+    test::removeTree("/etc/localtime");
+    std::filesystem::create_symlink("/usr/share/zoneinfo/Asia/Kolkata", "/etc/localtime");
+    log.set("first");
+    test::removeTree("/etc/localtime");
+    std::filesystem::create_symlink("/usr/share/zoneinfo/America/Phoenix", "/etc/localtime");
+    log.set("second");
+    EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T13:50:21+05:30 first\n2026-11-15T01:20:21-07:00 second\n");
+}
+
+TEST_F(DaemonLogTest, StampsAreThoseOfTheMoment) {
+    const std::time_t before = std::time(nullptr);
+    log.set("x");
+    const std::time_t after = std::time(nullptr);
+    std::tm stamp = {};
+    ASSERT_NE(strptime(test::readFile(BUFFER).c_str(), "%Y-%m-%dT%H:%M:%S+00:00 x", &stamp), nullptr);
+    EXPECT_GE(timegm(&stamp), before);
+    EXPECT_LE(timegm(&stamp), after);
+}
+
+TEST_F(DaemonLogTest, AnyTextIsKeptByteForByte) {
+    const test::FixedTime now(1794730821);
+    const std::string text("\n{}\n\0\xff%s\r\n", 11);
+    log.set(text);
+    EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T08:20:21+00:00 " + text + "\n");
+}
+
+TEST_F(DaemonLogTest, ALineIsDroppedWithoutTheDirectory) {
+    test::removeTree("/tmp/ha");
+    log.set("lost");
+    EXPECT_FALSE(test::exists("/tmp/ha"));
+    test::makeDirectories("/tmp/ha");
+    log.set("kept");
+    EXPECT_THAT(test::messages(test::readFile(BUFFER)), ElementsAre("kept"));
+}
+
+TEST_F(DaemonLogTest, ALineIsDroppedWhileADirectoryIsInTheWay) {
+    test::makeDirectories(BUFFER);
+    log.set("lost");
+    test::removeTree(BUFFER);
+    log.set("kept");
+    EXPECT_THAT(test::messages(test::readFile(BUFFER)), ElementsAre("kept"));
+}
+
+TEST_F(DaemonLogTest, ALineCostsOneOpenOneWriteAndOneClose) {
+    const auto probe =
+        test::run({"strace", "-f", "-o", "/tmp/trace", "-P", "/tmp/ha/probe.log", LOG_PROBE, "3"});
+    ASSERT_EQ(probe.exitCode, 0) << probe.error;
+    std::vector<std::string> calls;
+    for (const std::string& line : test::lines(test::readFile("/tmp/trace"))) {
+        const std::size_t call = line.find_first_not_of("0123456789 ");
+        if (line.find('(') != std::string::npos) {
+            calls.push_back(line.substr(call, line.find('(') - call));
+        }
+    }
+    EXPECT_THAT(calls, ElementsAre("openat", "write", "close", "openat", "write", "close", "openat", "write",
+                                   "close"));
+}
+
+// ---- Objects ----
+
+TEST_F(DaemonLogTest, EachSourceFileHasItsOwnObjectsForTheSameFiles) {
+    EXPECT_NE(TERN::HA::Daemon::daemonLog, test::otherDaemonLog());
+    EXPECT_NE(TERN::HA::Daemon::recordLog, test::otherRecordLog());
+    HA_LOG("here");
+    test::logFromOtherUnit("there");
+    EXPECT_THAT(test::daemonLogMessages(), ElementsAre(test::LogLine("daemon_log_test.cpp", "here"),
+                                                       test::LogLine("other_unit.cpp", "there")));
+}
+
+TEST_F(DaemonLogTest, TheObjectsAreThereBeforeTheSourceFilesOwn) {
+    EXPECT_TRUE(test::wereLogsReadyDuringInitialisation());
+}
+
+TEST_F(DaemonLogTest, ALogLineNamesItsOwnPlace) {
+    const int line = __LINE__ + 1;
+    HA_LOG("message");
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre("daemon_log_test.cpp:" + std::to_string(line) + " message"));
+}
+
+TEST_F(DaemonLogTest, TheRecordLogIsAFileOfItsOwn) {
+    TERN::HA::Daemon::recordLog->set("snapshot");
+    EXPECT_FALSE(test::exists(BUFFER));
+    TERN::HA::Daemon::recordLog->writeLogToDisk();
+    EXPECT_THAT(test::messages(test::readFile("/var/log/ha/ha.daemon.record")), ElementsAre("snapshot"));
+}
+
+// ---- Several writers ----
+
+void logLines(char letter, int count) {
+    DaemonLog log("/var/log/ha", "/ha.daemon.log");
+    for (int i = 0; i < count; ++i) {
+        log.set(std::string(100000, letter));
+    }
+}
+
+void expectWholeLines(int countOfEach) {
+    const std::vector<std::string> messages = test::daemonLogMessages();
+    EXPECT_THAT(messages, SizeIs(2 * countOfEach));
+    for (const char letter : {'a', 'b'}) {
+        EXPECT_EQ(std::count(messages.begin(), messages.end(), std::string(100000, letter)), countOfEach);
+    }
+}
+
+TEST_F(DaemonLogTest, LongLinesOfTwoThreadsArriveWhole) {
+    std::thread a(logLines, 'a', 100);
+    std::thread b(logLines, 'b', 100);
+    a.join();
+    b.join();
+    expectWholeLines(100);
+}
+
+TEST_F(DaemonLogTest, LongLinesOfTwoProcessesArriveWhole) {
+    const pid_t child = fork();
+    if (child == 0) {
+        logLines('a', 100);
+        _exit(0);
+    }
+    logLines('b', 100);
+    int status = -1;
+    ASSERT_EQ(waitpid(child, &status, 0), child);
+    EXPECT_EQ(status, 0);
+    expectWholeLines(100);
+}
+
+// ---- Moving to disk ----
+
+TEST_F(DaemonLogTest, MovesTheLinesInOrderToTheEndOfTheLog) {
+    test::writeFile(LOG, "older\n");
+    log.set("one");
+    log.set("two");
+    const std::string buffered = test::readFile(BUFFER);
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(LOG), "older\n" + buffered);
+    EXPECT_EQ(test::readFile(BUFFER), "");
+}
+
+TEST_F(DaemonLogTest, WithoutABufferMakesAnEmptyOneAndLeavesTheLogAsItIs) {
+    test::writeFile(LOG, "older\n");
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(LOG), "older\n");
+    EXPECT_EQ(test::readFile(BUFFER), "");
+}
+
+TEST_F(DaemonLogTest, WithoutABufferAndALogMakesBothEmpty) {
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(LOG), "");
+    EXPECT_EQ(test::readFile(BUFFER), "");
+}
+
+TEST_F(DaemonLogTest, WithoutTheLogsDirectoryTheBufferIsEmptiedAllTheSame) {
+    test::removeTree("/var/log/ha");
+    log.set("lost");
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(BUFFER), "");
+    test::makeDirectories("/var/log/ha");
+    log.set("kept");
+    log.writeLogToDisk();
+    EXPECT_THAT(test::messages(test::readFile(LOG)), ElementsAre("kept"));
+}
+
+TEST_F(DaemonLogTest, WithADirectoryForABufferNothingIsMoved) {
+    test::makeDirectories(BUFFER);
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(LOG), "");
+}
+
+TEST_F(DaemonLogTest, ALastLineWithoutANewlineGainsOne) {
+    test::writeFile(BUFFER, "whole\ntorn");
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(LOG), "whole\ntorn\n");
+}
+
+TEST_F(DaemonLogTest, EmptyLinesAndZeroBytesAreMovedToo) {
+    const std::string text("\n\na\0b\n\n", 7);
+    test::writeFile(BUFFER, text);
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(LOG), text);
+}
+
+TEST_F(DaemonLogTest, LinesOfAnyLengthAreMovedWhole) {
+    std::string text;
+    for (const std::size_t length : {65534U, 65535U, 65536U, 65537U, 1U, 200000U, 0U, 131072U}) {
+        text += std::string(length, 'x') + '\n';
+    }
+    test::writeFile(BUFFER, text);
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(LOG), text);
+}
+
+TEST_F(DaemonLogTest, EachLineIsAWriteOfItsOwn) {
+    test::writeFile("/tmp/ha/probe.log", "one\ntwo\nthree");
+    // The reboot of a machine must find whole lines: see how the lines reach the file.
+    const auto probe = test::run({"strace", "-f", "-o", "/tmp/trace", "-P", "/var/log/ha/probe.log", "-e",
+                                  "trace=write", LOG_PROBE, "move"});
+    ASSERT_EQ(probe.exitCode, 0) << probe.error;
+    EXPECT_THAT(test::lines(test::readFile("/tmp/trace")),
+                ElementsAre(::testing::HasSubstr("\"one\\n\", 4"), ::testing::HasSubstr("\"two\\n\", 4"),
+                            ::testing::HasSubstr("\"three\\n\", 6"), ::testing::HasSubstr("exited")));
+}
+
+TEST_F(DaemonLogTest, NoLineOfAnotherThreadIsTornByAMove) {
+    std::thread writer(logLines, 'a', 200);
+    DaemonLog other("/var/log/ha", "/ha.daemon.log");
+    for (int i = 0; i < 50; ++i) {
+        other.writeLogToDisk();
+    }
+    writer.join();
+    other.writeLogToDisk();
+    EXPECT_THAT(test::messages(test::readFile(LOG)), Each(std::string(100000, 'a')));
+}
+
+}  // namespace

@@ -1,0 +1,85 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <thread>
+
+#include "daemon_log.h"
+#include "support/files.h"
+#include "support/programs.h"
+#include "support/sandbox.h"
+#include "support/wait.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using TERN::HA::Daemon::DaemonLog;
+using ::testing::ElementsAre;
+
+constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
+
+// A rotation that is stuck in its compressor holds the log's mutex until release().
+class StuckLogTest : public test::SandboxTest {
+ protected:
+    void SetUp() override {
+        test::SandboxTest::SetUp();
+        ASSERT_EQ(mkfifo("/tmp/gate", 0600), 0);
+        // Only the first compressor is stuck.
+        test::replaceProgram("/bin/xz",
+                             "[ -e /tmp/stuck ] && exit 1; : > /tmp/stuck; read line < /tmp/gate; exit 1");
+        test::writeFile(LOG, "log\n");
+        _holder = std::thread([this] { log.rotate(); });
+        ASSERT_TRUE(test::eventually(10s, [] { return test::exists("/tmp/stuck"); }));
+    }
+
+    void TearDown() override {
+        test::writeFile("/tmp/gate", "\n");
+        _holder.join();
+        test::SandboxTest::TearDown();
+    }
+
+    void expectToGoAheadAfterAMinute(const test::Stopwatch& stopwatch) {
+        EXPECT_GE(stopwatch.elapsed(), 60s);
+        EXPECT_LT(stopwatch.elapsed(), 80s);
+    }
+
+    DaemonLog log{"/var/log/ha", "/ha.daemon.log"};
+
+ private:
+    std::thread _holder;
+};
+
+TEST_F(StuckLogTest, ALineIsWrittenAfterAMinute) {
+    const test::Stopwatch stopwatch;
+    log.set("late");
+    expectToGoAheadAfterAMinute(stopwatch);
+    EXPECT_THAT(test::daemonLogMessages(), ElementsAre("late"));
+}
+
+TEST_F(StuckLogTest, TheLinesAreMovedAfterAMinute) {
+    test::writeFile("/tmp/ha/ha.daemon.log", "buffered\n");
+    const test::Stopwatch stopwatch;
+    log.writeLogToDisk();
+    expectToGoAheadAfterAMinute(stopwatch);
+    EXPECT_EQ(test::readFile(LOG), "log\nbuffered\n");
+    EXPECT_EQ(test::bufferText(), "");
+}
+
+TEST_F(StuckLogTest, ARotationGoesAheadAfterAMinute) {
+    test::writeFile(std::string(LOG) + ".3.xz", "archive");
+    const test::Stopwatch stopwatch;
+    log.rotate();
+    expectToGoAheadAfterAMinute(stopwatch);
+    EXPECT_EQ(test::readFile(std::string(LOG) + ".4.xz"), "archive");
+}
+
+TEST_F(StuckLogTest, AnotherObjectForTheSameFilesDoesNotWait) {
+    DaemonLog other("/var/log/ha", "/ha.daemon.log");
+    const test::Stopwatch stopwatch;
+    other.set("at once");
+    EXPECT_LT(stopwatch.elapsed(), 30s);
+    EXPECT_THAT(test::daemonLogMessages(), ElementsAre("at once"));
+    EXPECT_EQ(log.size(), 4);  // does not lock either
+}
+
+}  // namespace

@@ -1,0 +1,194 @@
+#include <sys/stat.h>
+
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "checker.h"
+#include "support/files.h"
+#include "support/programs.h"
+#include "support/sandbox.h"
+#include "util.h"
+
+using namespace std::string_literals;
+using TERN::HA::Daemon::getLocalHostname;
+using TERN::HA::Daemon::isHadConstraints;
+using TERN::HA::Daemon::Util::getHAHostname;
+using test::LogLine;
+using test::removeTree;
+using test::writeFile;
+using ::testing::Each;
+using ::testing::ElementsAre;
+
+namespace {
+
+constexpr const char* kConfig = "/usr/tern/etc/packages/FailoverPair/ha.conf";
+constexpr const char* kHostname = "/tmp/.ha.hostname.original";
+constexpr const char* kTool = "/var/packages/FailoverPair/target/sbin/ternha";
+
+class HaHostnameTest : public test::SandboxTest {
+ protected:
+    void expectNone() {
+        EXPECT_EQ(getHAHostname(), "");
+        EXPECT_THAT(test::daemonLogMessages(), ElementsAre(LogLine("util.cpp", "Failed to get ha hostname")));
+    }
+};
+
+TEST_F(HaHostnameTest, IsReadFromThePackageConfiguration) {
+    writeFile(kConfig, "ha_ip=10.0.0.9\nha_hostname=pair1\nother=x\n");
+    EXPECT_EQ(getHAHostname(), "pair1");
+    EXPECT_EQ(test::bufferText(), "");
+}
+
+TEST_F(HaHostnameTest, IsReadOnEveryCall) {
+    writeFile(kConfig, "ha_hostname=pair1\n");
+    EXPECT_EQ(getHAHostname(), "pair1");
+    writeFile(kConfig, "ha_hostname=pair2\n");
+    EXPECT_EQ(getHAHostname(), "pair2");
+}
+
+TEST_F(HaHostnameTest, AMissingKeyLeavesOneLineInTheLog) {
+    writeFile(kConfig, "hostname=pair1\nha_hostname2=pair2\n");
+    expectNone();
+}
+
+TEST_F(HaHostnameTest, AMissingFileLeavesOneLineInTheLog) {
+    expectNone();
+}
+
+TEST_F(HaHostnameTest, ADirectoryInThePlaceOfTheFileLeavesOneLineInTheLog) {
+    test::makeDirectories(kConfig);
+    expectNone();
+}
+
+TEST_F(HaHostnameTest, AnEmptyValueIsNoFailure) {
+    writeFile(kConfig, "ha_hostname=\n");
+    EXPECT_EQ(getHAHostname(), "");
+    EXPECT_EQ(test::bufferText(), "");
+}
+
+TEST_F(HaHostnameTest, HasAtMost63Characters) {
+    writeFile(kConfig, "ha_hostname=" + std::string(63, 'p') + "\n");
+    EXPECT_EQ(getHAHostname(), std::string(63, 'p'));
+    writeFile(kConfig, "ha_hostname=" + std::string(63, 'p') + "air\n");
+    EXPECT_EQ(getHAHostname(), std::string(63, 'p'));
+    EXPECT_EQ(test::bufferText(), "");
+}
+
+class LocalHostnameTest : public test::SandboxTest {
+ protected:
+    void TearDown() override {
+        EXPECT_EQ(test::bufferText(), "");
+        SandboxTest::TearDown();
+    }
+};
+
+TEST_F(LocalHostnameTest, KeepsTheLineEnd) {
+    writeFile(kHostname, "node-a\n");
+    EXPECT_EQ(getLocalHostname(), "node-a\n");
+}
+
+TEST_F(LocalHostnameTest, IsTheWholeFileByteForByte) {
+    std::string content = "\n a\0b\r\n\xff"s;
+    for (int i = 0; i < 5000; ++i) {
+        content += "line " + std::to_string(i) + "\n";
+    }
+    writeFile(kHostname, content);
+    EXPECT_EQ(getLocalHostname(), content);
+}
+
+TEST_F(LocalHostnameTest, IsLookedForAgainWhileTheFileIsMissing) {
+    EXPECT_EQ(getLocalHostname(), "");
+    EXPECT_EQ(getLocalHostname(), "");
+    writeFile(kHostname, "node-a");
+    EXPECT_EQ(getLocalHostname(), "node-a");
+}
+
+TEST_F(LocalHostnameTest, IsLookedForAgainWhileTheFileIsEmpty) {
+    writeFile(kHostname, "");
+    EXPECT_EQ(getLocalHostname(), "");
+    writeFile(kHostname, "node-a");
+    EXPECT_EQ(getLocalHostname(), "node-a");
+}
+
+TEST_F(LocalHostnameTest, OnceReadIsKept) {
+    writeFile(kHostname, "node-a");
+    EXPECT_EQ(getLocalHostname(), "node-a");
+    writeFile(kHostname, "pair1");
+    EXPECT_EQ(getLocalHostname(), "node-a");
+    removeTree(kHostname);
+    EXPECT_EQ(getLocalHostname(), "node-a");
+}
+
+TEST_F(LocalHostnameTest, IsEmptyWhileADirectoryIsInTheWay) {
+    test::makeDirectories(kHostname);
+    EXPECT_EQ(getLocalHostname(), "");
+    removeTree(kHostname);
+    writeFile(kHostname, "node-a");
+    EXPECT_EQ(getLocalHostname(), "node-a");
+}
+
+TEST_F(LocalHostnameTest, ManyThreadsMayAskFirst) {
+    const std::string name(100'000, 'n');
+    writeFile(kHostname, name);
+    std::vector<std::string> names(8);
+    std::vector<std::thread> threads;
+    for (std::string& own : names) {
+        threads.emplace_back([&own] { own = getLocalHostname(); });
+    }
+    for (std::thread& thread : threads) {
+        thread.join();
+    }
+    EXPECT_THAT(names, Each(name));
+    EXPECT_EQ(getLocalHostname(), name);
+}
+
+class ConstraintsTest : public test::SandboxTest {
+ protected:
+    void TearDown() override {
+        EXPECT_EQ(test::bufferText(), "");
+        SandboxTest::TearDown();
+    }
+};
+
+TEST_F(ConstraintsTest, ExistWhenTheToolSucceeds) {
+    test::createProgram(kTool, "exit 0");
+    EXPECT_TRUE(isHadConstraints());
+}
+
+TEST_F(ConstraintsTest, DoNotExistWhenTheToolFails) {
+    for (const char* script : {"exit 1", "exit 2", "exit 255"}) {
+        test::createProgram(kTool, script);
+        EXPECT_FALSE(isHadConstraints()) << script;
+    }
+}
+
+TEST_F(ConstraintsTest, DoNotExistWhenTheToolIsKilled) {
+    test::createProgram(kTool, "kill -9 $$");
+    EXPECT_FALSE(isHadConstraints());
+}
+
+TEST_F(ConstraintsTest, DoNotExistWithoutTheTool) {
+    EXPECT_FALSE(isHadConstraints());
+}
+
+TEST_F(ConstraintsTest, DoNotExistWhenTheToolCannotBeRun) {
+    test::createProgram(kTool, "exit 0");
+    ASSERT_EQ(chmod(kTool, 0600), 0);
+    EXPECT_FALSE(isHadConstraints());
+}
+
+TEST_F(ConstraintsTest, TheToolGetsOneArgumentAndItsEndIsAwaited) {
+    test::createProgram(kTool, R"(sleep 0.5; printf '%s\n' "$0" "$#" "$@" > /tmp/arguments)");
+    EXPECT_TRUE(isHadConstraints());
+    EXPECT_EQ(test::readFile("/tmp/arguments"), kTool + "\n1\n--local-has-constraint\n"s);
+}
+
+TEST_F(ConstraintsTest, TheToolIsAskedOnEveryCall) {
+    test::createProgram(kTool, "exit 0");
+    EXPECT_TRUE(isHadConstraints());
+    test::createProgram(kTool, "exit 1");
+    EXPECT_FALSE(isHadConstraints());
+}
+
+}  // namespace

@@ -1,0 +1,88 @@
+#pragma once
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <cstdio>
+#include <initializer_list>
+#include <string>
+#include <vector>
+
+#include "support/files.h"
+#include "support/sandbox.h"
+#include "support/wait.h"
+#include "terncore.h"
+
+namespace platform_test {
+
+constexpr std::chrono::seconds PATIENCE{30};
+
+/// Null-terminated argument vector. It keeps the texts.
+class Arguments {
+ public:
+    Arguments(std::initializer_list<std::string> texts) : _texts(texts) {
+        for (const std::string& text : _texts) {
+            _pointers.push_back(text.c_str());
+        }
+        _pointers.push_back(nullptr);
+    }
+    Arguments(const Arguments&) = delete;
+    Arguments& operator=(const Arguments&) = delete;
+
+    const char* path() const { return _pointers.front(); }
+    const char* const* vector() const { return _pointers.data(); }
+
+ private:
+    std::vector<std::string> _texts;
+    std::vector<const char*> _pointers;
+};
+
+struct Output {
+    std::string text;
+    int status = -1;  ///< as PLATPclose gives it
+};
+
+/// Runs a program behind a stream and reads all that it says.
+inline Output outputOf(const Arguments& arguments) {
+    FILE* const stream = PLATPopenv(arguments.path(), "r", arguments.vector());
+    if (stream == nullptr) {
+        return {"not started", -1};
+    }
+    Output output;
+    for (int character = std::fgetc(stream); character != EOF; character = std::fgetc(stream)) {
+        output.text.push_back(static_cast<char>(character));
+    }
+    output.status = PLATPclose(stream);
+    return output;
+}
+
+/// True when this process has no child, neither a running nor an ended one.
+inline bool hasNoChild() {
+    return waitpid(-1, nullptr, WNOHANG) == -1 && errno == ECHILD;
+}
+
+/// Holds up a shell program that runs `Gate::PASS` until the test opens it.
+class Gate {
+ public:
+    static constexpr char PASS[] = "read line < /tmp/gate";
+
+    Gate() { EXPECT_EQ(mkfifo("/tmp/gate", 0600), 0); }
+
+    /// Waits for the program to come to the gate; false when it does not.
+    static bool open() {
+        return test::eventually(PATIENCE, [] {
+            const int fd = ::open("/tmp/gate", O_WRONLY | O_NONBLOCK | O_CLOEXEC);
+            const bool isOpen = fd != -1 && write(fd, "\n", 1) == 1;
+            if (fd != -1) {
+                close(fd);
+            }
+            return isOpen;
+        });
+    }
+};
+
+}  // namespace platform_test

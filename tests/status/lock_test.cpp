@@ -1,0 +1,130 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <future>
+#include <thread>
+
+#include "status.h"
+#include "support/sandbox.h"
+#include "support/wait.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using namespace TERN::HA::Daemon;
+
+Json::Value disks(const char* name) {
+    Json::Value array(Json::arrayValue);
+    array.append(name);
+    return array;
+}
+
+// Another thread that holds a mutex until the object goes.
+class Holder {
+ public:
+    explicit Holder(std::timed_mutex& mutex) {
+        std::promise<void> held;
+        _thread = std::thread([&mutex, &held, this] {
+            const std::lock_guard<std::timed_mutex> lock(mutex);
+            held.set_value();
+            _release.get_future().wait();
+        });
+        held.get_future().wait();
+    }
+
+    ~Holder() {
+        _release.set_value();
+        _thread.join();
+    }
+
+ private:
+    std::promise<void> _release;
+    std::thread _thread;
+};
+
+class StatusLockTest : public test::SandboxTest {
+ protected:
+    StatusLockTest() {
+        status.setErrHandlingDisk(disks("sda"));
+        status.setErrHandlingDiskRemote(disks("sdb"));
+    }
+
+    // The operation waits five seconds for `mutex`, goes ahead, and leaves the mutex to its holder.
+    void expectToGoAhead(std::timed_mutex& mutex, const std::function<void()>& operation) {
+        {
+            const Holder holder(mutex);
+            const test::Stopwatch stopwatch;
+            operation();
+            EXPECT_GE(stopwatch.elapsed(), 5s);
+            EXPECT_LT(stopwatch.elapsed(), 10s);
+            EXPECT_FALSE(mutex.try_lock());
+        }
+        EXPECT_TRUE(mutex.try_lock());
+        mutex.unlock();
+    }
+
+    Status status;
+};
+
+TEST_F(StatusLockTest, DisksAreReadWithoutTheLock) {
+    expectToGoAhead(status.errHandlingDiskMutex,
+                    [&] { EXPECT_EQ(status.getErrHandlingDisk(), disks("sda")); });
+}
+
+TEST_F(StatusLockTest, DisksAreReplacedWithoutTheLock) {
+    expectToGoAhead(status.errHandlingDiskMutex,
+                    [&] { EXPECT_TRUE(status.setErrHandlingDisk(disks("sdx"))); });
+    EXPECT_EQ(status.getErrHandlingDisk(), disks("sdx"));
+}
+
+TEST_F(StatusLockTest, ThePeersDisksAreReadWithoutTheLock) {
+    expectToGoAhead(status.errHandlingDiskRemoteMutex,
+                    [&] { EXPECT_EQ(status.getErrHandlingDiskRemote(), disks("sdb")); });
+}
+
+TEST_F(StatusLockTest, ThePeersDisksAreReplacedWithoutTheLock) {
+    expectToGoAhead(status.errHandlingDiskRemoteMutex,
+                    [&] { EXPECT_TRUE(status.setErrHandlingDiskRemote(disks("sdx"))); });
+    EXPECT_EQ(status.getErrHandlingDiskRemote(), disks("sdx"));
+}
+
+TEST_F(StatusLockTest, BitsAreSetWithoutTheLock) {
+    expectToGoAhead(status.remoteNodeStateMutex,
+                    [&] { EXPECT_TRUE(status.addRemoteNodeState(NodeRebooting)); });
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+TEST_F(StatusLockTest, BitsAreClearedWithoutTheLock) {
+    status.addRemoteNodeState(NodeAlive | NodeRebooting);
+    expectToGoAhead(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.delRemoteNodeState(NodeAlive)); });
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+TEST_F(StatusLockTest, LifeIsRecordedWithoutTheLock) {
+    expectToGoAhead(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.setRemoteAlive(true)); });
+    EXPECT_TRUE(status.isRemoteAlive());
+}
+
+TEST_F(StatusLockTest, TheJsonFormComesAfterTheWait) {
+    expectToGoAhead(status.errHandlingDiskMutex, [&] { EXPECT_EQ(status.toJson().size(), 10U); });
+}
+
+TEST_F(StatusLockTest, ReadingTheLifeCycleDoesNotLock) {
+    const Holder holder(status.remoteNodeStateMutex);
+    const test::Stopwatch stopwatch;
+    EXPECT_FALSE(status.isRemoteAlive());
+    EXPECT_FALSE(status.isRemoteRebooting());
+    EXPECT_EQ(status.getRemoteNodeState(), 0U);
+    EXPECT_LT(stopwatch.elapsed(), 4s);
+}
+
+TEST_F(StatusLockTest, OneMutexDoesNotHoldUpTheOthers) {
+    const Holder holder(status.errHandlingDiskMutex);
+    const test::Stopwatch stopwatch;
+    status.setErrHandlingDiskRemote(disks("sdc"));
+    status.addRemoteNodeState(NodeAlive);
+    EXPECT_LT(stopwatch.elapsed(), 4s);
+}
+
+}  // namespace

@@ -1,0 +1,219 @@
+#include "status.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <json/json.h>
+
+#include <sstream>
+#include <thread>
+
+#include "support/sandbox.h"
+
+namespace {
+
+using namespace TERN::HA::Daemon;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+Json::Value parsed(const std::string& text) {
+    Json::Value value;
+    std::istringstream(text) >> value;
+    return value;
+}
+
+class StatusTest : public test::SandboxTest {
+ protected:
+    Status status;
+};
+
+TEST_F(StatusTest, ANewRecordHasOnlyTheDrbdLinkUp) {
+    EXPECT_TRUE(status.isDRBDConnect);
+    EXPECT_FALSE(status.isRemoteMDResync);
+    EXPECT_FALSE(status.isRemoteDiskErrHandling);
+    EXPECT_FALSE(status.isMDResync);
+    EXPECT_FALSE(status.isDiskErrHandling);
+    EXPECT_EQ(status.heartbeatPacketFailRate, 0);
+    EXPECT_EQ(status.heartbeatLatency, 0);
+    EXPECT_FALSE(status.isRemoteAlive());
+    EXPECT_FALSE(status.isRemoteRebooting());
+    EXPECT_EQ(status.getRemoteNodeState(), 0U);
+    EXPECT_EQ(status.toJson(), parsed(R"({"isRemoteAlive":false,"isRemoteMDResync":false,
+        "isRemoteDiskErrHandling":false,"isMDResync":false,"isDiskErrHandling":false,"isDRBDConnect":true,
+        "heartbeatPacketFailRate":0.0,"heartbeatLatency":0.0,"diskErrorHandlingDisk":[],
+        "diskErrorHandlingDiskRemote":[]})"));
+}
+
+TEST_F(StatusTest, TheJsonFormHasEveryField) {
+    status.setRemoteAlive(true);
+    status.isRemoteMDResync = true;
+    status.isRemoteDiskErrHandling = true;
+    status.isMDResync = true;
+    status.isDiskErrHandling = true;
+    status.isDRBDConnect = false;
+    status.heartbeatPacketFailRate = 0.1F;
+    status.heartbeatLatency = 2.5F;
+    status.setErrHandlingDisk(parsed(R"(["sdb","sda"])"));
+    status.setErrHandlingDiskRemote(parsed(R"(["sdc"])"));
+    Json::Value expected = parsed(R"({"isRemoteAlive":true,"isRemoteMDResync":true,
+        "isRemoteDiskErrHandling":true,"isMDResync":true,"isDiskErrHandling":true,"isDRBDConnect":false,
+        "heartbeatLatency":2.5,"diskErrorHandlingDisk":["sda","sdb"],"diskErrorHandlingDiskRemote":["sdc"]})");
+    expected["heartbeatPacketFailRate"] = static_cast<double>(0.1F);  // a float, widened
+    const Json::Value json = status.toJson();
+    EXPECT_EQ(json, expected);
+    EXPECT_EQ(json["heartbeatLatency"].type(), Json::realValue);
+    EXPECT_EQ(json["isMDResync"].type(), Json::booleanValue);
+}
+
+TEST_F(StatusTest, EachFlagHasItsOwnKey) {
+    const std::pair<std::atomic<bool>*, const char*> flags[] = {
+        {&status.isRemoteMDResync, "isRemoteMDResync"},
+        {&status.isRemoteDiskErrHandling, "isRemoteDiskErrHandling"},
+        {&status.isMDResync, "isMDResync"},
+        {&status.isDiskErrHandling, "isDiskErrHandling"},
+        {&status.isDRBDConnect, "isDRBDConnect"},
+    };
+    for (const auto& [flag, key] : flags) {
+        const Json::Value before = status.toJson();
+        *flag = !*flag;
+        Json::Value expected = before;
+        expected[key] = !before[key].asBool();
+        EXPECT_EQ(status.toJson(), expected) << key;
+    }
+}
+
+// ---- The peer's life cycle ----
+
+TEST_F(StatusTest, OnlyAChangeOfLifeIsLogged) {
+    EXPECT_TRUE(status.setRemoteAlive(false));
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+    EXPECT_TRUE(status.setRemoteAlive(true));
+    EXPECT_TRUE(status.setRemoteAlive(true));
+    EXPECT_TRUE(status.setRemoteAlive(false));
+    EXPECT_TRUE(status.setRemoteAlive(false));
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("status.cpp", "Remote server status changed to alive"),
+                            test::LogLine("status.cpp", "Remote server status changed to dead")));
+}
+
+TEST_F(StatusTest, LifeSetsAndClearsItsBitAlone) {
+    status.setRemoteAlive(true);
+    EXPECT_TRUE(status.isRemoteAlive());
+    EXPECT_EQ(status.getRemoteNodeState(), NodeAlive);
+    status.setRemoteAlive(false);
+    EXPECT_FALSE(status.isRemoteAlive());
+    EXPECT_EQ(status.getRemoteNodeState(), 0U);
+}
+
+TEST_F(StatusTest, APendingRebootCountsAsRebootingAndOutlivesASignOfLife) {
+    status.addRemoteNodeState(NodeRebootPending);
+    EXPECT_TRUE(status.isRemoteRebooting());
+    status.setRemoteAlive(true);
+    EXPECT_TRUE(status.isRemoteRebooting());
+    EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebootPending);
+}
+
+TEST_F(StatusTest, ASignOfLifeEndsARebootButNotAPendingOne) {
+    status.addRemoteNodeState(NodeRebooting | NodeRebootPending);
+    status.setRemoteAlive(true);
+    EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebootPending);
+}
+
+TEST_F(StatusTest, ARebootEndsAlsoWhenThePeerWasNeverSeenDead) {
+    status.setRemoteAlive(true);
+    status.addRemoteNodeState(NodeRebooting);
+    EXPECT_TRUE(status.isRemoteRebooting());
+    status.setRemoteAlive(true);
+    EXPECT_FALSE(status.isRemoteRebooting());
+}
+
+TEST_F(StatusTest, DeathLeavesTheRebootBits) {
+    status.addRemoteNodeState(NodeAlive | NodeRebootPending | NodeRebooting);
+    status.setRemoteAlive(false);
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebootPending | NodeRebooting);
+}
+
+TEST_F(StatusTest, SeveralBitsAreSetAndClearedAtOnce) {
+    EXPECT_TRUE(status.addRemoteNodeState(NodeRebootPending | NodeRebooting));
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebootPending | NodeRebooting);
+    EXPECT_TRUE(status.isRemoteNodeState(NodeAlive | NodeRebooting));  // any of them
+    EXPECT_FALSE(status.isRemoteNodeState(NodeAlive));
+    EXPECT_TRUE(status.delRemoteNodeState(NodeAlive));  // not set: nothing changes
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebootPending | NodeRebooting);
+    status.delRemoteNodeState(NodeRebootPending | NodeRebooting);
+    EXPECT_EQ(status.getRemoteNodeState(), 0U);
+}
+
+// ---- Disks ----
+
+TEST_F(StatusTest, DisksAreSortedAndListedOnce) {
+    EXPECT_TRUE(status.setErrHandlingDisk(parsed(R"(["sdb","sda","sdb"])")));
+    EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["sda","sdb"])"));
+    EXPECT_TRUE(status.setErrHandlingDiskRemote(parsed(R"(["sdaa","sdb","sdB"])")));
+    EXPECT_EQ(status.getErrHandlingDiskRemote(), parsed(R"(["sdB","sdaa","sdb"])"));
+    EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["sda","sdb"])"));
+}
+
+TEST_F(StatusTest, NewDisksReplaceTheOldOnes) {
+    status.setErrHandlingDisk(parsed(R"(["sda","sdb"])"));
+    status.setErrHandlingDisk(parsed(R"(["sdc"])"));
+    EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["sdc"])"));
+}
+
+TEST_F(StatusTest, NoDisksAreAnEmptyArray) {
+    for (const char* nothing : {"null", "[]", "{}"}) {
+        status.setErrHandlingDisk(parsed(R"(["sda"])"));
+        status.setErrHandlingDiskRemote(parsed(R"(["sda"])"));
+        EXPECT_TRUE(status.setErrHandlingDisk(parsed(nothing)));
+        EXPECT_TRUE(status.setErrHandlingDiskRemote(parsed(nothing)));
+        EXPECT_EQ(status.getErrHandlingDisk(), Json::Value(Json::arrayValue)) << nothing;
+        EXPECT_EQ(status.getErrHandlingDiskRemote(), Json::Value(Json::arrayValue)) << nothing;
+    }
+}
+
+TEST_F(StatusTest, ElementsThatCannotBeReadAsStringsArePassedOver) {
+    EXPECT_TRUE(status.setErrHandlingDisk(parsed(R"(["sda",["sdb"],{"x":"sdc"},7,"sdd"])")));
+    EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["7","sda","sdd"])"));
+}
+
+// ---- Threads ----
+
+TEST_F(StatusTest, NoBitIsLostAndNoSetIsSeenHalfReplaced) {
+    const Json::Value few = parsed(R"(["sda"])");
+    const Json::Value many = parsed(R"(["sdb","sdc","sdd","sde"])");
+    status.setErrHandlingDisk(few);
+    constexpr int ROUNDS = 2000;
+    std::atomic<int> wrong{0};
+    std::vector<std::thread> threads;
+    for (int i = 0; i < 4; ++i) {
+        threads.emplace_back([&, i] {
+            for (int round = 0; round < ROUNDS; ++round) {
+                status.setErrHandlingDisk((round + i) % 2 == 0 ? few : many);
+                const Json::Value seen = status.getErrHandlingDisk();
+                wrong += seen == few || seen == many ? 0 : 1;
+            }
+        });
+    }
+    for (const NodeState bit : {NodeAlive, NodeRebootPending, NodeRebooting}) {
+        threads.emplace_back([&, bit] {
+            for (int round = 0; round < ROUNDS; ++round) {
+                status.addRemoteNodeState(bit);
+                wrong += status.isRemoteNodeState(bit) ? 0 : 1;  // nobody else touches it
+                status.delRemoteNodeState(bit);
+                wrong += status.isRemoteNodeState(bit) ? 1 : 0;
+            }
+            status.addRemoteNodeState(bit);
+        });
+    }
+    threads.emplace_back([&] {
+        for (int round = 0; round < ROUNDS; ++round) {
+            wrong += status.toJson().size() == 10 ? 0 : 1;
+        }
+    });
+    for (std::thread& thread : threads) {
+        thread.join();
+    }
+    EXPECT_EQ(wrong, 0);
+    EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebootPending | NodeRebooting);
+}
+
+}  // namespace
