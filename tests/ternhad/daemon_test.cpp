@@ -1,0 +1,317 @@
+#include "ternhad/daemon.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/mount.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <thread>
+
+#include "support/sandbox.h"
+#include "support/udp.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::Contains;
+using ::testing::HasSubstr;
+using ::testing::Not;
+
+mode_t modeOf(const char* path) {
+    struct stat info = {};
+    EXPECT_EQ(stat(path, &info), 0) << path;
+    return info.st_mode & 07777;
+}
+
+// One daemon on 127.0.0.1 whose peer, 127.0.0.2, nobody plays unless a test does.
+class DaemonTest : public ::testing::Test {
+ protected:
+    static test::Process start(const std::vector<std::string>& more = {}) {
+        return test::Process(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo", more));
+    }
+
+    static bool isUp() { return !test::statusAt().isNull(); }
+
+    static test::Process startAndWait(const std::vector<std::string>& more = {}) {
+        test::Process daemon = start(more);
+        EXPECT_TRUE(test::eventually(10s, isUp)) << daemon.error();
+        return daemon;
+    }
+
+    // Ends it as a supervisor does and expects what that may expect.
+    static void stop(test::Process& daemon, int signal = SIGTERM) {
+        const test::Stopwatch stopwatch;
+        daemon.signal(signal);
+        const auto status = daemon.waitFor(10s);
+        EXPECT_LT(stopwatch.elapsed(), 2s);
+        ASSERT_TRUE(status.has_value());
+        EXPECT_TRUE(WIFEXITED(*status) && WEXITSTATUS(*status) == 0) << *status;
+    }
+};
+
+TEST_F(DaemonTest, MakesItsDirectoriesAndSocketForItselfAlone) {
+    auto daemon = startAndWait();
+    EXPECT_EQ(modeOf("/tmp/ha"), 0700U);
+    EXPECT_EQ(modeOf("/var/log/ha"), 0700U);
+    EXPECT_EQ(modeOf("/run/ternha"), 0700U);
+    EXPECT_EQ(modeOf(test::CONTROL_SOCKET), 0700U);
+    EXPECT_EQ(modeOf("/tmp/ha/ha.daemon.log"), 0600U);
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, LeavesDirectoriesThatAreThere) {
+    test::makeDirectories("/var/log/ha");
+    ASSERT_EQ(chmod("/var/log/ha", 0750), 0);
+    auto daemon = startAndWait();
+    EXPECT_EQ(modeOf("/var/log/ha"), 0750U);
+    stop(daemon);
+}
+
+void expectRefusal(const std::string& reason) {
+    const auto result = test::run(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_EQ(result.error, "ternhad: /tmp/ha: " + reason + "\n");
+    EXPECT_FALSE(test::exists(test::CONTROL_SOCKET));
+}
+
+TEST_F(DaemonTest, RefusesABufferDirectoryThatIsALink) {
+    test::makeDirectories("/tmp/elsewhere");
+    std::filesystem::create_symlink("/tmp/elsewhere", "/tmp/ha");
+    expectRefusal("not a directory");
+}
+
+TEST_F(DaemonTest, RefusesABufferDirectoryThatIsAFile) {
+    test::writeFile("/tmp/ha", "");
+    expectRefusal("not a directory");
+}
+
+TEST_F(DaemonTest, RefusesABufferDirectoryOfAnotherUser) {
+    test::makeDirectories("/tmp/ha");
+    if (chown("/tmp/ha", 1000, 1000) != 0) {
+        // No other user is known in a sandbox of an ordinary one, but the machine's root owns /usr.
+        ASSERT_EQ(mount("/usr/bin", "/tmp/ha", nullptr, MS_BIND, nullptr), 0);
+    }
+    expectRefusal("belongs to another user");
+}
+
+TEST_F(DaemonTest, RefusesABufferDirectoryThatOthersCanWriteTo) {
+    test::makeDirectories("/tmp/ha");
+    ASSERT_EQ(chmod("/tmp/ha", 0777), 0);
+    expectRefusal("others can write to it");
+}
+
+// Connects as another user. Returns 0, the error number, or -1 in a sandbox that knows no other user.
+int connectAsAnotherUser() {
+    int error = -1;
+    std::thread([&error] {
+        // The bare system calls change this thread alone.
+        if (syscall(SYS_setgroups, 0, nullptr) != 0 || syscall(SYS_setresgid, 1000, 1000, 1000) != 0 ||
+            syscall(SYS_setresuid, 1000, 1000, 1000) != 0) {
+            return;
+        }
+        const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_un address = {};
+        address.sun_family = AF_UNIX;
+        std::string(test::CONTROL_SOCKET)
+            .copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
+        error = connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0 ? 0 : errno;
+        close(fd);
+    }).join();
+    return error;
+}
+
+TEST_F(DaemonTest, AnotherUserCannotReachTheSocket) {
+    auto daemon = startAndWait();
+    const int error = connectAsAnotherUser();
+    EXPECT_TRUE(error == EACCES || error == -1) << error;
+    // Nor when only the socket's own mode is left to keep others out.
+    ASSERT_EQ(chmod("/run/ternha", 0755), 0);
+    EXPECT_EQ(connectAsAnotherUser(), error);
+    ASSERT_EQ(chmod(test::CONTROL_SOCKET, 0666), 0);
+    EXPECT_EQ(connectAsAnotherUser(), error == EACCES ? 0 : -1);
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, ReadsItsConfigurationAndTheCommandLineWins) {
+    test::writeFile("/tmp/ternhad.conf",
+                    "# of this node\nlocal-ip = 127.0.0.1\nremote-ip = 127.0.0.9\ninterface = lo\n"
+                    "socket = /run/other/control.sock\n");
+    test::Process daemon({TERNHAD, "--config", "/tmp/ternhad.conf", "--remote-ip", "127.0.0.2"});
+    EXPECT_TRUE(test::eventually(10s, [] { return !test::statusAt("/run/other/control.sock").isNull(); }))
+        << daemon.error();
+    EXPECT_THAT(test::daemonLogMessages(),
+                Contains(test::LogLine("host.cpp", "Started on 127.0.0.1, peer 127.0.0.2")));
+    stop(daemon);
+}
+
+class StopTest : public DaemonTest, public ::testing::WithParamInterface<int> {};
+
+TEST_P(StopTest, LeavesTheLogOnDiskAndNoSocket) {
+    auto daemon = startAndWait();
+    stop(daemon, GetParam());
+    EXPECT_FALSE(test::exists(test::CONTROL_SOCKET));
+    EXPECT_EQ(test::bufferText(), "");
+    EXPECT_EQ(test::recordText(), "");
+    const auto messages = test::messages(test::readFile("/var/log/ha/ha.daemon.log"));
+    EXPECT_THAT(messages, Contains(test::LogLine("host.cpp", "Started on 127.0.0.1, peer 127.0.0.2")));
+    EXPECT_THAT(messages.back(), test::LogLine("host.cpp", "Stopping"));
+}
+
+INSTANTIATE_TEST_SUITE_P(Signals, StopTest, ::testing::Values(SIGTERM, SIGINT));
+
+TEST_F(DaemonTest, AStoppedCheckDoesNotDeclareThePeerDead) {
+    test::UdpSocket peer("127.0.0.2", 7499);
+    auto daemon = start();
+    const auto question = peer.receive(10s);
+    ASSERT_TRUE(question.has_value());
+    peer.send("alive", question->address, question->port);
+    ASSERT_TRUE(test::eventually(10s, [] { return test::statusAt()["isRemoteAlive"].asBool(); }));
+    ASSERT_TRUE(peer.receive(10s).has_value());  // the next question: left unanswered
+    stop(daemon);
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
+}
+
+TEST_F(DaemonTest, APingThatWouldTakeLongDoesNotDelayTheStop) {
+    test::replaceProgram("/bin/ping", ": > /tmp/pinging; exec sleep 60");
+    test::UdpSocket peer("127.0.0.2", 7499);
+    auto daemon = start();
+    ASSERT_TRUE(test::eventually(20s, [&] {
+        if (const auto question = peer.receive(10ms)) {
+            peer.send(question->bytes == "is_alive" ? "alive" : "{}", question->address, question->port);
+        }
+        return test::exists("/tmp/pinging");
+    }));
+    stop(daemon);
+    EXPECT_NE(test::run({"pgrep", "sleep"}).exitCode, 0);
+}
+
+TEST_F(DaemonTest, HangupMovesAndRotatesTheLogs) {
+    auto daemon = startAndWait({"--log-interval", "3600"});
+    daemon.signal(SIGHUP);
+    EXPECT_TRUE(test::eventually(10s, [] {
+        return test::exists("/var/log/ha/ha.daemon.log.0.xz") &&
+               test::exists("/var/log/ha/ha.daemon.record.0.xz");
+    }));
+    const auto xz = test::run({"xz", "-dc", "/var/log/ha/ha.daemon.log.0.xz"});
+    EXPECT_THAT(xz.output, HasSubstr("Started on 127.0.0.1"));
+    EXPECT_FALSE(test::exists("/var/log/ha/ha.daemon.log"));
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, ALogThatHasGrownIsRotated) {
+    auto daemon = startAndWait({"--log-interval", "0.1", "--rotate-size", "4096"});
+    test::appendFile("/tmp/ha/ha.daemon.log", std::string(5000, 'x') + "\n");
+    EXPECT_TRUE(test::eventually(10s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
+    EXPECT_FALSE(test::exists("/var/log/ha/ha.daemon.log.1.xz"));
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, AnAddressOfAnotherMachineEndsIt) {
+    const auto result = test::run(test::daemonArguments("10.9.8.7", "127.0.0.2", "lo"));
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_EQ(result.error, "ternhad: cannot answer the peer on 10.9.8.7, the daemon log tells why\n");
+    EXPECT_THAT(test::wholeLog(),
+                HasSubstr("Failed to start socket serverCannot assign requested address\n"));
+}
+
+TEST_F(DaemonTest, ATakenPortEndsIt) {
+    const test::UdpSocket other("127.0.0.1", 7499);
+    const auto result = test::run(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_THAT(test::wholeLog(), HasSubstr("Failed to start socket serverAddress already in use\n"));
+}
+
+TEST_F(DaemonTest, ASocketThatCannotBeBoundEndsIt) {
+    test::makeDirectories("/run/ternha/control.sock/in-the-way");
+    const auto result = test::run(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_THAT(result.error, HasSubstr("cannot bind the control socket /run/ternha/control.sock"));
+}
+
+TEST_F(DaemonTest, AnUnknownQuestionEndsItBySignal) {
+    auto daemon = startAndWait();
+    test::UdpSocket stranger("127.0.0.3", 40000);
+    stranger.send("who_are_you", "127.0.0.1", 7499);
+    const auto status = daemon.waitFor(10s);
+    ASSERT_TRUE(status.has_value());
+    EXPECT_TRUE(WIFSIGNALED(*status) && WTERMSIG(*status) == SIGABRT) << *status;
+}
+
+TEST_F(DaemonTest, KnowsItsOwnTroubles) {
+    test::writeFile("/proc/drbd", " 0: cs:StandAlone ro:Primary/Unknown\n");
+    auto daemon = startAndWait();
+    ASSERT_TRUE(test::eventually(10s, [] { return !test::statusAt()["isDRBDConnect"].asBool(); }));
+    test::writeFile("/proc/drbd", " 0: cs:SyncSource ro:Primary/Secondary\n");
+    test::writeFile("/sys/block/md0/md/sync_action", "resync\n");
+    test::writeFile("/sys/class/ata_port/ata3/error_handling", "1\n");
+    const std::string device =
+        "/sys/devices/pci0000:00/0000:00:1f.2/ata3/host2/target2:0:0/2:0:0:0/block/sdc";
+    test::makeDirectories(device);
+    std::filesystem::create_symlink(".." + device.substr(4), "/sys/block/sdc");
+    const std::size_t before = test::wholeLog("", "ha.daemon.record").size();
+    EXPECT_TRUE(test::eventually(10s, [] {
+        const Json::Value status = test::statusAt();
+        return status["isDRBDConnect"].asBool() && status["isMDResync"].asBool() &&
+               status["isDiskErrHandling"].asBool() && status["diskErrorHandlingDisk"][0] == "sdc";
+    })) << test::statusAt();
+    EXPECT_TRUE(
+        test::eventually(10s, [&] { return test::wholeLog("", "ha.daemon.record").size() > before; }));
+    test::writeFile("/sys/block/md0/md/sync_action", "idle\n");
+    test::writeFile("/sys/class/ata_port/ata3/error_handling", "0\n");
+    EXPECT_TRUE(test::eventually(10s, [] {
+        const Json::Value status = test::statusAt();
+        return !status["isMDResync"].asBool() && !status["isDiskErrHandling"].asBool() &&
+               status["diskErrorHandlingDisk"].empty();
+    }));
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, RecordsASnapshotWhenItStarts) {
+    auto daemon = startAndWait({"--snapshot-interval", "3600"});
+    EXPECT_TRUE(test::eventually(10s, [] {
+        const std::string record = test::wholeLog("", "ha.daemon.record");
+        return record.find("\n{\"diskErrorHandlingDisk\":[]") != std::string::npos &&
+               record.find("PPID") != std::string::npos && record.find("Mounted on") != std::string::npos &&
+               record.find("MemTotal:") != std::string::npos;
+    }));
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, RecordsSnapshotsAtTheirInterval) {
+    auto daemon = startAndWait({"--snapshot-interval", "0.2"});
+    EXPECT_TRUE(test::eventually(10s, [] {
+        return test::messages(test::wholeLog()).size() > 0 && test::recordEntries().size() >= 12;
+    }));
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, TakesAReportThatCannotBeReadTwiceForTrouble) {
+    test::UdpSocket peer("127.0.0.2", 7499);
+    auto daemon = start();
+    int reports = 0;
+    EXPECT_TRUE(test::eventually(20s, [&] {
+        if (const auto question = peer.receive(10ms)) {
+            std::string answer = "alive";
+            if (question->bytes == "is_disk_err_handling") {
+                ++reports;
+                answer =
+                    R"({"errHandlingDisk":["sda","sdb","sdc"],"isDiskErrHandling":true)";  // as it is cut
+            } else if (question->bytes == "is_md_resync") {
+                answer = "resync";
+            }
+            peer.send(answer, question->address, question->port);
+        }
+        const Json::Value status = test::statusAt();
+        return status["isRemoteDiskErrHandling"].asBool() && status["isRemoteMDResync"].asBool();
+    }));
+    EXPECT_GE(reports, 2);
+    stop(daemon);
+}
+
+}  // namespace

@@ -1,0 +1,173 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+
+#include <filesystem>
+#include <optional>
+#include <thread>
+
+#include "support/sandbox.h"
+#include "ternhad/daemon.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::Contains;
+using ::testing::HasSubstr;
+
+// A machine of the cluster and its daemon.
+struct Machine {
+    Machine(const std::string& name, std::string ownAddress, std::string peersAddress)
+        : node(name), address(std::move(ownAddress)), peer(std::move(peersAddress)) {
+        write("/tmp/.ha.hostname.original", name + "\n");
+        write("/proc/drbd", " 0: cs:Connected ro:Primary/Secondary\n");
+        write("/sys/block/md0/md/sync_action", "idle\n");
+        write("/sys/class/ata_port/ata3/error_handling", "0\n");
+        const std::string device = "/sys/devices/pci0/ata3/host2/target2:0:0/2:0:0:0/block/sda";
+        test::makeDirectories(node.path(device));
+        std::filesystem::create_symlink(".." + device.substr(4), node.path("/sys/block/sda"));
+    }
+
+    void write(const std::string& path, const std::string& text) { test::writeFile(node.path(path), text); }
+
+    void start() { daemon.emplace(node.start(test::daemonArguments(address, peer, "eth1"))); }
+
+    std::string log() { return test::wholeLog(node.path("")); }
+    std::string record() { return test::wholeLog(node.path(""), "ha.daemon.record"); }
+    Json::Value status() { return test::statusAt(node.path(test::CONTROL_SOCKET)); }
+
+    bool sees(const char* flag, bool value) {
+        const Json::Value known = status();
+        return known.isObject() && known[flag].asBool() == value;
+    }
+
+    test::Node node;
+    std::string address;
+    std::string peer;
+    std::optional<test::Process> daemon;
+};
+
+class TwoNodesTest : public ::testing::Test {
+ protected:
+    TwoNodesTest() {
+        test::connect(a.node, "10.0.0.1", b.node, "10.0.0.2");
+        a.start();
+        b.start();
+        EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
+    }
+
+    bool bothSee(bool alive) { return a.sees("isRemoteAlive", alive) && b.sees("isRemoteAlive", alive); }
+
+    Machine a{"node-a", "10.0.0.1", "10.0.0.2"};
+    Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
+};
+
+TEST_F(TwoNodesTest, LearnThatTheOtherIsAliveAndItsName) {
+    for (Machine* machine : {&a, &b}) {
+        EXPECT_TRUE(test::eventually(10s, [&] {
+            return machine->log().find("Remote hostname is " +
+                                       std::string(machine == &a ? "node-b" : "node-a") + "\n") !=
+                   std::string::npos;
+        })) << machine->log();
+        EXPECT_THAT(test::messages(machine->log()),
+                    Contains(test::LogLine("status.cpp", "Remote server status changed to alive")).Times(1));
+    }
+}
+
+TEST_F(TwoNodesTest, LoseEachOtherWithTheLinkAndFindEachOtherAgain) {
+    test::setLink(a.node, false);
+    EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(false); }));
+    test::setLink(a.node, true);
+    EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
+    for (Machine* machine : {&a, &b}) {
+        const auto messages = test::messages(machine->log());
+        EXPECT_THAT(messages,
+                    Contains(test::LogLine("status.cpp", "Remote server status changed to dead")).Times(1));
+        EXPECT_THAT(messages,
+                    Contains(test::LogLine("status.cpp", "Remote server status changed to alive")).Times(2));
+    }
+}
+
+TEST_F(TwoNodesTest, ADaemonThatStandsStillIsDeadUntilItGoesOn) {
+    b.daemon->signal(SIGSTOP);
+    EXPECT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", false); }));
+    b.daemon->signal(SIGCONT);
+    EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
+}
+
+TEST_F(TwoNodesTest, ADaemonThatWasKilledIsDeadUntilItIsStartedAgain) {
+    b.daemon->signal(SIGKILL);
+    ASSERT_TRUE(b.daemon->waitFor(10s).has_value());
+    EXPECT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", false); }));
+    b.start();
+    EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
+}
+
+TEST_F(TwoNodesTest, TellEachOtherOfResyncsAndDisks) {
+    a.write("/sys/block/md0/md/sync_action", "resync\n");
+    EXPECT_TRUE(test::eventually(20s, [this] { return b.sees("isRemoteMDResync", true); }));
+    EXPECT_FALSE(b.status()["isMDResync"].asBool());
+
+    a.write("/sys/class/ata_port/ata3/error_handling", "1\n");
+    EXPECT_TRUE(test::eventually(20s, [this] {
+        const Json::Value status = b.status();
+        return status["isRemoteDiskErrHandling"].asBool() &&
+               status["diskErrorHandlingDiskRemote"].size() == 1 &&
+               status["diskErrorHandlingDiskRemote"][0] == "sda";
+    })) << b.status();
+
+    a.write("/sys/block/md0/md/sync_action", "recover\n");
+    a.write("/sys/class/ata_port/ata3/error_handling", "0\n");
+    EXPECT_TRUE(test::eventually(20s, [this] {
+        const Json::Value status = b.status();
+        return !status["isRemoteMDResync"].asBool() && !status["isRemoteDiskErrHandling"].asBool() &&
+               status["diskErrorHandlingDiskRemote"].empty();
+    })) << b.status();
+}
+
+TEST_F(TwoNodesTest, RecordASnapshotWhenTheOtherDiesOrBeginsAResync) {
+    ASSERT_TRUE(test::eventually(10s, [&] { return b.record().find("MemTotal") != std::string::npos; }));
+
+    const std::string atStart = b.record();
+    a.write("/sys/block/md0/md/sync_action", "resync\n");
+    EXPECT_TRUE(test::eventually(20s, [&] {
+        return b.record().find("\"isRemoteMDResync\":true", atStart.size()) != std::string::npos;
+    }));
+
+    const std::size_t before = b.record().size();
+    a.daemon->signal(SIGKILL);
+    EXPECT_TRUE(test::eventually(
+        20s, [&] { return b.record().find("\"isRemoteAlive\":false", before) != std::string::npos; }));
+}
+
+TEST_F(TwoNodesTest, MeasureTheLinkWhileTheOtherIsAlive) {
+    EXPECT_TRUE(test::eventually(20s, [this] { return a.status()["heartbeatLatency"].asDouble() > 0; }));
+    EXPECT_EQ(a.status()["heartbeatPacketFailRate"].asDouble(), 0);
+    test::setLink(b.node, false);
+    EXPECT_TRUE(test::eventually(30s, [this] {
+        return a.sees("isRemoteAlive", false) && a.status()["heartbeatLatency"].asDouble() <= 0;
+    }));
+}
+
+TEST_F(TwoNodesTest, AnOrderedRebootReachesTheOthersKernelWithItsLogsOnDisk) {
+    bool isDone = false;
+    std::thread order([&] {
+        isDone = TERN::HA::Daemon::MonitordSocket(a.node.path(test::CONTROL_SOCKET), 40).rebootRemote();
+    });
+    ASSERT_TRUE(
+        test::eventually(20s, [this] { return test::readFile(b.node.path("/proc/sysrq-trigger")) == "b"; }));
+    EXPECT_THAT(test::readFile(b.node.path("/var/log/ha/ha.daemon.log")),
+                HasSubstr("Remote server status changed to alive\n"));
+    b.daemon->signal(SIGKILL);
+    order.join();
+    EXPECT_TRUE(isDone);
+    EXPECT_THAT(test::messages(a.log()), Contains(test::LogLine("checker.cpp", "Remote offline")));
+    EXPECT_TRUE(TERN::HA::Daemon::MonitordSocket(a.node.path(test::CONTROL_SOCKET), 5).isRebootRemote());
+
+    b.write("/proc/sysrq-trigger", "");
+    b.start();
+    EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
+    EXPECT_FALSE(TERN::HA::Daemon::MonitordSocket(a.node.path(test::CONTROL_SOCKET), 5).isRebootRemote());
+}
+
+}  // namespace
