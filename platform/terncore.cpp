@@ -12,11 +12,14 @@
 #include <csignal>
 #include <cstdarg>
 #include <cstring>
-#include <fstream>
+#include <exception>
 #include <map>
+#include <memory>
 #include <mutex>
-#include <new>
+#include <optional>
+#include <sstream>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace {
@@ -25,10 +28,18 @@ constexpr int FAILURE = -1;
 constexpr int FIRST_PRIVATE_FD = 3;  // above standard input, output and error
 constexpr int NOT_STARTED = 127;     // exit code, as shells use it
 
+struct Closing {
+    void operator()(FILE* file) const { (void)std::fclose(file); }
+    void operator()(DIR* directory) const { (void)closedir(directory); }
+};
+using File = std::unique_ptr<FILE, Closing>;
+using Directory = std::unique_ptr<DIR, Closing>;
+
 // Programs behind open streams.
+using Streams = std::map<FILE*, pid_t>;
 std::mutex streamsMutex;
-std::map<FILE*, pid_t>& streams() {
-    static auto* const map = new std::map<FILE*, pid_t>;  // never freed: streams may be closed during exit
+Streams& streams() {
+    static auto* const map = new Streams;  // never freed: streams may be closed during exit
     return *map;
 }
 
@@ -56,7 +67,7 @@ int startError(const char* path) {
     if (!S_ISREG(info.st_mode)) {
         return EACCES;
     }
-    return access(path, X_OK) == 0 ? 0 : errno;
+    return faccessat(AT_FDCWD, path, X_OK, AT_EACCESS) == 0 ? 0 : errno;
 }
 
 // Starts a program with default signals, nothing blocked and no descriptor above standard error. `fd`, unless
@@ -73,37 +84,54 @@ int start(pid_t* pid, const char* path, const char* const argv[], int fd, int ta
     sigemptyset(&none);
     sigfillset(&all);
 
-    posix_spawnattr_t attributes;
+    posix_spawnattr_t attributes = {};
     posix_spawnattr_init(&attributes);
     posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
     posix_spawnattr_setsigmask(&attributes, &none);
     posix_spawnattr_setsigdefault(&attributes, &all);
 
-    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_t actions = {};
     posix_spawn_file_actions_init(&actions);
-    if (fd >= 0) {
-        posix_spawn_file_actions_adddup2(&actions, fd, target);
+    int error = fd < 0 ? 0 : posix_spawn_file_actions_adddup2(&actions, fd, target);
+    if (error == 0) {
+        error = posix_spawn_file_actions_addclosefrom_np(&actions, FIRST_PRIVATE_FD);
     }
-    posix_spawn_file_actions_addclosefrom_np(&actions, FIRST_PRIVATE_FD);
-
-    const int error = posix_spawn(pid, path, &actions, &attributes, const_cast<char* const*>(argv), environ);
+    if (error == 0) {
+        error = posix_spawn(pid, path, &actions, &attributes, const_cast<char* const*>(argv), environ);
+    }
     posix_spawn_file_actions_destroy(&actions);
     posix_spawnattr_destroy(&attributes);
     return error;
 }
 
 // Runs a program whose end nobody waits for: an intermediate process starts it and ends, so that the system
-// reaps the program.
+// reaps the program. No signal may reach the caller's handlers in that copy of the caller.
 int startDetached(const char* path, const char* const argv[]) {
+    sigset_t all;
+    sigset_t before;
+    sigfillset(&all);
+    pthread_sigmask(SIG_SETMASK, &all, &before);
     const pid_t intermediate = fork();
-    if (intermediate == -1) {
-        return FAILURE;
-    }
     if (intermediate == 0) {
         pid_t pid = 0;
         _exit(start(&pid, path, argv, -1, -1) == 0 ? 0 : NOT_STARTED);
     }
-    return exitedWithSuccess(waitForEnd(intermediate)) ? 0 : FAILURE;
+    pthread_sigmask(SIG_SETMASK, &before, nullptr);
+    return intermediate != -1 && exitedWithSuccess(waitForEnd(intermediate)) ? 0 : FAILURE;
+}
+
+// The whole text of a file, nothing when it cannot be read.
+std::optional<std::string> textOf(const std::string& path) {
+    const File file(std::fopen(path.c_str(), "re"));
+    if (!file) {
+        return std::nullopt;
+    }
+    std::string text;
+    std::string block(4096, '\0');
+    while (const std::size_t size = std::fread(block.data(), 1, block.size(), file.get())) {
+        text.append(block, 0, size);
+    }
+    return std::ferror(file.get()) == 0 ? std::optional(text) : std::nullopt;
 }
 
 std::string trimmed(const std::string& text) {
@@ -127,26 +155,23 @@ bool hasComponent(const std::string& path, const std::string& name) {
 
 std::vector<std::string> blockDevices() {
     std::vector<std::string> names;
-    DIR* const directory = opendir("/sys/block");
-    if (directory == nullptr) {
+    const Directory directory(opendir("/sys/block"));
+    if (!directory) {
         return names;
     }
-    while (const dirent* const entry = readdir(directory)) {
+    while (const dirent* const entry = readdir(directory.get())) {
         if (entry->d_name[0] != '.') {
             names.emplace_back(static_cast<const char*>(entry->d_name));
         }
     }
-    closedir(directory);
     std::sort(names.begin(), names.end());
     return names;
 }
 
 bool isOpticalDrive(const std::string& device) {
     constexpr char SCSI_CD_ROM[] = "5";
-    std::ifstream file("/sys/block/" + device + "/device/type");
-    std::string type;
-    std::getline(file, type);
-    return type == SCSI_CD_ROM;
+    const std::optional<std::string> type = textOf("/sys/block/" + device + "/device/type");
+    return type && type->substr(0, type->find('\n')) == SCSI_CD_ROM;
 }
 
 std::string devicePath(const std::string& device) {
@@ -180,7 +205,7 @@ int PLATExec(const char* path, ...) try {
     }
     va_end(arguments);
     return PLATExecv(path, argv.data(), 1);
-} catch (const std::bad_alloc&) {
+} catch (const std::exception&) {
     return FAILURE;
 }
 
@@ -191,37 +216,42 @@ FILE* PLATPopenv(const char* path, const char* mode, const char* const argv[]) t
         errno = EINVAL;
         return nullptr;
     }
+    // All that can fail comes before the start: the program could not be taken back.
+    Streams& table = streams();
+    Streams entry = {{nullptr, 0}};
+    auto node = entry.extract(nullptr);
+
     int ends[2] = {-1, -1};
     if (pipe2(ends, O_CLOEXEC) != 0) {
         return nullptr;
     }
     const int ours = isRead ? ends[0] : ends[1];
     const int theirs = isRead ? ends[1] : ends[0];
-
-    pid_t pid = 0;
-    const int error = start(&pid, path, argv, theirs, isRead ? STDOUT_FILENO : STDIN_FILENO);
-    close(theirs);
-    if (error != 0) {
+    File stream(fdopen(ours, mode));
+    if (!stream) {
+        const int error = errno;
         close(ours);
+        close(theirs);
         errno = error;
         return nullptr;
     }
-    FILE* const stream = fdopen(ours, mode);
-    if (stream == nullptr) {
-        close(ours);
-        waitForEnd(pid);
-        errno = ENOMEM;
+    const int error = start(&node.mapped(), path, argv, theirs, isRead ? STDOUT_FILENO : STDIN_FILENO);
+    close(theirs);
+    if (error != 0) {
+        stream.reset();
+        errno = error;
         return nullptr;
     }
+    node.key() = stream.get();
     const std::lock_guard<std::mutex> lock(streamsMutex);
-    streams()[stream] = pid;
-    return stream;
-} catch (const std::bad_alloc&) {
+    table.insert(std::move(node));
+    return stream.release();
+} catch (const std::exception&) {
     errno = ENOMEM;
     return nullptr;
 }
 
-int PLATPclose(FILE* stream) {
+int PLATPclose(FILE* stream) try {
     pid_t pid = 0;
     {
         const std::lock_guard<std::mutex> lock(streamsMutex);
@@ -233,19 +263,26 @@ int PLATPclose(FILE* stream) {
         pid = entry->second;
         streams().erase(entry);
     }
-    std::fclose(stream);
+    (void)std::fclose(stream);  // the program's end tells how it went
     return waitForEnd(pid);
+} catch (const std::exception&) {
+    errno = ENOMEM;
+    return FAILURE;
 }
 
 int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size, int flags) try {
-    if (file == nullptr || key == nullptr || value == nullptr || size < 1 || flags != 0) {
+    if (value == nullptr || size < 1) {
         return FAILURE;
     }
     value[0] = '\0';
-    std::ifstream stream(file);
-    if (!stream) {
+    if (file == nullptr || key == nullptr || flags != 0) {
         return FAILURE;
     }
+    const std::optional<std::string> text = textOf(file);
+    if (!text) {
+        return FAILURE;
+    }
+    std::istringstream stream(*text);
     std::string line;
     while (std::getline(stream, line)) {
         line = trimmed(line);
@@ -259,7 +296,7 @@ int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size
         return 1;
     }
     return stream.bad() ? FAILURE : 0;
-} catch (const std::bad_alloc&) {
+} catch (const std::exception&) {
     return FAILURE;
 }
 
@@ -283,7 +320,7 @@ int TERNDiskGetDevnamebyAtaPort(char* name, int size, const char* port) try {
         return 0;
     }
     return FAILURE;
-} catch (const std::bad_alloc&) {
+} catch (const std::exception&) {
     return FAILURE;
 }
 }
