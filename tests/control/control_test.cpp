@@ -1,0 +1,196 @@
+#include "control.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <json/json.h>
+
+#include <optional>
+#include <sstream>
+
+#include "env_check.h"
+#include "socket/local_sockets.h"
+#include "support/sandbox.h"
+#include "support/udp.h"
+#include "support/wait.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using namespace TERN::HA::Daemon;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+Json::Value parsed(const std::string& text) {
+    Json::Value value;
+    std::istringstream(text) >> value;
+    return value;
+}
+
+class ControlTest : public test::SandboxTest {
+ protected:
+    void SetUp() override {
+        test::SandboxTest::SetUp();
+        server.emplace(test::LOCAL_SOCKET, 0);
+        server->setStatus(&status);
+        ASSERT_TRUE(server->serverBind());
+    }
+
+    void TearDown() override {
+        server.reset();
+        test::SandboxTest::TearDown();
+    }
+
+    // One exchange of bytes.
+    std::string ask(const std::string& request) {
+        const test::RawClient client;
+        client.send(request);
+        server->serverListen();
+        return client.receiveAll();
+    }
+
+    Status status;
+    std::optional<MonitordSocket> server;
+};
+
+TEST_F(ControlTest, GivesTheStatus) {
+    status.isMDResync = true;
+    status.setErrHandlingDisk(parsed(R"(["sda"])"));
+    const std::string record =
+        R"({"diskErrorHandlingDisk":["sda"],"diskErrorHandlingDiskRemote":[],"heartbeatLatency":0.0,)"
+        R"("heartbeatPacketFailRate":0.0,"isDRBDConnect":true,"isDiskErrHandling":false,"isMDResync":true,)"
+        R"("isRemoteAlive":false,"isRemoteDiskErrHandling":false,"isRemoteMDResync":false})";
+    EXPECT_EQ(ask(R"({"act":"I"})"), record);
+    EXPECT_EQ(ask(R"({"act":"Info"})"), record);  // only the first character counts
+    EXPECT_EQ(ask(R"({"act":"I","more":[1,2,3]})"), record);
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(ControlTest, TellsWhetherThePeerIsBeingRebooted) {
+    EXPECT_EQ(ask(R"({"act":"r"})"), R"({"is_froce_reboot_remote":false})");
+    status.addRemoteNodeState(NodeRebootPending);
+    EXPECT_EQ(ask(R"({"act":"r"})"), R"({"is_froce_reboot_remote":true})");
+    status.delRemoteNodeState(NodeRebootPending);
+    status.addRemoteNodeState(NodeRebooting);
+    EXPECT_EQ(ask(R"({"act":"rubbish"})"), R"({"is_froce_reboot_remote":true})");
+}
+
+TEST_F(ControlTest, RebootsThePeerAndAnswersNull) {
+    remoteIP("127.0.0.2");
+    test::UdpSocket peer("127.0.0.2", 7499);
+    std::thread serving([this] { server->serverListen(); });
+    const test::RawClient client;
+    client.send(R"({"act":"R"})");
+    const auto question = peer.receive(10s);
+    ASSERT_TRUE(question.has_value());
+    EXPECT_EQ(question->bytes, "reboot_remote");
+    peer.send("", question->address, question->port);
+    EXPECT_EQ(client.receiveAll(), "null");
+    serving.join();
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+    EXPECT_THAT(test::daemonLogMessages(), ElementsAre(test::LogLine("checker.cpp", "Remote offline")));
+}
+
+TEST_F(ControlTest, ServesNobodyElseUntilThePeerIsDown) {
+    remoteIP("127.0.0.2");
+    status.setRemoteAlive(true);
+    test::UdpSocket peer("127.0.0.2", 7499);
+    const test::ServingThread serving(*server);
+    const test::RawClient reboot;
+    reboot.send(R"({"act":"R"})");
+    const auto question = peer.receive(10s);
+    ASSERT_TRUE(question.has_value());
+    std::atomic<bool> isServed{false};
+    std::thread next([&] {
+        EXPECT_EQ(test::exchange(R"({"act":"r"})"), R"({"is_froce_reboot_remote":true})");
+        isServed = true;
+    });
+    peer.send("", question->address, question->port);
+    ASSERT_TRUE(test::eventually(10s, [this] { return status.isRemoteRebooting(); }));
+    EXPECT_FALSE(test::eventually(1500ms, [&] { return isServed.load(); }));
+    status.setRemoteAlive(false);
+    EXPECT_EQ(reboot.receiveAll(), "null");
+    next.join();
+}
+
+struct Refusal {
+    const char* request;
+    const char* line;
+};
+
+class RefusalTest : public ControlTest, public ::testing::WithParamInterface<Refusal> {};
+
+TEST_P(RefusalTest, IsLoggedAndNotAnswered) {
+    EXPECT_EQ(ask(GetParam().request), "");
+    EXPECT_THAT(test::daemonLogMessages(), ElementsAre(test::LogLine("control.cpp", GetParam().line)));
+    EXPECT_NE(ask(R"({"act":"I"})"), "");
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Requests, RefusalTest,
+    ::testing::Values(
+        Refusal{R"({"act":"x"})", "Unknown action x"},
+        Refusal{R"({"act":"x and more"})", "Unknown action x and more"},
+        Refusal{R"({"act":"i"})", "Unknown action i"}, Refusal{R"({"act":""})", "Unknown action "},
+        Refusal{R"({"act":5})", "Unknown action 5"}, Refusal{R"({"act":true})", "Unknown action true"},
+        Refusal{R"({"act":1.5})", "Unknown action 1.5"}, Refusal{R"({"act":null})", "Unknown action "},
+        Refusal{R"({"act":["I"]})", "Unknown action "}, Refusal{R"({"act":{"I":"I"}})", "Unknown action "},
+        Refusal{R"({ "Act" : "I", "a": [1, 2] })",
+                R"(Failed get action from content: {"Act":"I","a":[1,2]})"},
+        Refusal{"{}", "Failed get action from content: {}"},
+        Refusal{R"(["act"])", R"(Failed get action from content: ["act"])"},
+        Refusal{R"("I")", R"(Failed get action from content: "I")"},
+        Refusal{"7", "Failed get action from content: 7"},
+        Refusal{"null", "Failed get action from content: null"}));
+
+// ---- The client's side ----
+
+TEST_F(ControlTest, AClientReadsTheStatus) {
+    const test::ServingThread serving(*server);
+    status.setRemoteAlive(true);
+    Json::Value record;
+    EXPECT_TRUE(MonitordSocket(test::LOCAL_SOCKET, 5).getServerData(record));
+    EXPECT_EQ(record, status.toJson());
+}
+
+TEST_F(ControlTest, AClientAsksWhetherThePeerIsBeingRebooted) {
+    const test::ServingThread serving(*server);
+    EXPECT_FALSE(MonitordSocket(test::LOCAL_SOCKET, 5).isRebootRemote());
+    status.addRemoteNodeState(NodeRebooting);
+    EXPECT_TRUE(MonitordSocket(test::LOCAL_SOCKET, 5).isRebootRemote());
+}
+
+TEST_F(ControlTest, AClientOrdersAReboot) {
+    remoteIP("127.0.0.2");  // nobody answers
+    const test::ServingThread serving(*server);
+    EXPECT_TRUE(MonitordSocket(test::LOCAL_SOCKET, 40).rebootRemote());
+    EXPECT_TRUE(status.isRemoteRebooting());
+}
+
+TEST(ControlClientTest, WithoutAServerEverythingIsFalse) {
+    Json::Value record("as it was");
+    EXPECT_FALSE(MonitordSocket("/tmp/nowhere", 1).getServerData(record));
+    EXPECT_FALSE(MonitordSocket("/tmp/nowhere", 1).rebootRemote());
+    EXPECT_FALSE(MonitordSocket("/tmp/nowhere", 1).isRebootRemote());
+    EXPECT_EQ(record, "as it was");
+}
+
+class OddReplyTest : public test::SandboxTest, public ::testing::WithParamInterface<const char*> {};
+
+TEST_P(OddReplyTest, IsNoReboot) {
+    test::HandlerSocket server([](const Json::Value& request, Json::Value& reply) {
+        EXPECT_EQ(request, parsed(R"({"act":"r"})"));
+        reply = parsed(GetParam());
+        return true;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    EXPECT_FALSE(MonitordSocket(test::LOCAL_SOCKET, 5).isRebootRemote());
+}
+
+INSTANTIATE_TEST_SUITE_P(Replies, OddReplyTest,
+                         ::testing::Values("{}", R"({"is_force_reboot_remote":true})", "null", "true",
+                                           "[true]", "7", R"({"is_froce_reboot_remote":"true"})",
+                                           R"({"is_froce_reboot_remote":[true]})",
+                                           R"({"is_froce_reboot_remote":null})"));
+
+}  // namespace

@@ -1,0 +1,181 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <thread>
+
+#include "checker.h"
+#include "ha_log.h"
+#include "reboot/fast_sleep.h"
+#include "support/files.h"
+#include "support/programs.h"
+#include "support/sandbox.h"
+#include "support/udp.h"
+#include "support/wait.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using namespace TERN::HA::Daemon;
+using ::testing::AllOf;
+using ::testing::Contains;
+using ::testing::Each;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Not;
+using ::testing::SizeIs;
+
+constexpr char TRIGGER[] = "/proc/sysrq-trigger";
+
+class RebootTest : public test::SandboxTest {
+ protected:
+    void SetUp() override {
+        test::SandboxTest::SetUp();
+        remoteIP("127.0.0.2");
+    }
+
+    Status status;
+};
+
+// ---- The asking side ----
+
+// A peer that answers the request.
+class ObedientPeer {
+ public:
+    ObedientPeer()
+        : _thread([this] {
+              if (const auto question = _socket.receive(10s)) {
+                  _question = question->bytes;
+                  _socket.send("", question->address, question->port);
+              }
+          }) {}
+
+    ~ObedientPeer() {
+        _thread.join();
+        EXPECT_EQ(_question, "reboot_remote");
+    }
+
+    ObedientPeer(const ObedientPeer&) = delete;
+    ObedientPeer& operator=(const ObedientPeer&) = delete;
+
+ private:
+    test::UdpSocket _socket{"127.0.0.2", 7499};
+    std::string _question;
+    std::thread _thread;
+};
+
+TEST_F(RebootTest, APeerThatCountsAsDeadIsOfflineAtOnce) {
+    const ObedientPeer peer;
+    const test::FastSleep noSleep([](int) {});
+    EXPECT_TRUE(RebootRemote()(status));
+    EXPECT_THAT(test::FastSleep::sleeps(), IsEmpty());
+    EXPECT_THAT(test::daemonLogMessages(), ElementsAre(test::LogLine("checker.cpp", "Remote offline")));
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+TEST_F(RebootTest, APeerThatDoesNotAnswerIsFollowedAllTheSame) {
+    const test::FastSleep noSleep([](int) {});
+    const test::Stopwatch stopwatch;
+    EXPECT_TRUE(RebootRemote()(status));
+    EXPECT_GE(stopwatch.elapsed(), 2900ms);
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("checker.cpp", "Failed to reboot remote, but keep checking"),
+                            test::LogLine("checker.cpp", "Remote offline")));
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+TEST_F(RebootTest, APeerIsFollowedUntilItIsDeclaredDead) {
+    status.setRemoteAlive(true);
+    const ObedientPeer peer;
+    const test::FastSleep sleep([this](int number) {
+        // Both bits may be set, and the reboot counts from the request on.
+        EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebootPending);
+        EXPECT_TRUE(status.isRemoteRebooting());
+        if (number == 4) {
+            status.setRemoteAlive(false);
+        }
+    });
+    EXPECT_TRUE(RebootRemote()(status));
+    EXPECT_THAT(test::FastSleep::sleeps(), AllOf(SizeIs(4), Each(1U)));
+    EXPECT_THAT(test::daemonLogMessages().back(), test::LogLine("checker.cpp", "Remote offline"));
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+TEST_F(RebootTest, APeerThatStaysAliveIsTestedThirtyTimes) {
+    status.setRemoteAlive(true);
+    const ObedientPeer peer;
+    const test::FastSleep sleep([](int) {});
+    EXPECT_TRUE(RebootRemote()(status));
+    EXPECT_THAT(test::FastSleep::sleeps(), AllOf(SizeIs(30), Each(1U)));
+    EXPECT_THAT(test::daemonLogMessages(), Not(Contains(test::LogLine("checker.cpp", "Remote offline"))));
+    EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebooting);  // the alive bit is not its business
+}
+
+TEST_F(RebootTest, ThereIsNoTestAfterTheLastSleep) {
+    status.setRemoteAlive(true);
+    const ObedientPeer peer;
+    const test::FastSleep sleep([this](int number) {
+        if (number == 30) {
+            status.setRemoteAlive(false);
+        }
+    });
+    EXPECT_TRUE(RebootRemote()(status));
+    EXPECT_THAT(test::daemonLogMessages(), Not(Contains(test::LogLine("checker.cpp", "Remote offline"))));
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+// ---- The answering side ----
+
+TEST_F(RebootTest, BothLogsAreOnDiskAndTheKernelIsToldToRestart) {
+    daemonLog->set("last words");
+    recordLog->set("last snapshot");
+    EXPECT_EQ(RebootRemote().handle(status), "");
+    EXPECT_THAT(test::messages(test::readFile("/var/log/ha/ha.daemon.log")), ElementsAre("last words"));
+    EXPECT_THAT(test::messages(test::readFile("/var/log/ha/ha.daemon.record")), ElementsAre("last snapshot"));
+    EXPECT_EQ(test::bufferText(), "");
+    EXPECT_EQ(test::recordText(), "");
+    EXPECT_EQ(test::readFile(TRIGGER), "b");
+    EXPECT_EQ(status.getRemoteNodeState(), 0U);
+}
+
+TEST_F(RebootTest, TheTriggerIsWrittenAnew) {
+    test::writeFile(TRIGGER, "something longer");
+    RebootRemote().handle(status);
+    EXPECT_EQ(test::readFile(TRIGGER), "b");
+}
+
+TEST_F(RebootTest, ATriggerThatCannotBeOpenedIsSilent) {
+    test::removeTree(TRIGGER);
+    test::makeDirectories(TRIGGER);
+    daemonLog->set("last words");
+    EXPECT_EQ(RebootRemote().handle(status), "");
+    EXPECT_THAT(test::messages(test::readFile("/var/log/ha/ha.daemon.log")), ElementsAre("last words"));
+    EXPECT_EQ(test::bufferText(), "");
+}
+
+TEST_F(RebootTest, WithoutADirectoryForTheLogsTheMachineRestartsAllTheSame) {
+    test::removeTree("/var/log/ha");
+    daemonLog->set("lost");
+    EXPECT_EQ(RebootRemote().handle(status), "");
+    EXPECT_EQ(test::readFile(TRIGGER), "b");
+}
+
+TEST_F(RebootTest, TheOrderIsDaemonLogRecordLogSyncTrigger) {
+    test::writeFile("/tmp/ha/ha.daemon.log", "a\n");
+    test::writeFile("/tmp/ha/ha.daemon.record", "b\n");
+    const auto probe =
+        test::run({"strace", "-f", "-o", "/tmp/trace", "-e", "trace=openat,write,sync", REBOOT_PROBE});
+    ASSERT_EQ(probe.exitCode, 0) << probe.error;
+    const std::string trace = test::readFile("/tmp/trace");
+    std::size_t at = 0;
+    for (const char* step :
+         {"\"/var/log/ha/ha.daemon.log\"", "\"a\\n\", 2",
+          "\"/tmp/ha/ha.daemon.log\", O_WRONLY|O_CREAT|O_TRUNC", "\"/var/log/ha/ha.daemon.record\"",
+          "\"b\\n\", 2", "\"/tmp/ha/ha.daemon.record\", O_WRONLY|O_CREAT|O_TRUNC", "sync()",
+          "\"/proc/sysrq-trigger\"", "\"b\", 1"}) {
+        at = trace.find(step, at);
+        ASSERT_NE(at, std::string::npos) << step << " in:\n" << trace;
+    }
+}
+
+}  // namespace

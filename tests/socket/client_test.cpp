@@ -1,0 +1,181 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <syslog.h>
+
+#include <optional>
+
+#include "socket/failing_calls.h"
+#include "socket/local_sockets.h"
+#include "support/sandbox.h"
+#include "support/system_log.h"
+#include "support/wait.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using test::HandlerSocket;
+using ::testing::Each;
+using ::testing::ElementsAre;
+using ::testing::Field;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+
+class ClientSocketTest : public test::SandboxTest {
+ protected:
+    void SetUp() override {
+        test::SandboxTest::SetUp();
+        _systemLog.emplace();
+        openlog("socket-test", LOG_NDELAY, LOG_USER);
+    }
+
+    void TearDown() override {
+        EXPECT_THAT(_systemLog->entries(),
+                    Each(Field(&test::SystemLog::Entry::priority, LOG_USER | LOG_ERR)));
+        closelog();
+        _systemLog.reset();
+        test::SandboxTest::TearDown();
+    }
+
+    std::vector<std::string> systemLog() { return _systemLog->texts(); }
+
+    Json::Value request{"question"};
+    Json::Value reply{"as it was"};
+
+ private:
+    std::optional<test::SystemLog> _systemLog;
+};
+
+TEST_F(ClientSocketTest, SendsOneRequestAndTakesItsReply) {
+    HandlerSocket server([](const Json::Value& asked, Json::Value& answer) {
+        answer["got"] = asked;
+        return true;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    HandlerSocket client({}, test::LOCAL_SOCKET, 5);
+    EXPECT_TRUE(client.clientSend(request, reply));
+    EXPECT_EQ(reply["got"], "question");
+    EXPECT_FALSE(client.hasError());
+    EXPECT_THAT(systemLog(), IsEmpty());
+}
+
+TEST_F(ClientSocketTest, ASecondRequestOnOneObjectFailsForGood) {
+    HandlerSocket server([](const Json::Value&, Json::Value&) { return true; });
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    HandlerSocket client;
+    EXPECT_TRUE(client.clientSend(request, reply));
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_TRUE(client.hasError());
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_THAT(
+        systemLog(),
+        ElementsAre(test::LogLine("socket.cpp",
+                                  "Failed to connect socket /tmp/control.sock: Transport endpoint is "
+                                  "already connected"),
+                    test::LogLine("socket.cpp",
+                                  "Failed to connect socket server: Transport endpoint is already connected"),
+                    test::LogLine("socket.cpp", "Failed to send content: has error")));
+}
+
+TEST_F(ClientSocketTest, WithoutAServerTwoLinesSaySo) {
+    HandlerSocket client;
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_TRUE(client.hasError());
+    EXPECT_EQ(reply, "as it was");
+    EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp",
+                                                       "Failed to connect socket /tmp/control.sock: No "
+                                                       "such file or directory"),
+                                         test::LogLine("socket.cpp",
+                                                       "Failed to connect socket server: No such file "
+                                                       "or directory")));
+}
+
+TEST_F(ClientSocketTest, ATimeoutThatCannotBeSetTwoLinesSaySo) {
+    HandlerSocket client({}, test::LOCAL_SOCKET, 5);
+    const test::FailingSocketCalls failing(EDOM);
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_TRUE(client.hasError());
+    EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp", "Failed to set socket timeout"),
+                                         test::LogLine("socket.cpp",
+                                                       "Failed to connect socket server: Numerical "
+                                                       "argument out of domain")));
+}
+
+TEST_F(ClientSocketTest, GivesUpAfterItsTimeout) {
+    const test::SilentServer server;
+    HandlerSocket client({}, test::LOCAL_SOCKET, 5);
+    const test::Stopwatch stopwatch;
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_GE(stopwatch.elapsed(), 5s);
+    EXPECT_LT(stopwatch.elapsed(), 10s);
+    EXPECT_TRUE(client.hasError());
+    EXPECT_EQ(reply, "as it was");
+    EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp",
+                                                       "Failed to recv , Resource temporarily unavailable")));
+}
+
+class NoTimeoutTest : public ClientSocketTest, public ::testing::WithParamInterface<unsigned int> {};
+
+TEST_P(NoTimeoutTest, WaitsForEver) {
+    const test::FailingSocketCalls failing(EDOM);  // no time-out is set at all
+    test::HandlerSocket client({}, "/tmp/nowhere", GetParam());
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to connect socket /tmp/nowhere: "),
+                                         HasSubstr(" Failed to connect socket server: ")));
+}
+
+INSTANTIATE_TEST_SUITE_P(Timeouts, NoTimeoutTest, ::testing::Values(0U, 2147483648U, 4294967295U));
+
+TEST_F(ClientSocketTest, ARefusedRequestFailsToParse) {
+    HandlerSocket server([](const Json::Value&, Json::Value&) { return false; });
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    HandlerSocket client;
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_TRUE(client.hasError());
+    EXPECT_EQ(reply, "as it was");
+    EXPECT_THAT(systemLog(), ::testing::UnorderedElementsAre(
+                                 test::LogLine("socket.cpp", "Failed to handle input data: \"question\""),
+                                 HasSubstr(" Failed to parse , ")));
+}
+
+TEST_F(ClientSocketTest, AReplyOf2095BytesIsWhole) {
+    HandlerSocket server([](const Json::Value&, Json::Value& answer) {
+        answer = std::string(2093, 'y');
+        return true;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    HandlerSocket client;
+    EXPECT_TRUE(client.clientSend(request, reply));
+    EXPECT_EQ(reply, std::string(2093, 'y'));
+}
+
+TEST_F(ClientSocketTest, ALongerReplyIsCutAndFailsToParse) {
+    HandlerSocket server([](const Json::Value&, Json::Value& answer) {
+        answer = std::string(2094, 'y');
+        return true;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    HandlerSocket client;
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_TRUE(client.hasError());
+    EXPECT_EQ(reply, "as it was");
+    EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to parse \"" + std::string(2094, 'y') + ", ")));
+}
+
+TEST_F(ClientSocketTest, AServerThatHasGoneDoesNotEndTheClient) {
+    std::optional<test::SilentServer> server;
+    server.emplace();
+    HandlerSocket client({}, test::LOCAL_SOCKET, 5);
+    // A server that goes between connect and send cannot be had at will; one whose backlog is dropped resets.
+    std::thread leaving([&server] { server.reset(); });
+    EXPECT_FALSE(client.clientSend(request, reply));
+    leaving.join();
+    EXPECT_TRUE(client.hasError());
+    EXPECT_GE(systemLog().size(), 1U);
+}
+
+}  // namespace

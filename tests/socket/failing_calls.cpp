@@ -1,0 +1,53 @@
+#include "socket/failing_calls.h"
+
+#include <dlfcn.h>
+#include <sys/socket.h>
+
+#include <atomic>
+#include <cerrno>
+
+namespace {
+
+std::atomic<int> failure{0};
+
+// The C library's own function. With 64-bit time on 32 bits it has another name.
+template <class Function>
+Function* real(const char* name, const char* nameWith64BitTime) {
+    void* symbol = sizeof(void*) == 4 ? dlsym(RTLD_NEXT, nameWith64BitTime) : nullptr;
+    if (symbol == nullptr) {
+        symbol = dlsym(RTLD_NEXT, name);
+    }
+    return reinterpret_cast<Function*>(symbol);
+}
+
+int failWith(int error) {
+    errno = error;
+    return -1;
+}
+
+}  // namespace
+
+// The dynamic linker takes these before those of the C library, for every library of the process.
+
+int listen(int fd, int backlog) noexcept {
+    static auto* const realListen = real<int(int, int)>("listen", "listen");
+    return failure != 0 ? failWith(failure) : realListen(fd, backlog);
+}
+
+int setsockopt(int fd, int level, int name, const void* value, socklen_t size) noexcept {
+    static auto* const realSetsockopt =
+        real<int(int, int, int, const void*, socklen_t)>("setsockopt", "__setsockopt64");
+    return failure != 0 ? failWith(failure) : realSetsockopt(fd, level, name, value, size);
+}
+
+namespace test {
+
+FailingSocketCalls::FailingSocketCalls(int error) {
+    failure = error;
+}
+
+FailingSocketCalls::~FailingSocketCalls() {
+    failure = 0;
+}
+
+}  // namespace test

@@ -1,0 +1,432 @@
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <csignal>
+#include <optional>
+#include <thread>
+
+#include "socket/failing_calls.h"
+#include "socket/local_sockets.h"
+#include "support/files.h"
+#include "support/sandbox.h"
+#include "support/system_log.h"
+#include "support/wait.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using test::HandlerSocket;
+using ::testing::Each;
+using ::testing::ElementsAre;
+using ::testing::Field;
+using ::testing::IsEmpty;
+using ::testing::StartsWith;
+
+bool echo(const Json::Value& request, Json::Value& reply) {
+    reply["got"] = request;
+    return true;
+}
+
+class ServerSocketTest : public test::SandboxTest {
+ protected:
+    void SetUp() override {
+        test::SandboxTest::SetUp();
+        _systemLog.emplace();
+        openlog("socket-test", LOG_NDELAY, LOG_USER);
+    }
+
+    void TearDown() override {
+        EXPECT_THAT(_systemLog->entries(),
+                    Each(Field(&test::SystemLog::Entry::priority, LOG_USER | LOG_ERR)));
+        closelog();
+        _systemLog.reset();
+        test::SandboxTest::TearDown();
+    }
+
+    std::vector<std::string> systemLog() { return _systemLog->texts(); }
+
+ private:
+    std::optional<test::SystemLog> _systemLog;
+};
+
+TEST_F(ServerSocketTest, AnswersARequestWithOneCompactTextAndCloses) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send("{ \"b\" : [1, 2],\n\"a\": null /* comments may be there */ }");
+    EXPECT_TRUE(server.serverListen());
+    EXPECT_EQ(client.receiveAll(), R"({"got":{"a":null,"b":[1,2]}})");
+    EXPECT_FALSE(server.hasError());
+    EXPECT_THAT(systemLog(), IsEmpty());
+}
+
+TEST_F(ServerSocketTest, ARequestOf2095BytesIsWhole) {
+    HandlerSocket server([](const Json::Value& request, Json::Value& reply) {
+        reply = Json::Value::UInt64{request["x"].asString().size()};
+        return true;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send(R"({"x":")" + std::string(2095 - 8, 'y') + R"("})");
+    EXPECT_TRUE(server.serverListen());
+    EXPECT_EQ(client.receiveAll(), "2087");
+}
+
+TEST_F(ServerSocketTest, ALongerRequestIsCutAndFailsToParse) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    const std::string request = R"({"x":")" + std::string(2096 - 8, 'y') + R"("})";
+    const test::RawClient client;
+    client.send(request);
+    EXPECT_FALSE(server.serverListen());
+    EXPECT_EQ(client.receiveAll(), "");
+    ASSERT_EQ(systemLog().size(), 1U);
+    const std::string text = systemLog()[0];
+    EXPECT_THAT(text, StartsWith("socket.cpp:"));
+    EXPECT_THAT(text.substr(text.find(' ')),
+                StartsWith(" Failed to parse " + request.substr(0, 2095) + ", "));
+}
+
+TEST_F(ServerSocketTest, ARequestInTwoWritesMayBeReadHalf) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send("{\"act\":");
+    EXPECT_FALSE(server.serverListen());
+    client.send("\"I\"}");
+    EXPECT_EQ(client.receiveAll(), "");
+    EXPECT_THAT(systemLog(), ElementsAre(StartsWith("socket.cpp:")));
+    EXPECT_NE(systemLog()[0].find(" Failed to parse {\"act\":, "), std::string::npos);
+}
+
+TEST_F(ServerSocketTest, ARefusedRequestGetsNoReply) {
+    HandlerSocket server([](const Json::Value&, Json::Value& reply) {
+        reply = "not to be sent";
+        return false;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send("{\"x\": 1}");
+    EXPECT_FALSE(server.serverListen());
+    EXPECT_EQ(client.receiveAll(), "");
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp", "Failed to handle input data: {\"x\": 1}")));
+    EXPECT_FALSE(server.hasError());
+}
+
+TEST_F(ServerSocketTest, TheReplyBeginsAsNull) {
+    HandlerSocket server([](const Json::Value&, Json::Value& reply) { return reply.isNull(); });
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send("{}");
+    EXPECT_TRUE(server.serverListen());
+    EXPECT_EQ(client.receiveAll(), "null");
+}
+
+// ---- What clients may do to a server ----
+
+class HostileRequestTest : public ServerSocketTest, public ::testing::WithParamInterface<std::string> {};
+
+TEST_P(HostileRequestTest, IsLoggedAndTheNextClientIsServed) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient hostile;
+    hostile.send(GetParam());
+    EXPECT_FALSE(server.serverListen());
+    EXPECT_EQ(hostile.receiveAll(), "");
+    ASSERT_EQ(systemLog().size(), 1U);
+    EXPECT_NE(systemLog()[0].find(" Failed to parse "), std::string::npos) << systemLog()[0];
+
+    const test::RawClient next;
+    next.send("{}");
+    EXPECT_TRUE(server.serverListen());
+    EXPECT_EQ(next.receiveAll(), R"({"got":{}})");
+}
+
+INSTANTIATE_TEST_SUITE_P(Requests, HostileRequestTest,
+                         ::testing::Values("hello", "{\"act\":\"I\"", "{\"act\" \"I\"}", "%s%n%m{",
+                                           "\x01\xff\xfe", std::string("\0{}", 3), std::string(1100, '['),
+                                           "{\"a\":" + std::string(2000, '['), std::string(5000, 'x')));
+
+TEST_F(ServerSocketTest, ValuesThatAreNoObjectsAreTheHandlersBusiness) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    for (const std::string request : {"[1,2]", "7", "\"I\"", "null", "true"}) {
+        const test::RawClient client;
+        client.send(request);
+        EXPECT_TRUE(server.serverListen());
+        EXPECT_EQ(client.receiveAll(), "{\"got\":" + request + "}");
+    }
+}
+
+TEST_F(ServerSocketTest, TheTextEndsAtAZeroByte) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send(std::string("{}\0garbage", 10));
+    EXPECT_TRUE(server.serverListen());
+    EXPECT_EQ(client.receiveAll(), R"({"got":{}})");
+}
+
+TEST_F(ServerSocketTest, AnEarlierRequestLeavesNothingBehind) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    for (const std::string request : {"[\"a long request comes first\"]", "[]"}) {
+        const test::RawClient client;
+        client.send(request);
+        EXPECT_TRUE(server.serverListen());
+        EXPECT_EQ(client.receiveAll(), "{\"got\":" + request + "}");
+    }
+}
+
+TEST_F(ServerSocketTest, AnEmptyConnectionFailsToParse) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    { const test::RawClient client; }
+    EXPECT_FALSE(server.serverListen());
+    ASSERT_EQ(systemLog().size(), 1U);
+    EXPECT_NE(systemLog()[0].find(" Failed to parse , "), std::string::npos);
+    EXPECT_FALSE(server.hasError());
+}
+
+TEST_F(ServerSocketTest, ASilentClientHoldsUpTheNextUntilItLeaves) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    test::RawClient silent;
+    std::atomic<bool> isServed{false};
+    std::thread next([&] {
+        EXPECT_EQ(test::exchange("{}"), R"({"got":{}})");
+        isServed = true;
+    });
+    EXPECT_FALSE(test::eventually(500ms, [&] { return isServed.load(); }));
+    silent.close();
+    EXPECT_TRUE(test::eventually(10s, [&] { return isServed.load(); }));
+    next.join();
+}
+
+// ---- A client that has left before its reply ----
+
+std::atomic<int> signals{0};
+
+void countSignal(int) {
+    ++signals;
+}
+
+bool isPending(int signal) {
+    sigset_t pending;
+    sigpending(&pending);
+    return sigismember(&pending, signal) == 1;
+}
+
+class LeavingClientTest : public ServerSocketTest {
+ protected:
+    void SetUp() override {
+        ServerSocketTest::SetUp();
+        _client.emplace(makeServer());
+        _client->send("{}");
+    }
+
+    void TearDown() override {
+        _client.reset();
+        _server.reset();
+        ServerSocketTest::TearDown();
+    }
+
+    bool serve() { return _server->serverListen(); }
+
+ private:
+    const char* makeServer() {
+        _server.emplace([this](const Json::Value&, Json::Value& reply) {
+            _client->close();
+            reply["late"] = true;
+            return true;
+        });
+        EXPECT_TRUE(_server->serverBind());
+        return test::LOCAL_SOCKET;
+    }
+
+    std::optional<HandlerSocket> _server;
+    std::optional<test::RawClient> _client;
+};
+
+TEST_F(LeavingClientTest, CostsTwoLinesAndDoesNotEndTheProcess) {
+    EXPECT_FALSE(serve());
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp", "Failed to send output data: Broken pipe"),
+                            test::LogLine("socket.cpp", "Data: {\"late\":true}")));
+    EXPECT_FALSE(isPending(SIGPIPE));
+}
+
+TEST_F(LeavingClientTest, DoesNotReachTheHostsOwnHandlerNorChangeIt) {
+    struct sigaction action = {};
+    action.sa_handler = countSignal;
+    sigaction(SIGPIPE, &action, nullptr);
+    EXPECT_FALSE(serve());
+    EXPECT_EQ(signals, 0);
+    sigaction(SIGPIPE, nullptr, &action);
+    EXPECT_EQ(action.sa_handler, &countSignal);
+    raise(SIGPIPE);  // neither blocked nor lost
+    EXPECT_EQ(signals, 1);
+}
+
+TEST_F(LeavingClientTest, LeavesASignalThatWasPendingBefore) {
+    struct sigaction action = {};
+    action.sa_handler = countSignal;
+    sigaction(SIGPIPE, &action, nullptr);
+    sigset_t pipe;
+    sigemptyset(&pipe);
+    sigaddset(&pipe, SIGPIPE);
+    pthread_sigmask(SIG_BLOCK, &pipe, nullptr);
+    raise(SIGPIPE);
+    EXPECT_FALSE(serve());
+    EXPECT_TRUE(isPending(SIGPIPE));
+    EXPECT_EQ(signals, 0);
+    pthread_sigmask(SIG_UNBLOCK, &pipe, nullptr);
+    EXPECT_EQ(signals, 1);
+}
+
+// ---- Binding ----
+
+TEST_F(ServerSocketTest, ReplacesASocketFileThatWasLeft) {
+    {
+        HandlerSocket earlier(echo);
+        ASSERT_TRUE(earlier.serverBind());
+    }
+    ASSERT_TRUE(test::exists(test::LOCAL_SOCKET));
+    HandlerSocket server(echo);
+    EXPECT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    EXPECT_EQ(test::exchange("{}"), R"({"got":{}})");
+}
+
+TEST_F(ServerSocketTest, ALongPathIsCutTo107Characters) {
+    const std::string path = "/tmp/" + std::string(115, 'x');
+    const std::string cut = path.substr(0, 107);
+    for (int run = 0; run < 2; ++run) {  // the second finds the file of the first
+        HandlerSocket server(echo, path);
+        EXPECT_TRUE(server.serverBind());
+        EXPECT_TRUE(test::exists(cut));
+        EXPECT_FALSE(test::exists(path));
+        const test::ServingThread serving(server, cut);
+        HandlerSocket client({}, path);
+        Json::Value reply;
+        EXPECT_TRUE(client.clientSend(Json::Value(7), reply));
+        EXPECT_EQ(reply["got"], 7);
+    }
+    EXPECT_THAT(systemLog(),
+                Each(::testing::HasSubstr(" Failed to parse , ")));  // the last, empty connections
+}
+
+TEST_F(ServerSocketTest, APathThatCannotBeBoundIsAnErrorForGood) {
+    HandlerSocket server(echo, "/tmp/nowhere/control.sock");
+    EXPECT_FALSE(server.serverBind());
+    EXPECT_TRUE(server.hasError());
+    EXPECT_FALSE(server.serverListen());
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp",
+                                          "Failed to bind socket /tmp/nowhere/control.sock: No such "
+                                          "file or directory"),
+                            test::LogLine("socket.cpp", "Failed to send content: has error")));
+}
+
+TEST_F(ServerSocketTest, AFailureToListenIsAnErrorForGood) {
+    HandlerSocket server(echo);
+    {
+        const test::FailingSocketCalls failing(EADDRINUSE);
+        EXPECT_FALSE(server.serverBind());
+    }
+    EXPECT_TRUE(server.hasError());
+    EXPECT_FALSE(server.serverListen());
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp", "Failed to set listen: Address already in use"),
+                            test::LogLine("socket.cpp", "Failed to send content: has error")));
+}
+
+TEST_F(ServerSocketTest, WithoutADescriptorThereIsNoSocket) {
+    std::optional<HandlerSocket> server;
+    {
+        const test::NoDescriptors none;
+        server.emplace(echo);
+    }
+    EXPECT_TRUE(server->hasError());
+    EXPECT_FALSE(server->serverListen());
+    Json::Value reply;
+    EXPECT_FALSE(server->clientSend({}, reply));
+    EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp", "Failed to set socket"),
+                                         test::LogLine("socket.cpp", "Failed to send content: has error"),
+                                         test::LogLine("socket.cpp", "Failed to send content: has error")));
+}
+
+// ---- Interruptions ----
+
+TEST_F(ServerSocketTest, ASignalEndsTheWaitForAConnectionWithoutHarm) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    {
+        const test::Interruptions interruptions;
+        EXPECT_FALSE(server.serverListen());
+    }
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp", "Failed to accept: Interrupted system call")));
+    EXPECT_FALSE(server.hasError());
+    const test::ServingThread serving(server);
+    EXPECT_EQ(test::exchange("{}"), R"({"got":{}})");
+}
+
+TEST_F(ServerSocketTest, ASignalEndsTheWaitForARequestWithoutHarm) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient silent;
+    {
+        const test::Interruptions interruptions;
+        EXPECT_FALSE(server.serverListen());
+    }
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp", "Failed to recv: Interrupted system call")));
+    EXPECT_FALSE(server.hasError());
+}
+
+TEST_F(ServerSocketTest, WithoutADescriptorForAConnectionTheNextCallMaySucceed) {
+    HandlerSocket server(echo);
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send("{}");
+    {
+        const test::NoDescriptors none;
+        EXPECT_FALSE(server.serverListen());
+    }
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp", "Failed to accept: Too many open files")));
+    EXPECT_TRUE(server.serverListen());
+    EXPECT_EQ(client.receiveAll(), R"({"got":{}})");
+}
+
+TEST_F(ServerSocketTest, NoSocketIsInheritedByPrograms) {
+    int sockets = 0;
+    int inherited = 0;
+    HandlerSocket server([&](const Json::Value&, Json::Value&) {
+        for (int fd = 3; fd < 100; ++fd) {
+            struct stat info = {};
+            if (fstat(fd, &info) == 0 && S_ISSOCK(info.st_mode)) {
+                ++sockets;
+                inherited += (fcntl(fd, F_GETFD) & FD_CLOEXEC) == 0 ? 1 : 0;
+            }
+        }
+        return true;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send("{}");
+    EXPECT_TRUE(server.serverListen());
+    EXPECT_GE(sockets, 3);  // the listening one and both ends of the connection
+    EXPECT_EQ(inherited, 0);
+}
+
+}  // namespace
