@@ -142,6 +142,15 @@ INSTANTIATE_TEST_SUITE_P(
         Refusal{"7", "Failed get action from content: 7"},
         Refusal{"null", "Failed get action from content: null"}));
 
+TEST_F(ControlTest, TheHandlersResultSaysWhetherThereIsAReply) {
+    Json::Value reply;
+    EXPECT_TRUE(server->serverHandle(parsed(R"({"act":"I"})"), reply));
+    EXPECT_EQ(reply, status.toJson());
+    reply = Json::Value();
+    EXPECT_FALSE(server->serverHandle(parsed(R"({"act":"?"})"), reply));
+    EXPECT_TRUE(reply.isNull());
+}
+
 // ---- The client's side ----
 
 TEST_F(ControlTest, AClientReadsTheStatus) {

@@ -1,0 +1,118 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "support/files.h"
+#include "support/sandbox.h"
+#include "util.h"
+
+namespace {
+
+using TERN::HA::Daemon::Util::devListToHumanReadable;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+constexpr char TABLE[] = "/tmp/ha/info_hd.remote";
+
+class DiskNamesTest : public test::SandboxTest {
+ protected:
+    static std::vector<std::string> names(const std::string& table, const std::vector<std::string>& devices) {
+        test::writeFile(TABLE, table);
+        return devListToHumanReadable(devices);
+    }
+};
+
+constexpr char THREE_DISKS[] = R"({"1": {"HD_DEVNAME": "sda"}, "0-2": {"HD_DEVNAME": "sdb"},
+    "1-3": {"HD_DEVNAME": "sdc", "HD_CONTAINER": "EXP1"}})";
+
+TEST_F(DiskNamesTest, TellUnitSlotAndEnclosure) {
+    EXPECT_THAT(names(THREE_DISKS, {"sda", "sdb", "sdc"}), ElementsAre("Disk 1", "disk 2", "disk 3(EXP1)"));
+    EXPECT_THAT(names(THREE_DISKS, {"sdc", "sda"}), ElementsAre("disk 3(EXP1)", "Disk 1"));
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(DiskNamesTest, ADeviceWithoutAnEntryIsLeftOut) {
+    EXPECT_THAT(names(THREE_DISKS, {"sdz"}), IsEmpty());
+    EXPECT_THAT(names(THREE_DISKS, {"sda", "SDA", "sd", "sdaa", "sdb"}), ElementsAre("Disk 1", "disk 2"));
+    EXPECT_THAT(names(THREE_DISKS, {}), IsEmpty());
+}
+
+TEST_F(DiskNamesTest, WithoutATableDevicesStayAsTheyAre) {
+    EXPECT_THAT(devListToHumanReadable({"sda", "sdb"}), ElementsAre("sda", "sdb"));
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(DiskNamesTest, AnEmptyTableLeavesDevicesAsTheyAre) {
+    EXPECT_THAT(names("{}", {"sda", "sdb"}), ElementsAre("sda", "sdb"));
+    EXPECT_THAT(names("null", {"sda"}), ElementsAre("sda"));
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+class UselessTableTest : public DiskNamesTest, public ::testing::WithParamInterface<std::string> {};
+
+TEST_P(UselessTableTest, LeavesDevicesAsTheyAreAndALine) {
+    EXPECT_THAT(names(GetParam(), {"sda", "sdb"}), ElementsAre("sda", "sdb"));
+    EXPECT_THAT(
+        test::daemonLogMessages(),
+        ElementsAre(test::LogLine("util.cpp", "Failed to read HD info json: /tmp/ha/info_hd.remote")));
+}
+
+INSTANTIATE_TEST_SUITE_P(Tables, UselessTableTest,
+                         ::testing::Values("", "hello", "{\"1\":", "[]", "[{\"HD_DEVNAME\":\"sda\"}]", "7",
+                                           "\"sda\"", "true", std::string(100000, '['),
+                                           "{\"1\":" + std::string(100000, '[')));
+
+TEST_F(DiskNamesTest, ATableThatCannotBeReadLeavesALine) {
+    test::makeDirectories(TABLE);
+    EXPECT_THAT(devListToHumanReadable({"sda"}), ElementsAre("sda"));
+    EXPECT_THAT(
+        test::daemonLogMessages(),
+        ElementsAre(test::LogLine("util.cpp", "Failed to read HD info json: /tmp/ha/info_hd.remote")));
+}
+
+TEST_F(DiskNamesTest, AnEnclosureWithoutANameKeepsItsBrackets) {
+    EXPECT_THAT(names(R"({"2-5":{"HD_DEVNAME":"sda"}})", {"sda"}), ElementsAre("disk 5()"));
+    EXPECT_THAT(names(R"({"2-5":{"HD_DEVNAME":"sda","HD_CONTAINER":null}})", {"sda"}),
+                ElementsAre("disk 5()"));
+}
+
+TEST_F(DiskNamesTest, AKeyIsSplitAtItsFirstDash) {
+    EXPECT_THAT(names(R"({"1-2-3":{"HD_DEVNAME":"sda","HD_CONTAINER":"E"}})", {"sda"}),
+                ElementsAre("disk 2-3(E)"));
+    EXPECT_THAT(names(R"({"0-":{"HD_DEVNAME":"sda"}})", {"sda"}), ElementsAre("disk "));
+    EXPECT_THAT(names(R"({"-7":{"HD_DEVNAME":"sda","HD_CONTAINER":"E"}})", {"sda"}),
+                ElementsAre("disk 7(E)"));
+    EXPECT_THAT(names(R"({"00-7":{"HD_DEVNAME":"sda","HD_CONTAINER":"E"}})", {"sda"}),
+                ElementsAre("disk 7(E)"));
+    EXPECT_THAT(names(R"({"0-7":{"HD_DEVNAME":"sda","HD_CONTAINER":"E"}})", {"sda"}), ElementsAre("disk 7"));
+    EXPECT_THAT(names(R"({"":{"HD_DEVNAME":"sda"}})", {"sda"}), ElementsAre("Disk "));
+}
+
+TEST_F(DiskNamesTest, ADeviceThatIsListedTwiceHasBothNamesInTheOrderOfTheKeys) {
+    EXPECT_THAT(names(R"({"3":{"HD_DEVNAME":"sda"},"10":{"HD_DEVNAME":"sda"}})", {"sda"}),
+                ElementsAre("Disk 10", "Disk 3"));
+}
+
+TEST_F(DiskNamesTest, ADeviceThatIsAskedForTwiceIsNamedTwice) {
+    EXPECT_THAT(names(R"({"3":{"HD_DEVNAME":"sda"}})", {"sda", "sda"}), ElementsAre("Disk 3", "Disk 3"));
+}
+
+TEST_F(DiskNamesTest, MembersOfAnotherShapeArePassedOver) {
+    EXPECT_THAT(
+        names(R"({"1":7,"2":["sda"],"3":null,"4":"sda","5":{"HD_DEVNAME":["sda"]},"6":{"HD_DEVNAME":{}},
+                          "7-1":{"HD_DEVNAME":"sda","HD_CONTAINER":["E"]},"8":{"HD_DEVNAME":"sda"}})",
+              {"sda"}),
+        ElementsAre("Disk 8"));
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(DiskNamesTest, ATableMayHaveComments) {
+    EXPECT_THAT(names("// disks\n{\"1\": /* first */ {\"HD_DEVNAME\": \"sda\"}}", {"sda"}),
+                ElementsAre("Disk 1"));
+}
+
+TEST_F(DiskNamesTest, TheTableIsReadAnewOnEveryCall) {
+    EXPECT_THAT(names(R"({"1":{"HD_DEVNAME":"sda"}})", {"sda"}), ElementsAre("Disk 1"));
+    EXPECT_THAT(names(R"({"2":{"HD_DEVNAME":"sda"}})", {"sda"}), ElementsAre("Disk 2"));
+}
+
+}  // namespace

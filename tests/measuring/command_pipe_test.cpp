@@ -1,0 +1,76 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <stdexcept>
+
+#include "checker.h"
+#include "support/programs.h"
+#include "support/sandbox.h"
+
+namespace {
+
+using TERN::HA::Daemon::CommandPipe;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+class CommandPipeTest : public test::SandboxTest {};
+
+TEST_F(CommandPipeTest, GivesTheOutputOfAProgramWithItsArguments) {
+    const char* const argv[] = {"/bin/echo", "a b", "$HOME", nullptr};
+    {
+        const CommandPipe pipe(argv);
+        EXPECT_FALSE(pipe._failed);
+        EXPECT_EQ(pipe._command, "/bin/echo");
+        char line[512] = {};
+        ASSERT_NE(std::fgets(line, sizeof line, pipe._fp), nullptr);
+        EXPECT_STREQ(line, "a b $HOME\n");  // no shell
+    }
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(CommandPipeTest, AProgramThatCannotBeStartedLeavesOneLine) {
+    const char* const argv[] = {"/nowhere/program", nullptr};
+    {
+        const CommandPipe pipe(argv);
+        EXPECT_TRUE(pipe._failed);
+        EXPECT_EQ(pipe._fp, nullptr);
+    }
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("checker.cpp", "Failed to exec command: /nowhere/program")));
+}
+
+struct End {
+    const char* script;
+    const char* status;
+};
+
+class EndTest : public CommandPipeTest, public ::testing::WithParamInterface<End> {};
+
+TEST_P(EndTest, IsReportedAsTheRawWaitStatus) {
+    test::createProgram("/opt/program", GetParam().script);
+    const char* const argv[] = {"/opt/program", nullptr};
+    { const CommandPipe pipe(argv); }
+    EXPECT_THAT(
+        test::daemonLogMessages(),
+        ElementsAre(test::LogLine(
+            "checker.cpp", std::string("Failed to exec /opt/program return code: ") + GetParam().status)));
+}
+
+INSTANTIATE_TEST_SUITE_P(Ends, EndTest,
+                         ::testing::Values(End{"exit 1", "256"}, End{"exit 255", "65280"},
+                                           End{"kill -KILL $$", "9"}, End{"kill -TERM $$", "15"}));
+
+TEST_F(CommandPipeTest, ClosesAndReportsAlsoWhenAnExceptionPasses) {
+    test::createProgram("/opt/program", "exit 2");
+    const char* const argv[] = {"/opt/program", nullptr};
+    try {
+        const CommandPipe pipe(argv);
+        throw std::runtime_error("on the way");
+    } catch (const std::runtime_error&) {
+        EXPECT_THAT(
+            test::daemonLogMessages(),
+            ElementsAre(test::LogLine("checker.cpp", "Failed to exec /opt/program return code: 512")));
+    }
+}
+
+}  // namespace

@@ -1,0 +1,212 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "checker.h"
+#include "support/files.h"
+#include "support/programs.h"
+#include "support/sandbox.h"
+#include "support/udp.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using TERN::HA::Daemon::InterfaceChecker;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+constexpr char TITLE[] = "Iface      MTU    RX-OK RX-ERR RX-DRP RX-OVR    TX-OK TX-ERR TX-DRP TX-OVR Flg";
+
+class InterfaceTest : public test::SandboxTest {
+ protected:
+    void SetUp() override {
+        test::SandboxTest::SetUp();
+        drbdIF("eth1");
+    }
+
+    // What ifconfig prints from now on, and how it ends.
+    static void print(const std::string& output, const std::string& end = "exit 0") {
+        test::replaceProgram("/sbin/ifconfig", "cat <<'END'\n" + output + "\nEND\n" + end);
+    }
+
+    static std::string line(const std::string& interface, const std::string& rest) {
+        return std::string(TITLE) + "\nlo 65536 7 7 7 7 7 7 7 7 LRU\n" + interface + " 1500 " + rest +
+               " BMRU";
+    }
+
+    // The rate of one sample that must succeed.
+    float sample() {
+        float rate = -7.0F;
+        EXPECT_TRUE(checker.networkNonOkRate(rate));
+        return rate;
+    }
+
+    void expectFailure(const ::testing::Matcher<std::vector<std::string>>& lines) {
+        float rate = -7.0F;
+        EXPECT_FALSE(checker.networkNonOkRate(rate));
+        EXPECT_EQ(rate, -7.0F);
+        EXPECT_THAT(test::daemonLogMessages(), lines);
+    }
+
+    InterfaceChecker checker;
+};
+
+TEST_F(InterfaceTest, TheRealIfconfigCountsPackets) {
+    drbdIF("lo");
+    test::UdpSocket socket("127.0.0.1");
+    socket.send("packet", "127.0.0.1", socket.port());
+    ASSERT_TRUE(socket.receive(5s).has_value());
+    EXPECT_EQ(sample(), 0.0F);
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(InterfaceTest, IfconfigIsAskedForItsShortListing) {
+    test::replaceProgram("/sbin/ifconfig", "printf '%s\\n' \"$#\" \"$@\" > /tmp/arguments");
+    float rate = 0;
+    checker.networkNonOkRate(rate);
+    EXPECT_EQ(test::readFile("/tmp/arguments"), "1\n-s\n");
+}
+
+TEST_F(InterfaceTest, TheFirstSampleCoversEverything) {
+    print(line("eth1", "1000 5 0 0 995 0 0 0"));
+    EXPECT_FLOAT_EQ(sample(), 5.0F / 2000.0F);
+    print(line("eth1", "1000 5 0 0 1005 0 0 0"));  // 10 more are OK: the totals were kept
+    EXPECT_EQ(sample(), 0.0F);
+    print(line("eth1", "1003 6 1 1 1006 1 1 1"));
+    EXPECT_FLOAT_EQ(sample(), 6.0F / 10.0F);
+}
+
+TEST_F(InterfaceTest, WithoutTrafficTheRateIsZero) {
+    print(line("eth1", "1000 5 0 0 995 0 0 0"));
+    sample();
+    EXPECT_EQ(sample(), 0.0F);
+}
+
+TEST_F(InterfaceTest, ColumnsAreFoundByName) {
+    print(
+        "Iface   MTU Met   RX-OK RX-ERR RX-DRP RX-OVR    TX-OK TX-ERR TX-DRP TX-OVR Flg\n"
+        "eth1 1500 0 1000 5 0 0 995 0 0 0 BMRU");
+    EXPECT_FLOAT_EQ(sample(), 0.0025F);
+}
+
+TEST_F(InterfaceTest, OnlyColumnsThatBeginWithRxOrTxCount) {
+    print("Iface xRX-ERR OK TXQ RX-OK\neth1 100 100 1 3");
+    EXPECT_FLOAT_EQ(sample(), 0.25F);
+}
+
+TEST_F(InterfaceTest, CountersMayBeHexadecimalOrOctal) {
+    print(line("eth1", "0x10 010 0 0 0 0 0 0"));
+    EXPECT_FLOAT_EQ(sample(), 8.0F / 24.0F);
+}
+
+TEST_F(InterfaceTest, WhatFollowsANumberDoesNotCount) {
+    print(line("eth1", "6abc none 2 0 0 0 0 0"));
+    EXPECT_FLOAT_EQ(sample(), 2.0F / 8.0F);
+}
+
+TEST_F(InterfaceTest, CountersThatWentBackwardsGiveANegativeRate) {
+    print(line("eth1", "1000 5 0 0 995 0 0 0"));
+    sample();
+    print(line("eth1", "2000 0 0 0 2000 0 0 0"));
+    EXPECT_FLOAT_EQ(sample(), -5.0F / 2000.0F);
+}
+
+TEST_F(InterfaceTest, TheRateIsNotClamped) {
+    print(line("eth1", "1000 5 0 0 995 0 0 0"));
+    sample();
+    print(line("eth1", "990 25 0 0 995 0 0 0"));
+    EXPECT_FLOAT_EQ(sample(), 2.0F);
+}
+
+TEST_F(InterfaceTest, TheDivisionIsInSinglePrecision) {
+    print(line("eth1", "0 16777217 0 0 16777216 0 0 0"));
+    EXPECT_EQ(sample(), 16777216.0F / 33554432.0F);
+}
+
+TEST_F(InterfaceTest, AnInterfaceThatIsNotListedCountsTheColumns) {
+    print(line("eth0", "1000 5 0 0 995 0 0 0"));
+    EXPECT_FLOAT_EQ(sample(), (3.0F + 4 + 5 + 7 + 8 + 9) / (2 + 3 + 4 + 5 + 6 + 7 + 8 + 9));
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(InterfaceTest, AnotherTitleNegatesTheTotals) {
+    print(line("eth1", "1000 5 0 0 995 0 0 0"));
+    sample();
+    print("Kernel Interface table\neth1 1500 1 1 1 1 1 1 1 1 BMRU");
+    EXPECT_FLOAT_EQ(sample(), -5.0F / -2000.0F);
+    EXPECT_EQ(sample(), 0.0F);  // now nothing is left
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(InterfaceTest, APrefixOfTheLineSufficesAndTheFirstLineCounts) {
+    const std::string eth1 = "eth1 1500 100 0 0 0 0 0 0 0 BMRU\n";
+    const std::string eth10 = "eth10 1500 0 100 0 0 0 0 0 0 BMRU\n";
+    print(std::string(TITLE) + "\n" + eth1 + eth10);
+    EXPECT_EQ(sample(), 0.0F);
+    checker = {};
+    print(std::string(TITLE) + "\n" + eth10 + eth1);
+    EXPECT_EQ(sample(), 1.0F);
+}
+
+TEST_F(InterfaceTest, AnIfconfigThatCannotBeStartedLeavesThreeLines) {
+    test::hideProgram("/sbin/ifconfig");
+    expectFailure(ElementsAre(test::LogLine("checker.cpp", "Failed to exec command: /sbin/ifconfig"),
+                              test::LogLine("checker.cpp", "Failed to exec ifconfig to get interface status"),
+                              test::LogLine("checker.cpp", "Failed to get interface detail")));
+}
+
+TEST_F(InterfaceTest, NoOutputIsAFailure) {
+    test::replaceProgram("/sbin/ifconfig", "exit 0");
+    expectFailure(ElementsAre(test::LogLine("checker.cpp", "Failed to get title from ifconfig output"),
+                              test::LogLine("checker.cpp", "Failed to get interface detail")));
+}
+
+TEST_F(InterfaceTest, NoOutputAndAFailingIfconfigLeaveThreeLines) {
+    test::replaceProgram("/sbin/ifconfig", "exit 1");
+    expectFailure(ElementsAre(test::LogLine("checker.cpp", "Failed to get title from ifconfig output"),
+                              test::LogLine("checker.cpp", "Failed to exec /sbin/ifconfig return code: 256"),
+                              test::LogLine("checker.cpp", "Failed to get interface detail")));
+}
+
+TEST_F(InterfaceTest, AnIfconfigThatFailsAfterItsListingIsReportedOnly) {
+    print(line("eth1", "1000 5 0 0 995 0 0 0"), "exit 3");
+    EXPECT_FLOAT_EQ(sample(), 0.0025F);
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("checker.cpp", "Failed to exec /sbin/ifconfig return code: 768")));
+}
+
+class OutOfRangeTest : public InterfaceTest, public ::testing::WithParamInterface<const char*> {};
+
+TEST_P(OutOfRangeTest, IsAFailure) {
+    print(line("eth1", std::string("1000 ") + GetParam() + " 0 0 995 0 0 0"));
+    expectFailure(ElementsAre(test::LogLine("checker.cpp", std::string("strtoll failed: ") + GetParam()),
+                              test::LogLine("checker.cpp", "Failed to get interface detail")));
+}
+
+INSTANTIATE_TEST_SUITE_P(Counters, OutOfRangeTest,
+                         ::testing::Values("9223372036854775807", "-9223372036854775808",
+                                           "99999999999999999999", "-99999999999999999999",
+                                           "0x7fffffffffffffff"));
+
+TEST_F(InterfaceTest, TheLargestCountersDoNotHarm) {
+    print(line("eth1",
+               "9223372036854775806 9223372036854775806 9223372036854775806 0 9223372036854775806 0 0 0"));
+    sample();
+    EXPECT_EQ(sample(), 0.0F);
+}
+
+TEST_F(InterfaceTest, ALineThatIsTooShortIsAFailure) {
+    print(std::string(TITLE) + "\neth1 1500 1000 5 0 0 995 0 0");
+    expectFailure(ElementsAre(test::LogLine("checker.cpp", "Failed to get interface detail")));
+}
+
+TEST_F(InterfaceTest, AFailureLeavesTheTotals) {
+    print(line("eth1", "1000 5 0 0 995 0 0 0"));
+    sample();
+    print(line("eth1", "x"));
+    float rate = 0;
+    EXPECT_FALSE(checker.networkNonOkRate(rate));
+    print(line("eth1", "1009 6 0 0 995 0 0 0"));
+    EXPECT_FLOAT_EQ(sample(), 0.1F);
+}
+
+}  // namespace
