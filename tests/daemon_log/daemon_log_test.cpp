@@ -133,8 +133,8 @@ TEST_F(DaemonLogTest, ALineIsDroppedWhileADirectoryIsInTheWay) {
 }
 
 TEST_F(DaemonLogTest, ALineCostsOneOpenOneWriteAndOneClose) {
-    const auto probe =
-        test::run({"strace", "-f", "-o", "/tmp/trace", "-P", "/tmp/ha/probe.log", LOG_PROBE, "3"});
+    const auto probe = test::run({"strace", "-f", "-E", "ASAN_OPTIONS=detect_leaks=0", "-o", "/tmp/trace",
+                                  "-P", "/tmp/ha/probe.log", LOG_PROBE, "3"});
     ASSERT_EQ(probe.exitCode, 0) << probe.error;
     std::vector<std::string> calls;
     for (const std::string& line : test::lines(test::readFile("/tmp/trace"))) {
@@ -282,8 +282,8 @@ TEST_F(DaemonLogTest, LinesOfAnyLengthAreMovedWhole) {
 TEST_F(DaemonLogTest, EachLineIsAWriteOfItsOwn) {
     test::writeFile("/tmp/ha/probe.log", "one\ntwo\nthree");
     // The reboot of a machine must find whole lines: see how the lines reach the file.
-    const auto probe = test::run({"strace", "-f", "-o", "/tmp/trace", "-P", "/var/log/ha/probe.log", "-e",
-                                  "trace=write", LOG_PROBE, "move"});
+    const auto probe = test::run({"strace", "-f", "-E", "ASAN_OPTIONS=detect_leaks=0", "-o", "/tmp/trace",
+                                  "-P", "/var/log/ha/probe.log", "-e", "trace=write", LOG_PROBE, "move"});
     ASSERT_EQ(probe.exitCode, 0) << probe.error;
     EXPECT_THAT(test::lines(test::readFile("/tmp/trace")),
                 ElementsAre(::testing::HasSubstr("\"one\\n\", 4"), ::testing::HasSubstr("\"two\\n\", 4"),

@@ -29,6 +29,12 @@ int failWith(int error) {
 
 // The dynamic linker takes these before those of the C library, for every library of the process.
 
+int socket(int domain, int type, int protocol) noexcept {
+    static auto* const realSocket = real<int(int, int, int)>("socket", "socket");
+    const bool isLocalStream = domain == AF_UNIX && (type & ~SOCK_CLOEXEC) == SOCK_STREAM;
+    return failure != 0 && isLocalStream ? failWith(failure) : realSocket(domain, type, protocol);
+}
+
 int listen(int fd, int backlog) noexcept {
     static auto* const realListen = real<int(int, int)>("listen", "listen");
     return failure != 0 ? failWith(failure) : realListen(fd, backlog);

@@ -352,7 +352,7 @@ TEST_F(ServerSocketTest, AFailureToListenIsAnErrorForGood) {
 TEST_F(ServerSocketTest, WithoutADescriptorThereIsNoSocket) {
     std::optional<HandlerSocket> server;
     {
-        const test::NoDescriptors none;
+        const test::FailingSocketCalls failing(EMFILE);
         server.emplace(echo);
     }
     EXPECT_TRUE(server->hasError());
