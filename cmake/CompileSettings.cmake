@@ -36,4 +36,7 @@ if(TERNHA_SANITIZE)
   target_compile_options(ternha_settings INTERFACE -fsanitize=${TERNHA_SANITIZE} -fno-omit-frame-pointer
                                                    -fno-sanitize-recover=all)
   target_link_options(ternha_settings INTERFACE -fsanitize=${TERNHA_SANITIZE})
+  if(TERNHA_SANITIZE MATCHES "thread")
+    target_compile_options(ternha_settings INTERFACE "SHELL:-include ${CMAKE_CURRENT_LIST_DIR}/thread_sanitizer.h")
+  endif()
 endif()
