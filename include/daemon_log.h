@@ -35,9 +35,10 @@ class DaemonLog {
     void set(const std::string& text);
 
     // Moves the buffered lines to the end of the persistent log, a write per line, and leaves the buffer file
-    // empty (made when missing). A last line without a newline gains one. The buffer is emptied also when the
-    // persistent log cannot be opened or written: those lines are lost, so that the buffer never grows
-    // without bound. A line that another object appends between the last read and the truncation is lost too.
+    // empty (made when missing). A last line without a newline gains one, after a tenth of a second in which
+    // its end may still come. The buffer is emptied also when the persistent log cannot be opened or written:
+    // those lines are lost, so that the buffer never grows without bound. A line that another object appends
+    // between the last read and the truncation is lost too.
     void writeLogToDisk();
 
     // Compresses the persistent log and every uncompressed archive (log + ".0" to ".39"), then moves each

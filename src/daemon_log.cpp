@@ -6,8 +6,9 @@
 #include <array>
 #include <chrono>
 #include <cstdio>
-#include <cstring>
 #include <ctime>
+#include <string_view>
+#include <thread>
 #include <utility>
 
 #include "file.h"
@@ -24,39 +25,46 @@ constexpr char XZ_SUFFIX[] = ".xz";
 constexpr int ARCHIVES = 40;
 constexpr std::int32_t LOCK_TIMEOUT = 60;
 constexpr std::size_t READ_SIZE = 65536;
+constexpr auto LINE_END_WAIT = std::chrono::milliseconds(1);
+constexpr int LINE_END_WAITS = 100;
 
 using Lock = std::unique_lock<std::timed_mutex>;
 
-// Appends every line of `from` to `to`, each with a newline and a write of its own.
+// Writes every line of `chunk` to `to`, each with a write of its own. What follows the last newline is kept
+// in `beginning`, and what is there already goes in front.
+void moveWholeLines(std::string_view chunk, std::string& beginning, const File& to) {
+    for (std::size_t newline = 0; (newline = chunk.find('\n')) != std::string_view::npos;) {
+        const std::string_view line = chunk.substr(0, newline + 1);
+        if (beginning.empty()) {
+            to.write(line.data(), line.size());
+        } else {
+            beginning += line;
+            to.write(beginning.data(), beginning.size());
+            beginning.clear();
+        }
+        chunk.remove_prefix(line.size());
+    }
+    beginning += chunk;
+}
+
+// Appends every line of `from` to `to`, each with a newline.
 void moveLines(const File& from, const File& to) {
     std::string chunk(READ_SIZE, '\0');
-    std::string beginning;  // of a line whose end has not been read yet
+    std::string beginning;
     ssize_t count = 0;
-    while ((count = from.read(chunk.data(), chunk.size())) > 0) {
-        const char* const end = chunk.data() + count;
-        const char* line = chunk.data();
-        while (line != end) {
-            const auto rest = static_cast<std::size_t>(end - line);
-            const auto* const newline = static_cast<const char*>(std::memchr(line, '\n', rest));
-            if (newline == nullptr) {
-                beginning.append(line, rest);
-                break;
-            }
-            const auto size = static_cast<std::size_t>(newline + 1 - line);
-            if (beginning.empty()) {
-                to.write(line, size);
-            } else {
-                beginning.append(line, size);
-                to.write(beginning.data(), beginning.size());
-                beginning.clear();
-            }
-            line = newline + 1;
+    int waits = 0;
+    do {
+        while ((count = from.read(chunk.data(), chunk.size())) > 0) {
+            moveWholeLines({chunk.data(), static_cast<std::size_t>(count)}, beginning, to);
         }
-    }
-    if (!beginning.empty()) {
-        beginning += '\n';
-        to.write(beginning.data(), beginning.size());
-    }
+        if (beginning.empty()) {
+            return;
+        }
+        // Somebody may be in the middle of an append, whose beginning can be read already.
+        std::this_thread::sleep_for(LINE_END_WAIT);
+    } while (count == 0 && ++waits <= LINE_END_WAITS);
+    beginning += '\n';
+    to.write(beginning.data(), beginning.size());
 }
 
 }  // namespace

@@ -118,8 +118,8 @@ TEST_F(ClientSocketTest, GivesUpAfterItsTimeout) {
 class NoTimeoutTest : public ClientSocketTest, public ::testing::WithParamInterface<unsigned int> {};
 
 TEST_P(NoTimeoutTest, WaitsForEver) {
-    const test::FailingSocketCalls failing(EDOM);  // no time-out is set at all
     test::HandlerSocket client({}, "/tmp/nowhere", GetParam());
+    const test::FailingSocketCalls failing(EDOM);  // no time-out is set at all
     EXPECT_FALSE(client.clientSend(request, reply));
     EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to connect socket /tmp/nowhere: "),
                                          HasSubstr(" Failed to connect socket server: ")));

@@ -276,12 +276,13 @@ TEST_F(LauncherTest, TestProgramRefusesOtherMountsThanInits) {
 TEST_F(LauncherTest, TestProgramRefusesARootThatIsNoTmpfs) {
     makeDirectories("/tmp/root");
     const std::string directory = std::filesystem::path(ownProgram()).parent_path();
-    const CommandResult result =
-        run({"sh", "-ec",
-             "mount -t ramfs ramfs /tmp/root; cd /tmp/root; touch .ternha-sandbox; cp -P /bin /lib* .; "
-             "for part in /usr /proc /.kernel " +
-                 directory + "; do mkdir -p .$part; mount --rbind $part .$part; done; exec chroot . " +
-                 ownProgram() + " --gtest_filter=None.*"});
+    const CommandResult result = run(
+        {"sh", "-ec",
+         "mount -t ramfs ramfs /tmp/root; cd /tmp/root; touch .ternha-sandbox; cp -P /bin /lib* .; "
+         "for part in /usr /proc /.kernel " +
+             directory +
+             "; do mkdir -p .$part; mount --rbind $part .$part; done; exec env -u TSAN_OPTIONS chroot . " +
+             ownProgram() + " --gtest_filter=None.*"});
     EXPECT_EQ(result.exitCode, kOutside);
     EXPECT_THAT(result.error, StartsWith("refusing to run outside the sandbox"));
 }
