@@ -2,13 +2,12 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <json/json.h>
 
 #include <optional>
-#include <sstream>
 
 #include "env_check.h"
 #include "socket/local_sockets.h"
+#include "support/json.h"
 #include "support/sandbox.h"
 #include "support/udp.h"
 #include "support/wait.h"
@@ -17,14 +16,9 @@ namespace {
 
 using namespace std::chrono_literals;
 using namespace TERN::HA::Daemon;
+using test::parsed;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
-
-Json::Value parsed(const std::string& text) {
-    Json::Value value;
-    std::istringstream(text) >> value;
-    return value;
-}
 
 class ControlTest : public test::SandboxTest {
  protected:

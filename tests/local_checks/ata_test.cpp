@@ -1,25 +1,19 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <json/json.h>
 
 #include <filesystem>
-#include <sstream>
 
 #include "checker.h"
 #include "support/files.h"
+#include "support/json.h"
 #include "support/sandbox.h"
 
 namespace {
 
 using TERN::HA::Daemon::isDiskErrHandling;
+using test::parsed;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
-
-Json::Value parsed(const std::string& text) {
-    Json::Value value;
-    std::istringstream(text) >> value;
-    return value;
-}
 
 class AtaTest : public test::SandboxTest {
  protected:

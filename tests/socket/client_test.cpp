@@ -1,48 +1,26 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <syslog.h>
 
 #include <optional>
+#include <thread>
 
 #include "socket/failing_calls.h"
 #include "socket/local_sockets.h"
-#include "support/sandbox.h"
-#include "support/system_log.h"
+#include "socket/socket_test.h"
 #include "support/wait.h"
 
 namespace {
 
 using namespace std::chrono_literals;
 using test::HandlerSocket;
-using ::testing::Each;
 using ::testing::ElementsAre;
-using ::testing::Field;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 
-class ClientSocketTest : public test::SandboxTest {
+class ClientSocketTest : public test::SocketTest {
  protected:
-    void SetUp() override {
-        test::SandboxTest::SetUp();
-        _systemLog.emplace();
-        openlog("socket-test", LOG_NDELAY, LOG_USER);
-    }
-
-    void TearDown() override {
-        EXPECT_THAT(_systemLog->entries(),
-                    Each(Field(&test::SystemLog::Entry::priority, LOG_USER | LOG_ERR)));
-        closelog();
-        _systemLog.reset();
-        test::SandboxTest::TearDown();
-    }
-
-    std::vector<std::string> systemLog() { return _systemLog->texts(); }
-
     Json::Value request{"question"};
     Json::Value reply{"as it was"};
-
- private:
-    std::optional<test::SystemLog> _systemLog;
 };
 
 TEST_F(ClientSocketTest, SendsOneRequestAndTakesItsReply) {

@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -13,9 +12,8 @@
 
 #include "socket/failing_calls.h"
 #include "socket/local_sockets.h"
+#include "socket/socket_test.h"
 #include "support/files.h"
-#include "support/sandbox.h"
-#include "support/system_log.h"
 #include "support/wait.h"
 
 namespace {
@@ -24,7 +22,6 @@ using namespace std::chrono_literals;
 using test::HandlerSocket;
 using ::testing::Each;
 using ::testing::ElementsAre;
-using ::testing::Field;
 using ::testing::IsEmpty;
 using ::testing::StartsWith;
 
@@ -33,27 +30,7 @@ bool echo(const Json::Value& request, Json::Value& reply) {
     return true;
 }
 
-class ServerSocketTest : public test::SandboxTest {
- protected:
-    void SetUp() override {
-        test::SandboxTest::SetUp();
-        _systemLog.emplace();
-        openlog("socket-test", LOG_NDELAY, LOG_USER);
-    }
-
-    void TearDown() override {
-        EXPECT_THAT(_systemLog->entries(),
-                    Each(Field(&test::SystemLog::Entry::priority, LOG_USER | LOG_ERR)));
-        closelog();
-        _systemLog.reset();
-        test::SandboxTest::TearDown();
-    }
-
-    std::vector<std::string> systemLog() { return _systemLog->texts(); }
-
- private:
-    std::optional<test::SystemLog> _systemLog;
-};
+class ServerSocketTest : public test::SocketTest {};
 
 TEST_F(ServerSocketTest, AnswersARequestWithOneCompactTextAndCloses) {
     HandlerSocket server(echo);

@@ -2,24 +2,18 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <json/json.h>
 
-#include <sstream>
 #include <thread>
 
+#include "support/json.h"
 #include "support/sandbox.h"
 
 namespace {
 
 using namespace TERN::HA::Daemon;
+using test::parsed;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
-
-Json::Value parsed(const std::string& text) {
-    Json::Value value;
-    std::istringstream(text) >> value;
-    return value;
-}
 
 class StatusTest : public test::SandboxTest {
  protected:
