@@ -127,8 +127,8 @@ bool isSysfsValue(const std::string& path, const std::string& expected);
 // Runs a program and holds the stream of its output. One thread at a time.
 class CommandPipe {
  public:
-    // Starts argv[0] with the null-terminated vector `argv`, without a shell. When that fails _failed is set
-    // and the log has "Failed to exec command: " and the program's path.
+    // Starts argv[0] with the null-terminated vector `argv`, without a shell. When that fails, or the vector
+    // is empty, _failed is set and the log has "Failed to exec command: " and the program's path.
     explicit CommandPipe(const char* const* argv);
 
     // Closes the stream and waits for the program to end. Unless that exited with code 0 the log has "Failed

@@ -299,8 +299,11 @@ bool devNameByAtaPath(char* path, std::string& name) {
 
 // ---- External programs ----
 
-CommandPipe::CommandPipe(const char* const* argv) : _fp(nullptr), _failed(false), _command(argv[0]) {
-    _fp = PLATPopenv(argv[0], "r", argv);
+CommandPipe::CommandPipe(const char* const* argv) : _fp(nullptr), _failed(false) {
+    if (argv[0] != nullptr) {
+        _command = argv[0];
+        _fp = PLATPopenv(argv[0], "r", argv);
+    }
     if (_fp == nullptr) {
         HA_LOG("Failed to exec command: " + _command);
         _failed = true;

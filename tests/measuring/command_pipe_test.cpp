@@ -39,6 +39,13 @@ TEST_F(CommandPipeTest, AProgramThatCannotBeStartedLeavesOneLine) {
                 ElementsAre(test::LogLine("checker.cpp", "Failed to exec command: /nowhere/program")));
 }
 
+TEST_F(CommandPipeTest, AnEmptyVectorIsAProgramThatCannotBeStarted) {
+    const char* const argv[] = {nullptr};
+    EXPECT_TRUE(CommandPipe(argv)._failed);
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("checker.cpp", "Failed to exec command: ")));
+}
+
 struct End {
     const char* script;
     const char* status;
