@@ -334,14 +334,8 @@ class ReceivingTest : public test::SandboxTest {
     std::uint16_t port_ = 0;
 };
 
-struct TransportNames {
-    template <class Transport>
-    static std::string GetName(int) {
-        return std::is_same_v<Transport, HASocketCommServer> ? "Server" : "Client";
-    }
-};
 using Transports = ::testing::Types<HASocketCommServer, HASocketCommClient>;
-TYPED_TEST_SUITE(ReceivingTest, Transports, TransportNames);
+TYPED_TEST_SUITE(ReceivingTest, Transports, );
 
 TYPED_TEST(ReceivingTest, ADatagramOf63BytesIsWhole) {
     const std::string text(63, 'x');

@@ -171,36 +171,37 @@ TEST_F(RegistryTest, TheHostnameCheckKeepsTheCallsThatAskNothing) {
 }
 
 using AddressFunction = std::string (*)(const std::string&);
-class AddressTest : public test::SandboxTest, public ::testing::WithParamInterface<AddressFunction> {};
+const std::map<std::string, AddressFunction> addressFunctions = {
+    {"drbdIF", drbdIF}, {"localIP", localIP}, {"remoteIP", remoteIP}};
+
+class AddressTest : public test::SandboxTest, public ::testing::WithParamInterface<std::string> {
+ protected:
+    const AddressFunction address = addressFunctions.at(GetParam());
+};
 
 TEST_P(AddressTest, IsEmptyAtFirst) {
-    EXPECT_EQ(GetParam()(""), "");
+    EXPECT_EQ(address(""), "");
 }
 
 TEST_P(AddressTest, IsKeptOnceSetAndReadWithAnEmptyText) {
-    EXPECT_EQ(GetParam()("10.0.0.2"), "10.0.0.2");
-    EXPECT_EQ(GetParam()(""), "10.0.0.2");
-    EXPECT_EQ(GetParam()(""), "10.0.0.2");
+    EXPECT_EQ(address("10.0.0.2"), "10.0.0.2");
+    EXPECT_EQ(address(""), "10.0.0.2");
+    EXPECT_EQ(address(""), "10.0.0.2");
 }
 
 TEST_P(AddressTest, IsReplacedByALaterText) {
-    GetParam()("10.0.0.2");
-    EXPECT_EQ(GetParam()("any text"), "any text");
-    EXPECT_EQ(GetParam()(""), "any text");
+    address("10.0.0.2");
+    EXPECT_EQ(address("any text"), "any text");
+    EXPECT_EQ(address(""), "any text");
 }
 
 TEST_P(AddressTest, IsApartFromTheOthers) {
-    GetParam()("10.0.0.2");
-    for (const AddressFunction other : {drbdIF, localIP, remoteIP}) {
-        EXPECT_EQ(other(""), other == GetParam() ? "10.0.0.2" : "");
+    address("10.0.0.2");
+    for (const auto& [name, other] : addressFunctions) {
+        EXPECT_EQ(other(""), name == GetParam() ? "10.0.0.2" : "") << name;
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(Functions, AddressTest, ::testing::Values(drbdIF, localIP, remoteIP),
-                         [](const auto& instance) -> std::string {
-                             return instance.param == drbdIF    ? "DrbdIf"
-                                    : instance.param == localIP ? "LocalIp"
-                                                                : "RemoteIp";
-                         });
+INSTANTIATE_TEST_SUITE_P(Functions, AddressTest, ::testing::Values("drbdIF", "localIP", "remoteIP"));
 
 }  // namespace

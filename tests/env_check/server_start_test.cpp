@@ -53,6 +53,7 @@ class ServerStartTest : public ::testing::Test {
 TEST_F(ServerStartTest, NothingIsBoundBeforeTheFirstPass) {
     localIP(kServer);
     EXPECT_FALSE(isBound(kServer, kPeerPort));
+    EXPECT_FALSE(isBound("0.0.0.0", kPeerPort));
 }
 
 TEST_F(ServerStartTest, WithoutALocalAddressListensOnAllAddresses) {

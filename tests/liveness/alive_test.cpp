@@ -90,6 +90,6 @@ TEST_P(OtherAnswerTest, IsNotAliveAndNotLogged) {
 INSTANTIATE_TEST_SUITE_P(Answers, OtherAnswerTest,
                          ::testing::Values("", "Alive", "ALIVE", "alive\n", "alive\r\n", "alive ", " alive",
                                            "aliv", "alivee", "dead", "\0alive"s, "Undefine",
-                                           "alive" + std::string(95, ' ')));
+                                           "alive" + std::string(95, 'e')));
 
 }  // namespace
