@@ -50,7 +50,9 @@ INSTANTIATE_TEST_SUITE_P(States, OtherStateTest,
                          ::testing::Values("StandAlone", "Disconnecting", "Unconnected", "Timeout",
                                            "BrokenPipe", "NetworkFailure", "ProtocolError", "TearDown",
                                            "WFConnection", "Ahead", "Behind", "connected", "CONNECTED",
-                                           "Connecte", "Con\nnected"));
+                                           "Connecte", "WFReportParam", "StartingSync", "WFBitMap",
+                                           "WFSyncUUI", "SyncSourc", "SyncTarge", "PausedSync", "Verify",
+                                           "Con\nnected"));
 
 TEST_F(DrbdTest, OneConnectedResourceSuffices) {
     EXPECT_TRUE(isConnectedWith(HEADER + resource(0, "StandAlone") + resource(1, "Connected")));
