@@ -6,6 +6,7 @@
 #include <optional>
 
 #include "env_check.h"
+#include "socket/case_name.h"
 #include "socket/local_sockets.h"
 #include "support/json.h"
 #include "support/sandbox.h"
@@ -37,7 +38,11 @@ class ControlTest : public test::SandboxTest {
     // One exchange of bytes.
     std::string ask(const std::string& request) {
         const test::RawClient client;
-        client.send(request);
+        if (request.empty()) {
+            client.finish();
+        } else {
+            client.send(request);
+        }
         server->serverListen();
         return client.receiveAll();
     }
@@ -107,9 +112,12 @@ TEST_F(ControlTest, ServesNobodyElseUntilThePeerIsDown) {
 }
 
 struct Refusal {
-    const char* request;
-    const char* line;
+    const char* name;
+    std::string request;
+    std::string line;
 };
+
+const std::string LONGEST_REQUEST = R"({"a":")" + std::string(2087, 'y') + R"("})";
 
 class RefusalTest : public ControlTest, public ::testing::WithParamInterface<Refusal> {};
 
@@ -122,19 +130,36 @@ TEST_P(RefusalTest, IsLoggedAndNotAnswered) {
 INSTANTIATE_TEST_SUITE_P(
     Requests, RefusalTest,
     ::testing::Values(
-        Refusal{R"({"act":"x"})", "Unknown action x"},
-        Refusal{R"({"act":"x and more"})", "Unknown action x and more"},
-        Refusal{R"({"act":"i"})", "Unknown action i"}, Refusal{R"({"act":""})", "Unknown action "},
-        Refusal{R"({"act":5})", "Unknown action 5"}, Refusal{R"({"act":true})", "Unknown action true"},
-        Refusal{R"({"act":1.5})", "Unknown action 1.5"}, Refusal{R"({"act":null})", "Unknown action "},
-        Refusal{R"({"act":["I"]})", "Unknown action "}, Refusal{R"({"act":{"I":"I"}})", "Unknown action "},
-        Refusal{R"({ "Act" : "I", "a": [1, 2] })",
+        Refusal{"UnknownLetter", R"({"act":"x"})", "Unknown action x"},
+        Refusal{"UnknownWords", R"({"act":"x and more"})", "Unknown action x and more"},
+        Refusal{"OtherCase", R"({"act":"i"})", "Unknown action i"},
+        Refusal{"EmptyString", R"({"act":""})", "Unknown action "},
+        Refusal{"ZeroFirst", R"({"act":"\u0000I"})", std::string("Unknown action \0I", 17)},
+        Refusal{"Number", R"({"act":5})", "Unknown action 5"},
+        Refusal{"Bool", R"({"act":true})", "Unknown action true"},
+        Refusal{"Real", R"({"act":1.5})", "Unknown action 1.5"},
+        Refusal{"Null", R"({"act":null})", "Unknown action "},
+        Refusal{"Array", R"({"act":["I"]})", "Unknown action "},
+        Refusal{"Object", R"({"act":{"I":"I"}})", "Unknown action "},
+        Refusal{"NoAct", R"({ "Act" : "I", "a": [1, 2] })",
                 R"(Failed get action from content: {"Act":"I","a":[1,2]})"},
-        Refusal{"{}", "Failed get action from content: {}"},
-        Refusal{R"(["act"])", R"(Failed get action from content: ["act"])"},
-        Refusal{R"("I")", R"(Failed get action from content: "I")"},
-        Refusal{"7", "Failed get action from content: 7"},
-        Refusal{"null", "Failed get action from content: null"}));
+        Refusal{"EmptyObject", "{}", "Failed get action from content: {}"},
+        Refusal{"LongestObject", LONGEST_REQUEST, "Failed get action from content: " + LONGEST_REQUEST},
+        Refusal{"NoObjectButAnArray", R"(["act"])", R"(Failed get action from content: ["act"])"},
+        Refusal{"NoObjectButAString", R"("I")", R"(Failed get action from content: "I")"},
+        Refusal{"NoObjectButANumber", "7", "Failed get action from content: 7"},
+        Refusal{"NoObjectButNull", "null", "Failed get action from content: null"}),
+    test::CaseName());
+
+// Texts that are no requests at all are none of the handler's business, and cost it nothing.
+TEST_F(ControlTest, WhatIsNoJsonLeavesNoLineAndTheNextClientIsServed) {
+    for (const std::string request : {"", "I", "{\"act\":\"I\"", "{act:\"I\"}"}) {
+        EXPECT_EQ(ask(request), "") << request;
+    }
+    EXPECT_EQ(ask("{\"act\":" + std::string(2000, '[')), "");
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+    EXPECT_EQ(ask(R"({"act":"r"})"), R"({"is_froce_reboot_remote":false})");
+}
 
 TEST_F(ControlTest, TheHandlersResultSaysWhetherThereIsAReply) {
     Json::Value reply;
@@ -169,6 +194,17 @@ TEST_F(ControlTest, AClientOrdersAReboot) {
     EXPECT_TRUE(status.isRemoteRebooting());
 }
 
+TEST(ControlClientTest, AsksInCompactTexts) {
+    const test::SilentServer server;
+    Json::Value record;
+    EXPECT_FALSE(MonitordSocket(test::LOCAL_SOCKET, 1).getServerData(record));
+    EXPECT_EQ(server.received(), R"({"act":"I"})");
+    EXPECT_FALSE(MonitordSocket(test::LOCAL_SOCKET, 1).isRebootRemote());
+    EXPECT_EQ(server.received(), R"({"act":"r"})");
+    EXPECT_FALSE(MonitordSocket(test::LOCAL_SOCKET, 1).rebootRemote());
+    EXPECT_EQ(server.received(), R"({"act":"R"})");
+}
+
 TEST(ControlClientTest, WithoutAServerEverythingIsFalse) {
     Json::Value record("as it was");
     EXPECT_FALSE(MonitordSocket("/tmp/nowhere", 1).getServerData(record));
@@ -177,12 +213,17 @@ TEST(ControlClientTest, WithoutAServerEverythingIsFalse) {
     EXPECT_EQ(record, "as it was");
 }
 
-class OddReplyTest : public test::SandboxTest, public ::testing::WithParamInterface<const char*> {};
+struct OddReply {
+    const char* name;
+    const char* text;
+};
+
+class OddReplyTest : public test::SandboxTest, public ::testing::WithParamInterface<OddReply> {};
 
 TEST_P(OddReplyTest, IsNoReboot) {
     test::HandlerSocket server([](const Json::Value& request, Json::Value& reply) {
         EXPECT_EQ(request, parsed(R"({"act":"r"})"));
-        reply = parsed(GetParam());
+        reply = parsed(GetParam().text);
         return true;
     });
     ASSERT_TRUE(server.serverBind());
@@ -191,9 +232,13 @@ TEST_P(OddReplyTest, IsNoReboot) {
 }
 
 INSTANTIATE_TEST_SUITE_P(Replies, OddReplyTest,
-                         ::testing::Values("{}", R"({"is_force_reboot_remote":true})", "null", "true",
-                                           "[true]", "7", R"({"is_froce_reboot_remote":"true"})",
-                                           R"({"is_froce_reboot_remote":[true]})",
-                                           R"({"is_froce_reboot_remote":null})"));
+                         ::testing::Values(OddReply{"EmptyObject", "{}"},
+                                           OddReply{"AnotherMember", R"({"is_force_reboot_remote":true})"},
+                                           OddReply{"Null", "null"}, OddReply{"Bool", "true"},
+                                           OddReply{"Array", "[true]"}, OddReply{"Number", "7"},
+                                           OddReply{"AString", R"({"is_froce_reboot_remote":"true"})"},
+                                           OddReply{"AnArray", R"({"is_froce_reboot_remote":[true]})"},
+                                           OddReply{"ANull", R"({"is_froce_reboot_remote":null})"}),
+                         test::CaseName());
 
 }  // namespace

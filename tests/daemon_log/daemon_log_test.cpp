@@ -169,6 +169,22 @@ TEST_F(DaemonLogTest, ALogLineNamesItsOwnPlace) {
                 ElementsAre("daemon_log_test.cpp:" + std::to_string(line) + " message"));
 }
 
+TEST_F(DaemonLogTest, AProcessCanLogToItsVeryEnd) {
+    const auto probe = test::run({LOG_PROBE, "end"});
+    EXPECT_EQ(probe.exitCode, 0) << probe.error;
+    EXPECT_THAT(test::daemonLogMessages(), ElementsAre("last word"));
+}
+
+TEST_F(DaemonLogTest, TheFilesAreNamedAfterTheArguments) {
+    test::makeDirectories("/var/other");
+    DaemonLog other("/var/other", "/x.log");
+    other.set("x");
+    EXPECT_THAT(test::messages(test::readFile("/tmp/ha/x.log")), ElementsAre("x"));
+    other.writeLogToDisk();
+    EXPECT_THAT(test::messages(test::readFile("/var/other/x.log")), ElementsAre("x"));
+    EXPECT_FALSE(test::exists(BUFFER));
+}
+
 TEST_F(DaemonLogTest, TheRecordLogIsAFileOfItsOwn) {
     TERN::HA::Daemon::recordLog->set("snapshot");
     EXPECT_FALSE(test::exists(BUFFER));
@@ -214,6 +230,33 @@ TEST_F(DaemonLogTest, LongLinesOfTwoProcessesArriveWhole) {
     expectWholeLines(100);
 }
 
+TEST_F(DaemonLogTest, LinesOfManyThreadsArriveWholeAndEachThreadsInOrder) {
+    constexpr int THREADS = 8;
+    constexpr int LINES = 200;
+    std::vector<std::thread> threads;
+    for (int i = 0; i < THREADS; ++i) {
+        threads.emplace_back([this, i] {
+            for (int number = 0; number < LINES; ++number) {
+                log.set(std::to_string(i) + " " + std::to_string(number));
+            }
+        });
+    }
+    for (std::thread& thread : threads) {
+        thread.join();
+    }
+    std::vector<std::vector<std::string>> seen(THREADS);
+    for (const std::string& message : test::daemonLogMessages()) {
+        seen.at(static_cast<std::size_t>(message.at(0) - '0')).push_back(message);
+    }
+    for (int i = 0; i < THREADS; ++i) {
+        std::vector<std::string> expected;
+        for (int number = 0; number < LINES; ++number) {
+            expected.push_back(std::to_string(i) + " " + std::to_string(number));
+        }
+        EXPECT_EQ(seen.at(static_cast<std::size_t>(i)), expected);
+    }
+}
+
 // ---- Moving to disk ----
 
 TEST_F(DaemonLogTest, MovesTheLinesInOrderToTheEndOfTheLog) {
@@ -248,6 +291,13 @@ TEST_F(DaemonLogTest, WithoutTheLogsDirectoryTheBufferIsEmptiedAllTheSame) {
     log.set("kept");
     log.writeLogToDisk();
     EXPECT_THAT(test::messages(test::readFile(LOG)), ElementsAre("kept"));
+}
+
+TEST_F(DaemonLogTest, WithADirectoryForALogTheBufferIsEmptiedAllTheSame) {
+    test::makeDirectories(LOG);
+    log.set("lost");
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(BUFFER), "");
 }
 
 TEST_F(DaemonLogTest, WithADirectoryForABufferNothingIsMoved) {

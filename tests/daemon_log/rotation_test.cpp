@@ -10,6 +10,7 @@
 namespace {
 
 using TERN::HA::Daemon::DaemonLog;
+using ::testing::ElementsAre;
 
 constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
 
@@ -96,6 +97,43 @@ TEST_F(RotationTest, ALogWhoseArchiveIsInTheWayStaysUncompressed) {
     log.rotate();
     EXPECT_EQ(test::readFile(LOG), "new");
     EXPECT_EQ(uncompressed(archive(0) + ".xz"), "old");
+    log.rotate();
+    EXPECT_FALSE(test::exists(LOG));
+    EXPECT_EQ(uncompressed(archive(0) + ".xz"), "new");
+    EXPECT_EQ(uncompressed(archive(1) + ".xz"), "old");
+}
+
+TEST_F(RotationTest, AnUncompressedArchiveWithACompressedNamesakeWaitsForTheNextRotation) {
+    compress(archive(5), "compressed");
+    test::writeFile(archive(5), "uncompressed");
+    log.rotate();
+    EXPECT_EQ(test::readFile(archive(5)), "uncompressed");
+    EXPECT_EQ(uncompressed(archive(6) + ".xz"), "compressed");
+    log.rotate();
+    EXPECT_FALSE(test::exists(archive(5)));
+    EXPECT_EQ(uncompressed(archive(6) + ".xz"), "uncompressed");
+    EXPECT_EQ(uncompressed(archive(7) + ".xz"), "compressed");
+}
+
+TEST_F(RotationTest, XzIsRunWithoutOptionsOnEachFileThatIsThereTheLogFirst) {
+    const std::string probeLog = "/var/log/ha/probe.log";
+    for (const char* suffix : {".39", ".10", ".0", ""}) {
+        test::writeFile(probeLog + suffix, "content");
+    }
+    const auto probe = test::run({"strace", "-f", "-E", "ASAN_OPTIONS=detect_leaks=0", "-o", "/tmp/trace",
+                                  "-e", "trace=execve", LOG_PROBE, "rotate"});
+    ASSERT_EQ(probe.exitCode, 0) << probe.error;
+    std::vector<std::string> calls;
+    for (const std::string& line : test::lines(test::readFile("/tmp/trace"))) {
+        const std::size_t call = line.find("execve(\"/bin/xz\", ");
+        if (call != std::string::npos) {
+            calls.push_back(line.substr(call, line.find(']', call) + 1 - call));
+        }
+    }
+    EXPECT_THAT(calls, ElementsAre(R"(execve("/bin/xz", ["/bin/xz", "/var/log/ha/probe.log"])",
+                                   R"(execve("/bin/xz", ["/bin/xz", "/var/log/ha/probe.log.0"])",
+                                   R"(execve("/bin/xz", ["/bin/xz", "/var/log/ha/probe.log.10"])",
+                                   R"(execve("/bin/xz", ["/bin/xz", "/var/log/ha/probe.log.39"])"));
 }
 
 TEST_F(RotationTest, WithoutXzNothingIsLost) {
@@ -122,7 +160,7 @@ TEST_F(RotationTest, TheNextMoveMakesANewLog) {
     log.rotate();
     log.set("second");
     log.writeLogToDisk();
-    EXPECT_THAT(test::messages(test::readFile(LOG)), ::testing::ElementsAre("second"));
+    EXPECT_THAT(test::messages(test::readFile(LOG)), ElementsAre("second"));
 }
 
 TEST_F(RotationTest, SizeIsThatOfTheLog) {
@@ -131,6 +169,8 @@ TEST_F(RotationTest, SizeIsThatOfTheLog) {
     EXPECT_EQ(log.size(), 0);
     test::writeFile(LOG, std::string(12345, 'x'));
     EXPECT_EQ(log.size(), 12345);
+    test::removeTree("/var/log/ha");
+    EXPECT_EQ(log.size(), 0);
 }
 
 TEST_F(RotationTest, SizeOfALargeLogIsTrue) {

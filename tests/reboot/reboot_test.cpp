@@ -1,11 +1,10 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <thread>
-
 #include "checker.h"
 #include "ha_log.h"
 #include "reboot/fast_sleep.h"
+#include "reboot/obedient_peer.h"
 #include "support/files.h"
 #include "support/programs.h"
 #include "support/sandbox.h"
@@ -20,7 +19,6 @@ using ::testing::AllOf;
 using ::testing::Contains;
 using ::testing::Each;
 using ::testing::ElementsAre;
-using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using ::testing::Not;
 using ::testing::SizeIs;
@@ -39,33 +37,20 @@ class RebootTest : public test::SandboxTest {
 
 // ---- The asking side ----
 
-// A peer that answers the request.
-class ObedientPeer {
- public:
-    ObedientPeer()
-        : _thread([this] {
-              if (const auto question = _socket.receive(10s)) {
-                  _question = question->bytes;
-                  _socket.send("", question->address, question->port);
-              }
-          }) {}
-
-    ~ObedientPeer() {
-        _thread.join();
-        EXPECT_EQ(_question, "reboot_remote");
-    }
-
-    ObedientPeer(const ObedientPeer&) = delete;
-    ObedientPeer& operator=(const ObedientPeer&) = delete;
-
- private:
-    test::UdpSocket _socket{"127.0.0.2", 7499};
-    std::string _question;
-    std::thread _thread;
-};
+TEST_F(RebootTest, TheInheritedOperatorsAskNobody) {
+    test::UdpSocket peer("127.0.0.2", 7499);
+    RebootRemote reboot;
+    EnvCheck& check = reboot;
+    Json::Value out("as it was");
+    EXPECT_TRUE(check());
+    EXPECT_TRUE(check(out));
+    EXPECT_EQ(out, "as it was");
+    EXPECT_FALSE(peer.receive(0ms).has_value());
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
 
 TEST_F(RebootTest, APeerThatCountsAsDeadIsOfflineAtOnce) {
-    const ObedientPeer peer;
+    const test::ObedientPeer peer;
     const test::FastSleep noSleep([](int) {});
     EXPECT_TRUE(RebootRemote()(status));
     EXPECT_THAT(test::FastSleep::sleeps(), IsEmpty());
@@ -86,7 +71,7 @@ TEST_F(RebootTest, APeerThatDoesNotAnswerIsFollowedAllTheSame) {
 
 TEST_F(RebootTest, APeerIsFollowedUntilItIsDeclaredDead) {
     status.setRemoteAlive(true);
-    const ObedientPeer peer;
+    const test::ObedientPeer peer;
     const test::FastSleep sleep([this](int number) {
         // Both bits may be set, and the reboot counts from the request on.
         EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebootPending);
@@ -103,7 +88,7 @@ TEST_F(RebootTest, APeerIsFollowedUntilItIsDeclaredDead) {
 
 TEST_F(RebootTest, APeerThatStaysAliveIsTestedThirtyTimes) {
     status.setRemoteAlive(true);
-    const ObedientPeer peer;
+    const test::ObedientPeer peer;
     const test::FastSleep sleep([](int) {});
     EXPECT_TRUE(RebootRemote()(status));
     EXPECT_THAT(test::FastSleep::sleeps(), AllOf(SizeIs(30), Each(1U)));
@@ -113,7 +98,7 @@ TEST_F(RebootTest, APeerThatStaysAliveIsTestedThirtyTimes) {
 
 TEST_F(RebootTest, ThereIsNoTestAfterTheLastSleep) {
     status.setRemoteAlive(true);
-    const ObedientPeer peer;
+    const test::ObedientPeer peer;
     const test::FastSleep sleep([this](int number) {
         if (number == 30) {
             status.setRemoteAlive(false);

@@ -93,6 +93,16 @@ TEST_F(ClientSocketTest, GivesUpAfterItsTimeout) {
                                                        "Failed to recv , Resource temporarily unavailable")));
 }
 
+TEST_F(ClientSocketTest, SendsACompactTextWithoutAnEndMark) {
+    request = Json::Value(Json::objectValue);
+    request["b"].append(1);
+    request["a"] = true;
+    const test::SilentServer server;
+    HandlerSocket client({}, test::LOCAL_SOCKET, 1);
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_EQ(server.received(), R"({"a":true,"b":[1]})");
+}
+
 class NoTimeoutTest : public ClientSocketTest, public ::testing::WithParamInterface<unsigned int> {};
 
 TEST_P(NoTimeoutTest, WaitsForEver) {
@@ -144,16 +154,26 @@ TEST_F(ClientSocketTest, ALongerReplyIsCutAndFailsToParse) {
     EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to parse \"" + std::string(2094, 'y') + ", ")));
 }
 
-TEST_F(ClientSocketTest, AServerThatHasGoneDoesNotEndTheClient) {
-    std::optional<test::SilentServer> server;
-    server.emplace();
+TEST_F(ClientSocketTest, AServerThatGoesBeforeTheRequestDoesNotEndTheClient) {
+    std::optional<test::SilentServer> server(std::in_place);
+    const test::ConnectHook leave([&server] { server.reset(); });
     HandlerSocket client({}, test::LOCAL_SOCKET, 5);
-    // A server that goes between connect and send cannot be had at will; one whose backlog is dropped resets.
-    std::thread leaving([&server] { server.reset(); });
+    EXPECT_FALSE(client.clientSend(request, reply));
+    EXPECT_TRUE(client.hasError());
+    EXPECT_EQ(reply, "as it was");
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp", "Failed to send content: \"question\"")));
+}
+
+TEST_F(ClientSocketTest, AServerThatGoesBeforeItsReplyIsReported) {
+    const test::SilentServer server;
+    std::thread leaving([&server] { server.dropRequest(); });
+    HandlerSocket client({}, test::LOCAL_SOCKET, 60);
     EXPECT_FALSE(client.clientSend(request, reply));
     leaving.join();
     EXPECT_TRUE(client.hasError());
-    EXPECT_GE(systemLog().size(), 1U);
+    EXPECT_THAT(systemLog(),
+                ElementsAre(test::LogLine("socket.cpp", "Failed to recv , Connection reset by peer")));
 }
 
 }  // namespace

@@ -5,10 +5,12 @@
 
 #include <atomic>
 #include <cerrno>
+#include <utility>
 
 namespace {
 
 std::atomic<int> failure{0};
+std::function<void()> afterConnect;
 
 // The C library's own function. With 64-bit time on 32 bits it has another name.
 template <class Function>
@@ -35,6 +37,17 @@ int socket(int domain, int type, int protocol) noexcept {
     return failure != 0 && isLocalStream ? failWith(failure) : realSocket(domain, type, protocol);
 }
 
+int connect(int fd, const sockaddr* address, socklen_t size) {
+    static auto* const realConnect = real<int(int, const sockaddr*, socklen_t)>("connect", "connect");
+    const int result = realConnect(fd, address, size);
+    const int error = errno;
+    if (afterConnect) {
+        afterConnect();
+    }
+    errno = error;
+    return result;
+}
+
 int listen(int fd, int backlog) noexcept {
     static auto* const realListen = real<int(int, int)>("listen", "listen");
     return failure != 0 ? failWith(failure) : realListen(fd, backlog);
@@ -54,6 +67,14 @@ FailingSocketCalls::FailingSocketCalls(int error) {
 
 FailingSocketCalls::~FailingSocketCalls() {
     failure = 0;
+}
+
+ConnectHook::ConnectHook(std::function<void()> onConnect) {
+    afterConnect = std::move(onConnect);
+}
+
+ConnectHook::~ConnectHook() {
+    afterConnect = nullptr;
 }
 
 }  // namespace test

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <functional>
+
 namespace test {
 
 // While the object lives, listen, setsockopt and the making of local stream sockets fail with this error
@@ -11,6 +13,16 @@ class FailingSocketCalls {
 
     FailingSocketCalls(const FailingSocketCalls&) = delete;
     FailingSocketCalls& operator=(const FailingSocketCalls&) = delete;
+};
+
+// While the object lives, `onConnect` is called after each connection of a socket, before connect returns.
+class ConnectHook {
+ public:
+    explicit ConnectHook(std::function<void()> onConnect);
+    ~ConnectHook();
+
+    ConnectHook(const ConnectHook&) = delete;
+    ConnectHook& operator=(const ConnectHook&) = delete;
 };
 
 }  // namespace test

@@ -3,7 +3,6 @@
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <sys/un.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
@@ -14,8 +13,8 @@ namespace test {
 
 namespace {
 
-int newSocket() {
-    return socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+int newSocket(int flags = 0) {
+    return socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | flags, 0);
 }
 
 sockaddr_un addressOf(const std::string& path) {
@@ -48,34 +47,31 @@ ServingThread::~ServingThread() {
     _thread.join();
 }
 
-RawClient::RawClient(const std::string& path) : _fd(newSocket()) {
+RawClient::RawClient(const std::string& path, int flags) : _fd(newSocket(flags), "socket") {
     const sockaddr_un address = addressOf(path);
-    check(connect(_fd, reinterpret_cast<const sockaddr*>(&address), sizeof address), "connect");
-}
-
-RawClient::~RawClient() {
-    close();
+    check(connect(_fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), "connect");
 }
 
 bool RawClient::send(const std::string& bytes) const {
-    return ::send(_fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
+    return ::send(_fd.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
 }
 
 std::string RawClient::receiveAll() const {
     std::string all;
     char buffer[8192];
     ssize_t count = 0;
-    while ((count = recv(_fd, buffer, sizeof buffer, 0)) > 0) {
+    while ((count = recv(_fd.get(), buffer, sizeof buffer, 0)) > 0) {
         all.append(buffer, static_cast<std::size_t>(count));
     }
     return all;
 }
 
+void RawClient::finish() const {
+    check(shutdown(_fd.get(), SHUT_WR), "shutdown");
+}
+
 void RawClient::close() {
-    if (_fd >= 0) {
-        ::close(_fd);
-        _fd = -1;
-    }
+    _fd.reset();
 }
 
 std::string exchange(const std::string& request) {
@@ -84,14 +80,24 @@ std::string exchange(const std::string& request) {
     return client.receiveAll();
 }
 
-SilentServer::SilentServer(const std::string& path) : _fd(newSocket()) {
+SilentServer::SilentServer(const std::string& path) : _fd(newSocket(), "socket") {
     const sockaddr_un address = addressOf(path);
-    check(bind(_fd, reinterpret_cast<const sockaddr*>(&address), sizeof address), "bind");
-    check(listen(_fd, 10), "listen");
+    check(bind(_fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), "bind");
+    check(listen(_fd.get(), 10), "listen");
 }
 
-SilentServer::~SilentServer() {
-    close(_fd);
+std::string SilentServer::received() const {
+    const Descriptor client(accept4(_fd.get(), nullptr, nullptr, SOCK_CLOEXEC), "accept");
+    std::string bytes(8192, '\0');
+    const ssize_t count = recv(client.get(), bytes.data(), bytes.size(), 0);
+    bytes.resize(count > 0 ? static_cast<std::size_t>(count) : 0);
+    return bytes;
+}
+
+void SilentServer::dropRequest() const {
+    const Descriptor client(accept4(_fd.get(), nullptr, nullptr, SOCK_CLOEXEC), "accept");
+    char first = 0;
+    recv(client.get(), &first, 1, MSG_PEEK);
 }
 
 Interruptions::Interruptions() {

@@ -9,6 +9,7 @@
 #include <thread>
 
 #include "socket.h"
+#include "support/descriptor.h"
 
 // Both ends of the control socket as tests see them.
 namespace test {
@@ -49,11 +50,8 @@ class ServingThread {
 // The bare client's end.
 class RawClient {
  public:
-    explicit RawClient(const std::string& path = LOCAL_SOCKET);
-    ~RawClient();
-
-    RawClient(const RawClient&) = delete;
-    RawClient& operator=(const RawClient&) = delete;
+    // `flags` are added to the type of the socket. Throws std::system_error when it cannot connect.
+    explicit RawClient(const std::string& path = LOCAL_SOCKET, int flags = 0);
 
     // Sends; false when the server has gone.
     bool send(const std::string& bytes) const;
@@ -61,10 +59,13 @@ class RawClient {
     // What comes until the server closes the connection.
     std::string receiveAll() const;
 
+    // Ends its sending; the server reads an end of file.
+    void finish() const;
+
     void close();
 
  private:
-    int _fd;
+    Descriptor _fd;
 };
 
 // Sends one request and returns the whole answer.
@@ -74,13 +75,15 @@ std::string exchange(const std::string& request);
 class SilentServer {
  public:
     explicit SilentServer(const std::string& path = LOCAL_SOCKET);
-    ~SilentServer();
 
-    SilentServer(const SilentServer&) = delete;
-    SilentServer& operator=(const SilentServer&) = delete;
+    // What the next client has sent, up to now or, when it has left, in all.
+    std::string received() const;
+
+    // Waits for a client's request and closes the connection without having read it.
+    void dropRequest() const;
 
  private:
-    int _fd;
+    Descriptor _fd;
 };
 
 // While the object lives, SIGALRM comes every few milliseconds and interrupts what waits.

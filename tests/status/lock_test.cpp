@@ -106,8 +106,35 @@ TEST_F(StatusLockTest, LifeIsRecordedWithoutTheLock) {
     EXPECT_TRUE(status.isRemoteAlive());
 }
 
+TEST_F(StatusLockTest, DeathIsRecordedWithoutTheLock) {
+    status.setRemoteAlive(true);
+    expectToGoAhead(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.setRemoteAlive(false)); });
+    EXPECT_FALSE(status.isRemoteAlive());
+}
+
+TEST_F(StatusLockTest, TheEndOfARebootIsRecordedAfterAWaitForEachBit) {
+    status.addRemoteNodeState(NodeRebooting);
+    const Holder holder(status.remoteNodeStateMutex);
+    const test::Stopwatch stopwatch;
+    status.setRemoteAlive(true);
+    EXPECT_GE(stopwatch.elapsed(), 10s);
+    EXPECT_LT(stopwatch.elapsed(), 15s);
+    EXPECT_EQ(status.getRemoteNodeState(), NodeAlive);
+}
+
 TEST_F(StatusLockTest, TheJsonFormComesAfterTheWait) {
     expectToGoAhead(status.errHandlingDiskMutex, [&] { EXPECT_EQ(status.toJson().size(), 10U); });
+}
+
+TEST_F(StatusLockTest, TheJsonFormWaitsForOneListAfterTheOther) {
+    const Holder own(status.errHandlingDiskMutex);
+    const Holder remote(status.errHandlingDiskRemoteMutex);
+    const test::Stopwatch stopwatch;
+    const Json::Value json = status.toJson();
+    EXPECT_GE(stopwatch.elapsed(), 10s);
+    EXPECT_LT(stopwatch.elapsed(), 15s);
+    EXPECT_EQ(json["diskErrorHandlingDisk"], disks("sda"));
+    EXPECT_EQ(json["diskErrorHandlingDiskRemote"], disks("sdb"));
 }
 
 TEST_F(StatusLockTest, ReadingTheLifeCycleDoesNotLock) {

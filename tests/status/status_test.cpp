@@ -154,7 +154,7 @@ TEST_F(StatusTest, NewDisksReplaceTheOldOnes) {
 }
 
 TEST_F(StatusTest, NoDisksAreAnEmptyArray) {
-    for (const char* nothing : {"null", "[]", "{}"}) {
+    for (const char* nothing : {"null", "[]", "{}", "\"sda\"", "7", "true"}) {
         status.setErrHandlingDisk(parsed(R"(["sda"])"));
         status.setErrHandlingDiskRemote(parsed(R"(["sda"])"));
         EXPECT_TRUE(status.setErrHandlingDisk(parsed(nothing)));
@@ -167,6 +167,16 @@ TEST_F(StatusTest, NoDisksAreAnEmptyArray) {
 TEST_F(StatusTest, ElementsThatCannotBeReadAsStringsArePassedOver) {
     EXPECT_TRUE(status.setErrHandlingDisk(parsed(R"(["sda",["sdb"],{"x":"sdc"},7,"sdd"])")));
     EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["7","sda","sdd"])"));
+}
+
+TEST_F(StatusTest, NumbersFlagsAndNullAreReadAsStrings) {
+    status.setErrHandlingDisk(parsed(R"([7,true,null,-1])"));
+    EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["","-1","7","true"])"));
+}
+
+TEST_F(StatusTest, OfAnObjectTheValuesCount) {
+    status.setErrHandlingDiskRemote(parsed(R"({"a":"sdb","b":"sda","c":"sdb"})"));
+    EXPECT_EQ(status.getErrHandlingDiskRemote(), parsed(R"(["sda","sdb"])"));
 }
 
 // ---- Threads ----
