@@ -1,0 +1,55 @@
+#include "service_notifier.h"
+
+#ifdef TERNHA_HAS_SYSTEMD
+#include <systemd/sd-daemon.h>
+
+#include <cstdint>
+#endif
+
+namespace ternhad {
+
+#ifdef TERNHA_HAS_SYSTEMD
+
+namespace {
+
+// The manager's address stays in the environment: each state is told anew. A message that cannot be sent is
+// lost, and the manager acts on its own time limits.
+constexpr int KEEP_ENVIRONMENT = 0;
+
+}  // namespace
+
+void notifyReady() {
+    sd_notify(KEEP_ENVIRONMENT, "READY=1");
+}
+
+void notifyStopping() {
+    sd_notify(KEEP_ENVIRONMENT, "STOPPING=1");
+}
+
+std::optional<std::chrono::microseconds> watchdogInterval() {
+    std::uint64_t interval = 0;
+    if (sd_watchdog_enabled(KEEP_ENVIRONMENT, &interval) <= 0) {
+        return std::nullopt;
+    }
+    return std::chrono::microseconds(interval);
+}
+
+void notifyAlive() {
+    sd_notify(KEEP_ENVIRONMENT, "WATCHDOG=1");
+}
+
+#else
+
+void notifyReady() {}
+
+void notifyStopping() {}
+
+std::optional<std::chrono::microseconds> watchdogInterval() {
+    return std::nullopt;
+}
+
+void notifyAlive() {}
+
+#endif
+
+}  // namespace ternhad

@@ -1,0 +1,25 @@
+#!/usr/bin/env bash
+# Checks the units in the packages of DIRECTORY for mistakes and for what an attacker could reach from the
+# services: check_units.sh DIRECTORY, in a sandbox.
+set -euo pipefail
+[ -e /.ternha-sandbox ] || { echo "check_units.sh: not in a sandbox" >&2; exit 99; }
+
+root=/tmp/root
+for package in "$1"/*_amd64.deb; do
+    dpkg -x "$package" "$root"
+done
+
+# Only what the units name of the rest of the system has to be there.
+mkdir -p "$root/bin" "$root/lib/systemd/system"
+cp -L /bin/kill "$root/bin/"
+cp /lib/systemd/system/{basic,sysinit,network,network-pre,local-fs,local-fs-pre,shutdown,umount,paths,sockets,slices,timers,swap}.target \
+    "$root/lib/systemd/system/"
+complaints=$(systemd-analyze verify --root="$root" --man=no --recursive-errors=no \
+    "$root"/lib/systemd/system/ternha*.service 2>&1) || { echo "$complaints" >&2; exit 1; }
+[ -z "$complaints" ] || { echo "$complaints" >&2; exit 1; }
+
+# In tenths; the exit code tells when one is above.
+for unit in ternhad ternha-firewall; do
+    systemd-analyze security --offline=true --threshold=40 --no-pager "$root/lib/systemd/system/$unit.service" |
+        tail -n 1
+done

@@ -1,0 +1,84 @@
+#!/usr/bin/env bash
+# Installs the packages of DIRECTORY on a system like this one, runs the daemon from them, and removes them:
+# install_and_remove.sh DIRECTORY, in a sandbox that has /var/lib/dpkg of the machine.
+set -euo pipefail
+[ -e /.ternha-sandbox ] || { echo "install_and_remove.sh: not in a sandbox" >&2; exit 99; }
+packages=$1
+
+fail() { echo "FAILED: $1" >&2; exit 1; }
+expect() { [ "$2" = "$3" ] || fail "$1: expected \"$3\", got \"$2\""; }
+
+eventually() { # LIMIT_IN_SECONDS COMMAND...
+    local end=$((SECONDS + $1))
+    shift
+    until "$@" >/dev/null 2>&1; do
+        [ "$SECONDS" -lt "$end" ] || return 1
+        read -r -t 0.05 <> <(:) || true
+    done
+}
+
+# The machine's programs are read-only here: changes go into a layer above them.
+layers=/run/layers
+for directory in /usr/*; do
+    if [ ! -d "$directory" ] || [ -L "$directory" ]; then
+        continue
+    fi
+    layer=$layers/${directory#/usr/}
+    mkdir -p "$layer/upper" "$layer/work"
+    mount -t overlay overlay -o "lowerdir=$directory,upperdir=$layer/upper,workdir=$layer/work" "$directory"
+done
+
+# All that is not the machine's own. Directories that dpkg has only opened are in the layers too.
+changes() {
+    {
+        find /etc /var /tmp /run \( -path /var/lib/dpkg -o -path "$layers" -o -path /run/dpkg \) -prune -o -print
+        find "$layers" -path '*/upper/*' ! -type d
+    } | sort
+}
+
+# Dependencies are checked against what the machine has; its triggers would only take time.
+cp -r /var/lib/dpkg /run/dpkg
+rm -f /run/dpkg/lock*
+mkdir -p /var/lib/systemd
+in_dpkg() { dpkg --admindir=/run/dpkg --log=/run/dpkg/log --no-triggers "$@" >/run/dpkg/output 2>&1 ||
+    { cat /run/dpkg/output >&2; fail "dpkg $1"; }; }
+
+before=$(changes)
+in_dpkg --install "$packages"/*_amd64.deb
+expect "ternhad --version" "$(ternhad --version)" "ternhad 6.2"
+# It insists on the kernel's own /proc, which here is elsewhere.
+unshare --mount sh -c 'mount --rbind /.kernel/proc /proc && exec systemd-tmpfiles --create ternha.conf'
+expect "mode of /var/log/ha" "$(stat -c '%a %U' /var/log/ha)" "700 root"
+expect "mode of /tmp/ha" "$(stat -c '%a %U' /tmp/ha)" "700 root"
+for file in /lib/systemd/system/ternhad.service /usr/lib/tmpfiles.d/ternha.conf /usr/sbin/ternha-firewall \
+    /usr/share/man/man5/ternhad.conf.5.gz /usr/share/man/man8/ternha{d,ctl,-firewall}.8.gz; do
+    [ -f "$file" ] || fail "$file is not installed"
+done
+expect "completion" "$(bash -c '. /usr/share/bash-completion/completions/ternhactl; complete -p ternhactl')" \
+    "complete -F _ternhactl ternhactl"
+
+# As it comes it starts nothing: the addresses are the administrator's.
+exit_code=0
+ternhad --config /etc/ternha/ternhad.conf >/run/dpkg/output 2>&1 || exit_code=$?
+expect "exit code without addresses" "$exit_code" 2
+
+sed -i 's/^#local-ip.*/local-ip = 127.0.0.1/; s/^#remote-ip.*/remote-ip = 127.0.0.2/; s/^#interface.*/interface = lo/' \
+    /etc/ternha/ternhad.conf
+ternha-firewall | grep -q 'iifname "lo" ip saddr 127.0.0.2 ip daddr 127.0.0.1 ' || fail "ternha-firewall"
+ternhad --config /etc/ternha/ternhad.conf &
+daemon=$!
+eventually 20 ternhactl status || fail "the daemon does not answer"
+expect "peer that nobody plays" "$(ternhactl status --json | grep -c '"isRemoteAlive":false')" 1
+kill -TERM "$daemon"
+wait "$daemon" || fail "the daemon ended with $?"
+grep -q 'Started on 127.0.0.1, peer 127.0.0.2$' /var/log/ha/ha.daemon.log || fail "no log"
+
+in_dpkg --install "$packages"/*_amd64.deb
+grep -q '^local-ip = 127.0.0.1$' /etc/ternha/ternhad.conf || fail "the configuration did not survive an upgrade"
+
+in_dpkg --remove ternhad libternhadaemon-dev libternhadaemon6 libterncore6
+[ -f /etc/ternha/ternhad.conf ] || fail "the configuration did not survive a removal"
+[ -d /var/log/ha ] || fail "the logs did not survive a removal"
+in_dpkg --purge ternhad libternhadaemon-dev libternhadaemon6 libterncore6
+rmdir /run/ternha # by hand what the service manager does
+diff <(echo "$before") <(changes) || fail "something is left behind"
