@@ -8,11 +8,14 @@
 #include <filesystem>
 #include <fstream>
 #include <iostream>
+#include <optional>
 #include <string>
 
 #include "checker.h"
 #include "env_check.h"
 #include "ha_log.h"
+#include "liveness.h"
+#include "service_notifier.h"
 
 namespace ternhad {
 
@@ -25,6 +28,10 @@ namespace {
 constexpr unsigned int CONTROL_TIMEOUT = 0;  // the server side of the socket does not use it
 constexpr auto STOP_LIMIT = std::chrono::milliseconds(1500);
 constexpr auto STOP_STEP = std::chrono::milliseconds(20);
+
+// A question that took as long as this was not answered, whatever its result. The library waits for 3
+// seconds.
+constexpr auto ANSWER_LIMIT = std::chrono::milliseconds(2900);
 
 void ignoreSignal(int) {}
 
@@ -44,16 +51,29 @@ sigset_t handledSignals() {
     return signals;
 }
 
-// Ends the programs that the daemon's threads wait for: ping alone may take 10 seconds.
-void endChildren() {
+// Interrupts what the other threads wait in, and ends the programs that they wait for: ping alone may take 10
+// seconds.
+void interruptThreads() {
     std::error_code error;
     for (const auto& task : std::filesystem::directory_iterator("/proc/self/task", error)) {
+        const pid_t thread = std::stoi(task.path().filename());
+        if (thread != gettid()) {
+            tgkill(getpid(), thread, SIGUSR1);
+        }
         std::ifstream children(task.path() / "children");
         pid_t child = 0;
         while (children >> child) {
             kill(child, SIGTERM);
         }
     }
+}
+
+// The signal that came, or 0 when none did.
+int waitForSignal(const sigset_t& signals, std::chrono::microseconds limit) {
+    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(limit);
+    const std::chrono::nanoseconds rest = limit - seconds;
+    const timespec time = {static_cast<int>(seconds.count()), static_cast<int>(rest.count())};
+    return std::max(sigtimedwait(&signals, nullptr, &time), 0);
 }
 
 std::string withoutLineEnd(std::string text) {
@@ -68,6 +88,13 @@ void moveToDisk(DaemonLog& log, std::int64_t rotateSize) {
     if (log.size() >= rotateSize) {
         log.rotate();
     }
+}
+
+// When the round after the one planned for `round` begins. Rounds that could not be kept are left out.
+std::chrono::steady_clock::time_point nextRound(std::chrono::steady_clock::time_point round,
+                                                Seconds interval) {
+    using Clock = std::chrono::steady_clock;
+    return std::max(round + std::chrono::duration_cast<Clock::duration>(interval), Clock::now());
 }
 
 // Stores what a check found, and tells whether that is the beginning of something unwise to fail over in.
@@ -95,11 +122,13 @@ int Host::run() {
         return 1;
     }
     HA_LOG("Started on " + _options.localIp + ", peer " + _options.remoteIp);
-    for (const auto body :
-         {&Host::servePeer, &Host::serveControl, &Host::runChecks, &Host::measureLink, &Host::keepLogs}) {
+    for (const auto body : {&Host::servePeer, &Host::serveControl, &Host::watchPeer, &Host::askPeer,
+                            &Host::checkSelf, &Host::measureLink, &Host::keepLogs}) {
         startThread(body);
     }
+    notifyReady();
     waitForStop();
+    notifyStopping();
     HA_LOG("Stopping");
     stopThreads();
     unlink(_options.socket.c_str());
@@ -119,15 +148,36 @@ void Host::startThread(void (Host::*body)()) {
 
 void Host::waitForStop() {
     const sigset_t signals = handledSignals();
+    const std::optional<std::chrono::microseconds> watchdog = watchdogInterval();
     for (;;) {
         int signal = 0;
-        sigwait(&signals, &signal);
-        if (signal != SIGHUP) {
+        if (watchdog) {
+            // A thread may miss a period, because the server's pass takes 30 seconds, but not the whole
+            // interval.
+            signal = waitForSignal(signals, *watchdog / 4);
+        } else {
+            sigwait(&signals, &signal);
+        }
+        if (signal == SIGTERM || signal == SIGINT) {
             break;
         }
-        const std::lock_guard<std::mutex> lock(_mutex);
-        _isRotationRequested = true;
-        _wakeUp.notify_all();
+        if (signal == SIGHUP) {
+            const std::lock_guard<std::mutex> lock(_mutex);
+            _isRotationRequested = true;
+            _wakeUp.notify_all();
+        }
+        if (watchdog) {
+            tellWatchdog();
+        }
+    }
+}
+
+void Host::tellWatchdog() {
+    if (_peerAnswers > 0 && _peerQuestions > 0 && _selfChecks > 0) {
+        _peerAnswers = 0;
+        _peerQuestions = 0;
+        _selfChecks = 0;
+        notifyAlive();
     }
 }
 
@@ -143,8 +193,7 @@ void Host::stopThreads() {
                 unlink(_options.socket.c_str());
                 _exit(_exitCode);
             }
-            endChildren();
-            pthread_kill(worker.thread.native_handle(), SIGUSR1);
+            interruptThreads();
         }
         worker.thread.join();
     }
@@ -173,6 +222,7 @@ void Host::servePeer() {
             stop(1);
             kill(getpid(), SIGTERM);
         }
+        ++_peerAnswers;
     }
 }
 
@@ -182,85 +232,71 @@ void Host::serveControl() {
     }
 }
 
-void Host::runChecks() {
+void Host::watchPeer() {
+    Liveness liveness;
     auto next = Clock::now();
     do {
-        checkLocal();
-        checkPeer();
+        const bool wasAlive = _status.isRemoteAlive();
+        const bool isAlive = liveness.ask(wasAlive, [this] { return isStopping(); });
+        if (isStopping()) {
+            return;
+        }
+        _status.setRemoteAlive(isAlive);
+        ++_peerQuestions;
+        if (isAlive && !wasAlive) {
+            const std::lock_guard<std::mutex> lock(_mutex);
+            _hasPeerAppeared = true;
+            _wakeUp.notify_all();
+        } else if (wasAlive && !isAlive) {
+            _isHostnameKnown = false;
+            requestSnapshot();
+        }
         // A dead peer has cost more than an interval already and is asked again at once.
-        next = std::max(next + std::chrono::duration_cast<Clock::duration>(_options.checkInterval),
-                        Clock::now());
+        next = nextRound(next, _options.checkInterval);
     } while (sleepUntil(next));
 }
 
-void Host::checkLocal() {
-    _status.isDRBDConnect = TERN::HA::Daemon::isDRBDConnect();
-
-    const bool hasResyncBegun = storeFlag(_status.isMDResync, TERN::HA::Daemon::isMDResync());
-
-    Json::Value disks(Json::arrayValue);
-    const bool isHandling = TERN::HA::Daemon::isDiskErrHandling(disks);
-    _status.setErrHandlingDisk(disks);
-    const bool hasHandlingBegun = storeFlag(_status.isDiskErrHandling, isHandling);
-
-    if (hasResyncBegun || hasHandlingBegun) {
-        requestSnapshot();
-    }
-}
-
-void Host::checkPeer() {
-    const bool wasAlive = _status.isRemoteAlive();
-    const bool isAlive = TERN::HA::Daemon::IsRemoteAlive()();
-    if (isStopping()) {
-        return;
-    }
-    _status.setRemoteAlive(isAlive);
-    if (!isAlive) {
-        _isHostnameKnown = false;
-        if (wasAlive) {
-            requestSnapshot();
+void Host::askPeer() {
+    auto next = Clock::now();
+    while (!isStopping()) {
+        if (_status.isRemoteAlive()) {  // a dead one would only be waited for
+            askForDisks();
+            askForResync();
+            askForHostname();
         }
-        return;  // other questions would only delay the next one for life
-    }
-
-    if (!askForDisks() || isStopping()) {
-        return;
-    }
-    askForResync();
-    if (!_isHostnameKnown && !isStopping()) {
-        askForHostname();
+        next = nextRound(next, _options.checkInterval);
+        std::unique_lock<std::mutex> lock(_mutex);
+        _wakeUp.wait_until(lock, next, [this] { return isStopping() || _hasPeerAppeared; });
+        _hasPeerAppeared = false;
     }
 }
 
-bool Host::askForDisks() {
-    const Json::Value unanswered("unanswered");
-    Json::Value disks = unanswered;
+void Host::askForDisks() {
+    const Json::Value unread("unread");
+    Json::Value disks = unread;
+    const auto start = Clock::now();
     const bool isHandling = TERN::HA::Daemon::IsRemoteDiskErrHandling()(disks);
-    if (isStopping()) {
-        return false;
+    if (isStopping() || Clock::now() - start >= ANSWER_LIMIT) {
+        return;
     }
-    bool hasBegun = false;
-    if (disks != unanswered) {
-        _unreadableReports = 0;
+    const bool isRead = disks != unread;
+    if (isRead) {
         _status.setErrHandlingDiskRemote(disks);
-        hasBegun = storeFlag(_status.isRemoteDiskErrHandling, isHandling);
-    } else if (++_unreadableReports > 1) {
-        // Alive in between, so that this is no lost answer: the report was cut because it has more disks than
-        // a datagram holds.
-        hasBegun = storeFlag(_status.isRemoteDiskErrHandling, true);
     }
-    if (hasBegun) {
+    // A report that cannot be read was cut, because it has more disks than a datagram holds.
+    if (storeFlag(_status.isRemoteDiskErrHandling, isHandling || !isRead)) {
         requestSnapshot();
     }
-    return _unreadableReports != 1;
 }
 
 void Host::askForResync() {
+    const auto start = Clock::now();
     const bool isResync = TERN::HA::Daemon::IsRemoteMDResync()();
-    if (isStopping()) {
+    if (isStopping() || Clock::now() - start >= ANSWER_LIMIT) {
         return;
     }
-    // No answer and "no resync" look alike: the end of a resync is believed when it is told twice.
+    // A question that could not be asked and "no resync" look alike: the end is believed when it is told
+    // twice.
     if (storeFlag(_status.isRemoteMDResync, isResync || _wasPeerResync)) {
         requestSnapshot();
     }
@@ -268,11 +304,34 @@ void Host::askForResync() {
 }
 
 void Host::askForHostname() {
+    if (_isHostnameKnown || isStopping()) {
+        return;
+    }
     std::string hostname;
     _isHostnameKnown = TERN::HA::Daemon::GetRemoteHostname()(hostname);
     if (_isHostnameKnown) {
         HA_LOG("Remote hostname is " + withoutLineEnd(hostname));
     }
+}
+
+void Host::checkSelf() {
+    auto next = Clock::now();
+    do {
+        _status.isDRBDConnect = TERN::HA::Daemon::isDRBDConnect();
+
+        const bool hasResyncBegun = storeFlag(_status.isMDResync, TERN::HA::Daemon::isMDResync());
+
+        Json::Value disks(Json::arrayValue);
+        const bool isHandling = TERN::HA::Daemon::isDiskErrHandling(disks);
+        _status.setErrHandlingDisk(disks);
+        const bool hasHandlingBegun = storeFlag(_status.isDiskErrHandling, isHandling);
+
+        if (hasResyncBegun || hasHandlingBegun) {
+            requestSnapshot();
+        }
+        ++_selfChecks;
+        next = nextRound(next, _options.checkInterval);
+    } while (sleepUntil(next));
 }
 
 void Host::measureLink() {
@@ -289,8 +348,7 @@ void Host::measureLink() {
             return;
         }
         _status.heartbeatLatency = latency;
-        next = std::max(next + std::chrono::duration_cast<Clock::duration>(_options.heartbeatInterval),
-                        Clock::now());
+        next = nextRound(next, _options.heartbeatInterval);
     } while (sleepUntil(next));
 }
 

@@ -33,6 +33,7 @@ class Host {
     void startThread(void (Host::*body)());
     void stopThreads();
     void waitForStop();
+    void tellWatchdog();
 
     // True when the daemon is ending: nothing that a check found from now on may be believed, because its
     // waits are cut short.
@@ -42,16 +43,19 @@ class Host {
     // Waits until `time` or the daemon's end. True while the daemon goes on.
     bool sleepUntil(Clock::time_point time);
 
+    // The threads. Each waits for nothing that another one is for: a program, a disk or a peer that is slow
+    // to answer must not delay the question for life.
     void servePeer();
     void serveControl();
-    void runChecks();
-    void checkLocal();
-    void checkPeer();
-    bool askForDisks();  // false when the answer may have been lost: life is to be asked about first
-    void askForResync();
-    void askForHostname();
+    void watchPeer();
+    void askPeer();
+    void checkSelf();
     void measureLink();
     void keepLogs();
+
+    void askForDisks();
+    void askForResync();
+    void askForHostname();
 
     // Asks keepLogs for a snapshot.
     void requestSnapshot();
@@ -60,14 +64,19 @@ class Host {
     TERN::HA::Daemon::Status _status;
     TERN::HA::Daemon::MonitordSocket _control;
 
-    bool _isHostnameKnown = false;
+    std::atomic<bool> _isHostnameKnown{false};
     bool _wasPeerResync = false;
-    int _unreadableReports = 0;
+
+    // Passes of the threads that the watchdog watches, counted since it was told last.
+    std::atomic<unsigned int> _peerAnswers{0};
+    std::atomic<unsigned int> _peerQuestions{0};
+    std::atomic<unsigned int> _selfChecks{0};
 
     std::atomic<bool> _isStopping{false};
     std::atomic<int> _exitCode{0};
-    std::mutex _mutex;  // guards the two requests; the condition also announces the end
+    std::mutex _mutex;  // guards the requests; the condition also announces the end
     std::condition_variable _wakeUp;
+    bool _hasPeerAppeared = false;
     bool _isRotationRequested = false;
     bool _isSnapshotRequested = false;
 

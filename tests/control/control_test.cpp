@@ -6,7 +6,7 @@
 #include <optional>
 
 #include "env_check.h"
-#include "socket/case_name.h"
+#include "support/case_name.h"
 #include "socket/local_sockets.h"
 #include "support/json.h"
 #include "support/sandbox.h"

@@ -1,41 +1,21 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
-#include <array>
 #include <cstdlib>
-#include <cstring>
 
+#include "service/manager.h"
 #include "service_notifier.h"
-#include "support/descriptor.h"
 
 namespace {
 
 using namespace std::chrono_literals;
 
-constexpr char ADDRESS[] = "/tmp/notify.sock";
-
 class ServiceNotifierTest : public ::testing::Test {
  protected:
-    ServiceNotifierTest() {
-        sockaddr_un address = {};
-        address.sun_family = AF_UNIX;
-        std::strcpy(address.sun_path, ADDRESS);
-        EXPECT_EQ(bind(manager_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
-        setenv("NOTIFY_SOCKET", ADDRESS, 1);
-    }
+    std::string told() { return manager.told(); }
 
-    // What the manager has been told since the last call, and nothing when it has not.
-    std::string told() {
-        std::array<char, 256> buffer = {};
-        const ssize_t size = recv(manager_.get(), buffer.data(), buffer.size(), MSG_DONTWAIT);
-        return size > 0 ? std::string(buffer.data(), static_cast<std::size_t>(size)) : std::string();
-    }
-
- private:
-    test::Descriptor manager_{socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0), "cannot make a socket"};
+    test::ServiceManager manager;
 };
 
 TEST_F(ServiceNotifierTest, TellsEachState) {

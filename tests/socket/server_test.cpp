@@ -14,7 +14,7 @@
 #include <thread>
 #include <vector>
 
-#include "socket/case_name.h"
+#include "support/case_name.h"
 #include "socket/failing_calls.h"
 #include "socket/local_sockets.h"
 #include "socket/socket_test.h"

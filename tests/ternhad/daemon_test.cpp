@@ -11,6 +11,7 @@
 #include <unistd.h>
 
 #include <filesystem>
+#include <functional>
 #include <thread>
 
 #include "support/sandbox.h"
@@ -291,26 +292,94 @@ TEST_F(DaemonTest, RecordsSnapshotsAtTheirInterval) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, TakesAReportThatCannotBeReadTwiceForTrouble) {
+// A peer that answers, from now on, what `answer` says; nothing when that is empty.
+void play(test::UdpSocket& peer, const std::function<std::string(const std::string&)>& answer,
+          const std::function<bool()>& isOver) {
+    EXPECT_TRUE(test::eventually(30s, [&] {
+        if (const auto question = peer.receive(10ms)) {
+            const std::string text = answer(question->bytes);
+            if (!text.empty()) {
+                peer.send(text, question->address, question->port);
+            }
+        }
+        return isOver();
+    }));
+}
+
+TEST_F(DaemonTest, TakesAReportThatCannotBeReadForTrouble) {
     test::UdpSocket peer("127.0.0.2", 7499);
     auto daemon = start();
-    int reports = 0;
-    EXPECT_TRUE(test::eventually(20s, [&] {
-        if (const auto question = peer.receive(10ms)) {
-            std::string answer = "alive";
-            if (question->bytes == "is_disk_err_handling") {
-                ++reports;
-                answer =
-                    R"({"errHandlingDisk":["sda","sdb","sdc"],"isDiskErrHandling":true)";  // as it is cut
-            } else if (question->bytes == "is_md_resync") {
-                answer = "resync";
-            }
-            peer.send(answer, question->address, question->port);
-        }
+    play(
+        peer,
+        [](const std::string& question) {
+            return question == "is_disk_err_handling"
+                       ? R"({"errHandlingDisk":["sda","sdb","sdc"],"isDiskErrHandling":true)"  // as it is cut
+                       : "alive";
+        },
+        [] { return test::statusAt()["isRemoteDiskErrHandling"].asBool(); });
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, ALostAnswerIsNoDeath) {
+    test::UdpSocket peer("127.0.0.2", 7499);
+    auto daemon = start();
+    int questions = 0;
+    play(
+        peer,
+        [&](const std::string& question) {
+            // Once alive, the peer answers one question of eight.
+            return question == "is_alive" && questions++ % 8 != 0 ? "" : "alive";
+        },
+        [&] { return questions > 24; });
+    EXPECT_THAT(test::wholeLog(), HasSubstr("changed to alive"));
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, APeerThatAnswersNothingAnyMoreIsDead) {
+    test::UdpSocket peer("127.0.0.2", 7499);
+    auto daemon = start();
+    play(
+        peer, [](const std::string&) { return "alive"; },
+        [] { return test::statusAt()["isRemoteAlive"].asBool(); });
+    int questions = 0;
+    play(
+        peer,
+        [&questions](const std::string& question) {
+            questions += question == "is_alive" ? 1 : 0;
+            return "";
+        },
+        [] { return !test::statusAt()["isRemoteAlive"].asBool(); });
+    EXPECT_GE(questions, 10);
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, WhatIsNotAnsweredLeavesTheKnownState) {
+    test::UdpSocket peer("127.0.0.2", 7499);
+    auto daemon = start();
+    const std::string report = R"({"errHandlingDisk":["sda"],"isDiskErrHandling":true})";
+    const auto isTroubled = [] {
         const Json::Value status = test::statusAt();
-        return status["isRemoteDiskErrHandling"].asBool() && status["isRemoteMDResync"].asBool();
-    }));
-    EXPECT_GE(reports, 2);
+        return status["isRemoteDiskErrHandling"].asBool() && status["isRemoteMDResync"].asBool() &&
+               status["diskErrorHandlingDiskRemote"][0] == "sda";
+    };
+    play(
+        peer,
+        [&](const std::string& question) {
+            return question == "is_disk_err_handling" ? report
+                   : question == "is_md_resync"       ? "resync"
+                                                      : "alive";
+        },
+        isTroubled);
+    int resyncQuestions = 0;
+    play(
+        peer,
+        [&](const std::string& question) {
+            resyncQuestions += question == "is_md_resync" ? 1 : 0;
+            return question == "is_alive" ? "alive" : "";
+        },
+        [&] { return resyncQuestions >= 4; });
+    EXPECT_TRUE(isTroubled()) << test::statusAt();
     stop(daemon);
 }
 

@@ -1,0 +1,70 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include "service/manager.h"
+#include "support/udp.h"
+#include "ternhad/daemon.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+
+class WatchedDaemonTest : public ::testing::Test {
+ protected:
+    // Starts the daemon, which is to show its progress once in `interval`.
+    test::Process start(std::chrono::microseconds interval) {
+        setenv("WATCHDOG_USEC", std::to_string(interval.count()).c_str(), 1);
+        unsetenv("WATCHDOG_PID");
+        return test::Process(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
+    }
+
+    bool hears(const std::string& state, std::chrono::milliseconds limit = 20s) {
+        return test::eventually(limit, [&] { return manager.told() == state; });
+    }
+
+    test::ServiceManager manager;
+};
+
+TEST_F(WatchedDaemonTest, TellsItsManagerThatItIsReadyAndThatItStops) {
+    test::Process daemon = start(1h);
+    EXPECT_TRUE(hears("READY=1")) << daemon.error();
+    daemon.signal(SIGTERM);
+    EXPECT_TRUE(hears("STOPPING=1"));
+    EXPECT_TRUE(daemon.waitFor(10s).has_value());
+    EXPECT_EQ(manager.told(), "");
+}
+
+TEST_F(WatchedDaemonTest, ShowsItsProgressAgainAndAgain) {
+    test::Process daemon = start(4s);
+    ASSERT_TRUE(hears("READY=1")) << daemon.error();
+    // The pass that serves the peer ends with a question, or after 30 seconds.
+    test::UdpSocket peer("127.0.0.2", 40000);
+    for (int i = 0; i < 2; ++i) {
+        EXPECT_TRUE(test::eventually(20s, [&] {
+            peer.send("is_alive", "127.0.0.1", 7499);
+            return manager.told() == "WATCHDOG=1";
+        }));
+    }
+    daemon.signal(SIGTERM);
+    EXPECT_TRUE(daemon.waitFor(10s).has_value());
+}
+
+TEST_F(WatchedDaemonTest, IsSilentWhileAThreadHangs) {
+    test::writeFile("/proc/drbd", "");
+    test::removeTree("/proc/drbd");
+    ASSERT_EQ(mkfifo("/proc/drbd", 0600), 0);  // nobody writes: opening it waits
+    test::Process daemon = start(2s);
+    ASSERT_TRUE(hears("READY=1")) << daemon.error();
+    test::UdpSocket peer("127.0.0.2", 40000);
+    const test::Stopwatch stopwatch;
+    EXPECT_FALSE(test::eventually(5s, [&] {
+        peer.send("is_alive", "127.0.0.1", 7499);
+        return manager.told() == "WATCHDOG=1";
+    }));
+    EXPECT_GE(stopwatch.elapsed(), 5s);
+    daemon.signal(SIGTERM);
+    EXPECT_TRUE(daemon.waitFor(10s).has_value());
+}
+
+}  // namespace
