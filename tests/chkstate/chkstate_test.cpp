@@ -4,7 +4,9 @@
 #include <fcntl.h>
 #include <pthread.h>
 #include <signal.h>
+#include <sys/syscall.h>
 #include <syslog.h>
+#include <unistd.h>
 
 #include <atomic>
 #include <cerrno>
@@ -54,10 +56,18 @@ class Open final : public Transport {
 using OpenServer = Open<HASocketCommServer>;
 using OpenClient = Open<HASocketCommClient>;
 
-timeval receiveTimeout(int descriptor) {
-    timeval timeout = {-1, -1};
+// Read by the number that every kernel knows, with the types of that number: user-mode emulators of 32-bit
+// machines do not know the option for 64-bit time.
+struct KernelTime {
+    long tv_sec;
+    long tv_usec;
+};
+
+KernelTime receiveTimeout(int descriptor) {
+    constexpr int RECEIVE_TIMEOUT = 20;
+    KernelTime timeout = {-1, -1};
     socklen_t size = sizeof timeout;
-    EXPECT_EQ(getsockopt(descriptor, SOL_SOCKET, SO_RCVTIMEO, &timeout, &size), 0);
+    EXPECT_EQ(syscall(SYS_getsockopt, descriptor, SOL_SOCKET, RECEIVE_TIMEOUT, &timeout, &size), 0);
     return timeout;
 }
 

@@ -132,21 +132,6 @@ TEST_F(DaemonLogTest, ALineIsDroppedWhileADirectoryIsInTheWay) {
     EXPECT_THAT(test::messages(test::readFile(BUFFER)), ElementsAre("kept"));
 }
 
-TEST_F(DaemonLogTest, ALineCostsOneOpenOneWriteAndOneClose) {
-    const auto probe = test::run({"strace", "-f", "-E", "ASAN_OPTIONS=detect_leaks=0", "-o", "/tmp/trace",
-                                  "-P", "/tmp/ha/probe.log", LOG_PROBE, "3"});
-    ASSERT_EQ(probe.exitCode, 0) << probe.error;
-    std::vector<std::string> calls;
-    for (const std::string& line : test::lines(test::readFile("/tmp/trace"))) {
-        const std::size_t call = line.find_first_not_of("0123456789 ");
-        if (line.find('(') != std::string::npos) {
-            calls.push_back(line.substr(call, line.find('(') - call));
-        }
-    }
-    EXPECT_THAT(calls, ElementsAre("openat", "write", "close", "openat", "write", "close", "openat", "write",
-                                   "close"));
-}
-
 // ---- Objects ----
 
 TEST_F(DaemonLogTest, EachSourceFileHasItsOwnObjectsForTheSameFiles) {
@@ -327,17 +312,6 @@ TEST_F(DaemonLogTest, LinesOfAnyLengthAreMovedWhole) {
     test::writeFile(BUFFER, text);
     log.writeLogToDisk();
     EXPECT_EQ(test::readFile(LOG), text);
-}
-
-TEST_F(DaemonLogTest, EachLineIsAWriteOfItsOwn) {
-    test::writeFile("/tmp/ha/probe.log", "one\ntwo\nthree");
-    // The reboot of a machine must find whole lines: see how the lines reach the file.
-    const auto probe = test::run({"strace", "-f", "-E", "ASAN_OPTIONS=detect_leaks=0", "-o", "/tmp/trace",
-                                  "-P", "/var/log/ha/probe.log", "-e", "trace=write", LOG_PROBE, "move"});
-    ASSERT_EQ(probe.exitCode, 0) << probe.error;
-    EXPECT_THAT(test::lines(test::readFile("/tmp/trace")),
-                ElementsAre(::testing::HasSubstr("\"one\\n\", 4"), ::testing::HasSubstr("\"two\\n\", 4"),
-                            ::testing::HasSubstr("\"three\\n\", 6"), ::testing::HasSubstr("exited")));
 }
 
 TEST_F(DaemonLogTest, NoLineOfAnotherThreadIsTornByAMove) {

@@ -115,27 +115,6 @@ TEST_F(RotationTest, AnUncompressedArchiveWithACompressedNamesakeWaitsForTheNext
     EXPECT_EQ(uncompressed(archive(7) + ".xz"), "compressed");
 }
 
-TEST_F(RotationTest, XzIsRunWithoutOptionsOnEachFileThatIsThereTheLogFirst) {
-    const std::string probeLog = "/var/log/ha/probe.log";
-    for (const char* suffix : {".39", ".10", ".0", ""}) {
-        test::writeFile(probeLog + suffix, "content");
-    }
-    const auto probe = test::run({"strace", "-f", "-E", "ASAN_OPTIONS=detect_leaks=0", "-o", "/tmp/trace",
-                                  "-e", "trace=execve", LOG_PROBE, "rotate"});
-    ASSERT_EQ(probe.exitCode, 0) << probe.error;
-    std::vector<std::string> calls;
-    for (const std::string& line : test::lines(test::readFile("/tmp/trace"))) {
-        const std::size_t call = line.find("execve(\"/bin/xz\", ");
-        if (call != std::string::npos) {
-            calls.push_back(line.substr(call, line.find(']', call) + 1 - call));
-        }
-    }
-    EXPECT_THAT(calls, ElementsAre(R"(execve("/bin/xz", ["/bin/xz", "/var/log/ha/probe.log"])",
-                                   R"(execve("/bin/xz", ["/bin/xz", "/var/log/ha/probe.log.0"])",
-                                   R"(execve("/bin/xz", ["/bin/xz", "/var/log/ha/probe.log.10"])",
-                                   R"(execve("/bin/xz", ["/bin/xz", "/var/log/ha/probe.log.39"])"));
-}
-
 TEST_F(RotationTest, WithoutXzNothingIsLost) {
     test::writeFile(LOG, "lines\n");
     test::hideProgram("/bin/xz");

@@ -189,49 +189,4 @@ TEST_F(ExchangeTest, ManyThreadsAskAtOnce) {
     EXPECT_THAT(peer.questions(), AllOf(SizeIs(kThreads * kQuestions), Each("question")));
 }
 
-#ifdef __SANITIZE_ADDRESS__
-// The sanitizer looks at memory through a pipe: pipe2, write and two times close.
-constexpr std::size_t kSanitizersCalls = 4;
-#else
-constexpr std::size_t kSanitizersCalls = 0;
-#endif
-
-// The calls that strace wrote down between the probe's two marks.
-std::vector<std::string> tracedExchange(const std::string& trace) {
-    const std::vector<std::string> all = test::lines(trace);
-    const auto isMark = [](const std::string& line) { return line.rfind("getppid(", 0) == 0; };
-    const auto begin = std::find_if(all.begin(), all.end(), isMark);
-    const auto end = begin == all.end() ? begin : std::find_if(begin + 1, all.end(), isMark);
-    EXPECT_NE(end, all.end()) << trace;
-
-    std::vector<std::string> calls;
-    std::size_t ignored = 1;  // the mark
-    for (auto line = begin; line != end; ++line) {
-        if (kSanitizersCalls != 0 && line->rfind("pipe2(", 0) == 0) {
-            ignored += kSanitizersCalls;
-        }
-        if (ignored > 0) {
-            --ignored;
-        } else {
-            calls.push_back(*line);
-        }
-    }
-    return calls;
-}
-
-TEST_F(ExchangeTest, CostsFiveSystemCalls) {
-    FakePeer peer("alive");
-    const test::CommandResult result =
-        test::run({"strace", "-o", "/tmp/trace", "-e", "trace=!%memory", EXCHANGE_PROBE, kPeerAddress});
-    ASSERT_EQ(result.exitCode, 0) << result.error;
-    EXPECT_THAT(tracedExchange(test::readFile("/tmp/trace")),
-                ElementsAre(StartsWith("socket(AF_INET, SOCK_DGRAM|SOCK_CLOEXEC, IPPROTO_IP) ="),
-                            AllOf(StartsWith("setsockopt("), HasSubstr("SO_RCVTIMEO")),
-                            AllOf(StartsWith("sendto("),
-                                  HasSubstr(", \"is_alive\", 8, 0, {sa_family=AF_INET, sin_port=htons(7499), "
-                                            "sin_addr=inet_addr(\"127.0.0.2\")}, 16) = 8")),
-                            AllOf(StartsWith("recvfrom("), HasSubstr(", \"alive\", 63, 0, NULL, NULL) = 5")),
-                            StartsWith("close(")));
-}
-
 }  // namespace

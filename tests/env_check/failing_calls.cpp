@@ -1,11 +1,11 @@
 #include "env_check/failing_calls.h"
 
 #include <sys/socket.h>
-#include <sys/syscall.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <cerrno>
+
+#include "support/real_function.h"
 
 namespace {
 
@@ -33,17 +33,20 @@ int failWith(int error) {
 // the process.
 
 int socket(int domain, int type, int protocol) noexcept {
+    static auto* const realSocket = test::realFunction<int(int, int, int)>("socket");
     if (socketError != 0 && domain == AF_INET) {
         return failWith(socketError);
     }
-    return static_cast<int>(syscall(SYS_socket, domain, type, protocol));
+    return realSocket(domain, type, protocol);
 }
 
 int setsockopt(int descriptor, int level, int name, const void* value, socklen_t size) noexcept {
+    static auto* const realSetsockopt =
+        test::realFunction<int(int, int, int, const void*, socklen_t)>("setsockopt", "__setsockopt64");
     if (optionError != 0 && isIpv4(descriptor)) {
         return failWith(optionError);
     }
-    return static_cast<int>(syscall(SYS_setsockopt, descriptor, level, name, value, size));
+    return realSetsockopt(descriptor, level, name, value, size);
 }
 
 namespace test {

@@ -145,22 +145,4 @@ TEST_F(RebootTest, WithoutADirectoryForTheLogsTheMachineRestartsAllTheSame) {
     EXPECT_EQ(test::readFile(TRIGGER), "b");
 }
 
-TEST_F(RebootTest, TheOrderIsDaemonLogRecordLogSyncTrigger) {
-    test::writeFile("/tmp/ha/ha.daemon.log", "a\n");
-    test::writeFile("/tmp/ha/ha.daemon.record", "b\n");
-    const auto probe = test::run({"strace", "-f", "-E", "ASAN_OPTIONS=detect_leaks=0", "-o", "/tmp/trace",
-                                  "-e", "trace=openat,write,sync", REBOOT_PROBE});
-    ASSERT_EQ(probe.exitCode, 0) << probe.error;
-    const std::string trace = test::readFile("/tmp/trace");
-    std::size_t at = 0;
-    for (const char* step :
-         {"\"/var/log/ha/ha.daemon.log\"", "\"a\\n\", 2",
-          "\"/tmp/ha/ha.daemon.log\", O_WRONLY|O_CREAT|O_TRUNC", "\"/var/log/ha/ha.daemon.record\"",
-          "\"b\\n\", 2", "\"/tmp/ha/ha.daemon.record\", O_WRONLY|O_CREAT|O_TRUNC", "sync()",
-          "\"/proc/sysrq-trigger\"", "\"b\", 1"}) {
-        at = trace.find(step, at);
-        ASSERT_NE(at, std::string::npos) << step << " in:\n" << trace;
-    }
-}
-
 }  // namespace

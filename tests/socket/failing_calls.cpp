@@ -1,26 +1,17 @@
 #include "socket/failing_calls.h"
 
-#include <dlfcn.h>
 #include <sys/socket.h>
 
 #include <atomic>
 #include <cerrno>
 #include <utility>
 
+#include "support/real_function.h"
+
 namespace {
 
 std::atomic<int> failure{0};
 std::function<void()> afterConnect;
-
-// The C library's own function. With 64-bit time on 32 bits it has another name.
-template <class Function>
-Function* real(const char* name, const char* nameWith64BitTime) {
-    void* symbol = sizeof(void*) == 4 ? dlsym(RTLD_NEXT, nameWith64BitTime) : nullptr;
-    if (symbol == nullptr) {
-        symbol = dlsym(RTLD_NEXT, name);
-    }
-    return reinterpret_cast<Function*>(symbol);
-}
 
 int failWith(int error) {
     errno = error;
@@ -32,13 +23,13 @@ int failWith(int error) {
 // The dynamic linker takes these before those of the C library, for every library of the process.
 
 int socket(int domain, int type, int protocol) noexcept {
-    static auto* const realSocket = real<int(int, int, int)>("socket", "socket");
+    static auto* const realSocket = test::realFunction<int(int, int, int)>("socket");
     const bool isLocalStream = domain == AF_UNIX && (type & ~SOCK_CLOEXEC) == SOCK_STREAM;
     return failure != 0 && isLocalStream ? failWith(failure) : realSocket(domain, type, protocol);
 }
 
 int connect(int fd, const sockaddr* address, socklen_t size) {
-    static auto* const realConnect = real<int(int, const sockaddr*, socklen_t)>("connect", "connect");
+    static auto* const realConnect = test::realFunction<int(int, const sockaddr*, socklen_t)>("connect");
     const int result = realConnect(fd, address, size);
     const int error = errno;
     if (afterConnect) {
@@ -49,13 +40,13 @@ int connect(int fd, const sockaddr* address, socklen_t size) {
 }
 
 int listen(int fd, int backlog) noexcept {
-    static auto* const realListen = real<int(int, int)>("listen", "listen");
+    static auto* const realListen = test::realFunction<int(int, int)>("listen");
     return failure != 0 ? failWith(failure) : realListen(fd, backlog);
 }
 
 int setsockopt(int fd, int level, int name, const void* value, socklen_t size) noexcept {
     static auto* const realSetsockopt =
-        real<int(int, int, int, const void*, socklen_t)>("setsockopt", "__setsockopt64");
+        test::realFunction<int(int, int, int, const void*, socklen_t)>("setsockopt", "__setsockopt64");
     return failure != 0 ? failWith(failure) : realSetsockopt(fd, level, name, value, size);
 }
 
