@@ -6,8 +6,8 @@
 #include <optional>
 
 #include "env_check.h"
-#include "support/case_name.h"
 #include "socket/local_sockets.h"
+#include "support/case_name.h"
 #include "support/json.h"
 #include "support/sandbox.h"
 #include "support/udp.h"
@@ -20,6 +20,12 @@ using namespace TERN::HA::Daemon;
 using test::parsed;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
+
+// Final, because the class has no virtual destructor.
+class Server final : public MonitordSocket {
+ public:
+    using MonitordSocket::MonitordSocket;
+};
 
 class ControlTest : public test::SandboxTest {
  protected:
@@ -48,7 +54,7 @@ class ControlTest : public test::SandboxTest {
     }
 
     Status status;
-    std::optional<MonitordSocket> server;
+    std::optional<Server> server;
 };
 
 TEST_F(ControlTest, GivesTheStatus) {

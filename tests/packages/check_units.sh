@@ -1,11 +1,11 @@
 #!/usr/bin/env bash
 # Checks the units in the packages of DIRECTORY for mistakes and for what an attacker could reach from the
-# services: check_units.sh DIRECTORY, in a sandbox.
+# services: check_units.sh DIRECTORY ARCHITECTURE, in a sandbox.
 set -euo pipefail
 [ -e /.ternha-sandbox ] || { echo "check_units.sh: not in a sandbox" >&2; exit 99; }
 
 root=/tmp/root
-for package in "$1"/*_amd64.deb; do
+for package in "$1"/*_"$2".deb; do
     dpkg -x "$package" "$root"
 done
 

@@ -1,9 +1,9 @@
 #!/usr/bin/env bash
 # Installs the packages of DIRECTORY on a system like this one, runs the daemon from them, and removes them:
-# install_and_remove.sh DIRECTORY, in a sandbox that has /var/lib/dpkg of the machine.
+# install_and_remove.sh DIRECTORY ARCHITECTURE, in a sandbox that has /var/lib/dpkg of the machine.
 set -euo pipefail
 [ -e /.ternha-sandbox ] || { echo "install_and_remove.sh: not in a sandbox" >&2; exit 99; }
-packages=$1
+packages=$1 architecture=$2
 
 fail() { echo "FAILED: $1" >&2; exit 1; }
 expect() { [ "$2" = "$3" ] || fail "$1: expected \"$3\", got \"$2\""; }
@@ -40,11 +40,15 @@ changes() {
 cp -r /var/lib/dpkg /run/dpkg
 rm -f /run/dpkg/lock*
 mkdir -p /var/lib/systemd
-in_dpkg() { dpkg --admindir=/run/dpkg --log=/run/dpkg/log --no-triggers "$@" >/run/dpkg/output 2>&1 ||
+# The programs that packages of another architecture depend on are those of the machine.
+options=()
+[ "$architecture" = "$(dpkg --print-architecture)" ] || options=(--force-depends)
+in_dpkg() { dpkg "${options[@]}" --admindir=/run/dpkg --log=/run/dpkg/log --no-triggers "$@" >/run/dpkg/output 2>&1 ||
     { cat /run/dpkg/output >&2; fail "dpkg $1"; }; }
 
+installed=({ternhad,libternhadaemon-dev,libternhadaemon6,libterncore6}:"$architecture")
 before=$(changes)
-in_dpkg --install "$packages"/*_amd64.deb
+in_dpkg --install "$packages"/*_"$architecture".deb
 expect "ternhad --version" "$(ternhad --version)" "ternhad 6.2"
 # It insists on the kernel's own /proc, which here is elsewhere.
 unshare --mount sh -c 'mount --rbind /.kernel/proc /proc && exec systemd-tmpfiles --create ternha.conf'
@@ -73,12 +77,12 @@ kill -TERM "$daemon"
 wait "$daemon" || fail "the daemon ended with $?"
 grep -q 'Started on 127.0.0.1, peer 127.0.0.2$' /var/log/ha/ha.daemon.log || fail "no log"
 
-in_dpkg --install "$packages"/*_amd64.deb
+in_dpkg --install "$packages"/*_"$architecture".deb
 grep -q '^local-ip = 127.0.0.1$' /etc/ternha/ternhad.conf || fail "the configuration did not survive an upgrade"
 
-in_dpkg --remove ternhad libternhadaemon-dev libternhadaemon6 libterncore6
+in_dpkg --remove "${installed[@]}"
 [ -f /etc/ternha/ternhad.conf ] || fail "the configuration did not survive a removal"
 [ -d /var/log/ha ] || fail "the logs did not survive a removal"
-in_dpkg --purge ternhad libternhadaemon-dev libternhadaemon6 libterncore6
+in_dpkg --purge "${installed[@]}"
 rmdir /run/ternha # by hand what the service manager does
 diff <(echo "$before") <(changes) || fail "something is left behind"

@@ -23,7 +23,7 @@ class SlowRebootTest : public test::SandboxTest {
     }
 
     Status status;
-    const test::Stopwatch stopwatch;
+    test::Stopwatch stopwatch;
 };
 
 TEST_F(SlowRebootTest, APeerThatAnswersAndStaysAliveCountsAsRebootingAfterThirtySeconds) {

@@ -87,7 +87,7 @@ void addUnixSockets(MachineState& state) {
     std::string line;
     while (std::getline(file, line)) {
         const size_t path = line.find_first_of("/@");
-        if (path != std::string::npos && line.find("ternha", path) != std::string::npos) {
+        if (path != std::string::npos && line.find("/ternha/", path) != std::string::npos) {
             state.insert("Unix socket " + line.substr(path));
         }
     }

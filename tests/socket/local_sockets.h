@@ -17,7 +17,7 @@ namespace test {
 constexpr char LOCAL_SOCKET[] = "/tmp/control.sock";
 
 // Answers by a function of the test.
-class HandlerSocket : public TERN::HA::Daemon::DaemonLocalSocket {
+class HandlerSocket final : public TERN::HA::Daemon::DaemonLocalSocket {
  public:
     using Handler = std::function<bool(const Json::Value& request, Json::Value& reply)>;
 

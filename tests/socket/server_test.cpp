@@ -14,10 +14,10 @@
 #include <thread>
 #include <vector>
 
-#include "support/case_name.h"
 #include "socket/failing_calls.h"
 #include "socket/local_sockets.h"
 #include "socket/socket_test.h"
+#include "support/case_name.h"
 #include "support/files.h"
 #include "support/wait.h"
 

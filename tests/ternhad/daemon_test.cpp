@@ -295,7 +295,7 @@ TEST_F(DaemonTest, RecordsSnapshotsAtTheirInterval) {
 // A peer that answers, from now on, what `answer` says; nothing when that is empty.
 void play(test::UdpSocket& peer, const std::function<std::string(const std::string&)>& answer,
           const std::function<bool()>& isOver) {
-    EXPECT_TRUE(test::eventually(30s, [&] {
+    EXPECT_TRUE(test::eventually(60s, [&] {
         if (const auto question = peer.receive(10ms)) {
             const std::string text = answer(question->bytes);
             if (!text.empty()) {
@@ -378,7 +378,7 @@ TEST_F(DaemonTest, WhatIsNotAnsweredLeavesTheKnownState) {
             resyncQuestions += question == "is_md_resync" ? 1 : 0;
             return question == "is_alive" ? "alive" : "";
         },
-        [&] { return resyncQuestions >= 4; });
+        [&] { return resyncQuestions >= 3; });
     EXPECT_TRUE(isTroubled()) << test::statusAt();
     stop(daemon);
 }
