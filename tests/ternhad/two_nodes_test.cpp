@@ -2,50 +2,17 @@
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 
-#include <filesystem>
-#include <optional>
 #include <thread>
 
 #include "support/sandbox.h"
-#include "ternhad/daemon.h"
+#include "ternhad/machine.h"
 
 namespace {
 
 using namespace std::chrono_literals;
+using test::Machine;
 using ::testing::Contains;
 using ::testing::HasSubstr;
-
-// A machine of the cluster and its daemon.
-struct Machine {
-    Machine(const std::string& name, std::string ownAddress, std::string peersAddress)
-        : node(name), address(std::move(ownAddress)), peer(std::move(peersAddress)) {
-        write("/tmp/.ha.hostname.original", name + "\n");
-        write("/proc/drbd", " 0: cs:Connected ro:Primary/Secondary\n");
-        write("/sys/block/md0/md/sync_action", "idle\n");
-        write("/sys/class/ata_port/ata3/error_handling", "0\n");
-        const std::string device = "/sys/devices/pci0/ata3/host2/target2:0:0/2:0:0:0/block/sda";
-        test::makeDirectories(node.path(device));
-        std::filesystem::create_symlink(".." + device.substr(4), node.path("/sys/block/sda"));
-    }
-
-    void write(const std::string& path, const std::string& text) { test::writeFile(node.path(path), text); }
-
-    void start() { daemon.emplace(node.start(test::daemonArguments(address, peer, "eth1"))); }
-
-    std::string log() { return test::wholeLog(node.path("")); }
-    std::string record() { return test::wholeLog(node.path(""), "ha.daemon.record"); }
-    Json::Value status() { return test::statusAt(node.path(test::CONTROL_SOCKET)); }
-
-    bool sees(const char* flag, bool value) {
-        const Json::Value known = status();
-        return known.isObject() && known[flag].asBool() == value;
-    }
-
-    test::Node node;
-    std::string address;
-    std::string peer;
-    std::optional<test::Process> daemon;
-};
 
 class TwoNodesTest : public ::testing::Test {
  protected:

@@ -222,10 +222,11 @@ TEST_F(LauncherTest, ReportsAPeerSocketOfTheMachine) {
 }
 
 TEST_F(LauncherTest, ReportsAControlSocketOfTheMachine) {
+    makeDirectories("/tmp/ternha");
     std::optional<SystemLog> socket;
-    const CommandResult result = runDuring([&] { socket.emplace("/tmp/ternha.sock"); });
+    const CommandResult result = runDuring([&] { socket.emplace("/tmp/ternha/control.sock"); });
     EXPECT_EQ(result.exitCode, kLeftovers);
-    EXPECT_EQ(result.error, "ternha-sandbox: changed outside: + Unix socket /tmp/ternha.sock\n");
+    EXPECT_EQ(result.error, "ternha-sandbox: changed outside: + Unix socket /tmp/ternha/control.sock\n");
 }
 
 TEST_F(LauncherTest, AcceptsAChangeElsewhere) {
