@@ -174,7 +174,7 @@ class Soak {
         const std::string lose = "numgen random mod 100 < " + std::to_string(_options.loss) + " drop; ";
         const auto nft = side.machine.node.run(
             {"nft", "table inet loss { chain input { type filter hook input priority 0; udp sport 7499 " +
-                        lose + "udp dport 7499 " + lose + "} }"});
+                        lose + "udp dport 7499 " + lose + "}; }"});
         require(nft.exitCode == 0, "nft: " + nft.error);
     }
 
