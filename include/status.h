@@ -44,14 +44,13 @@ class Status {
 
     // Read and written directly by the daemon and the checks. Each is indivisible by itself; nothing ties
     // two of them together.
-    std::atomic<bool> isRemoteMDResync;         ///< the peer reported an md resync
-    std::atomic<bool> isRemoteDiskErrHandling;  ///< the peer reported disk error handling
-    std::atomic<bool> isMDResync;               ///< this node has an md resync
-    std::atomic<bool> isDiskErrHandling;        ///< this node has disk error handling
-    std::atomic<bool> isDRBDConnect;            ///< the DRBD link is up; true until the first check has run
-    std::atomic<float>
-        heartbeatPacketFailRate;  ///< failing packets on the link; how they are measured is the host's choice
-    std::atomic<float> heartbeatLatency;  ///< milliseconds
+    std::atomic<bool> isRemoteMDResync;          ///< the peer reported an md resync
+    std::atomic<bool> isRemoteDiskErrHandling;   ///< the peer reported disk error handling
+    std::atomic<bool> isMDResync;                ///< this node has an md resync
+    std::atomic<bool> isDiskErrHandling;         ///< this node has disk error handling
+    std::atomic<bool> isDRBDConnect;             ///< the DRBD link is up; true until the first check has run
+    std::atomic<float> heartbeatPacketFailRate;  ///< the host decides which packets
+    std::atomic<float> heartbeatLatency;         ///< milliseconds
 
     /// Sets the bits of `state`; bits that are set stay so. Always true.
     bool addRemoteNodeState(NodeState state);
