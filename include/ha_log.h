@@ -1,3 +1,6 @@
+/// @file
+/// The two logs of every source file.
+
 #pragma once
 
 #include <string>
@@ -12,22 +15,22 @@
 
 namespace TERN::HA::Daemon {
 
-constexpr char LOG_DIR[] = "/var/log/ha";
-constexpr char DAEMON_LOG_FILE[] = "/ha.daemon.log";
-constexpr char DAEMON_RECORD_FILE[] = "/ha.daemon.record";
+constexpr char LOG_DIR[] = "/var/log/ha";                   ///< where the persistent logs are
+constexpr char DAEMON_LOG_FILE[] = "/ha.daemon.log";        ///< daemonLog's
+constexpr char DAEMON_RECORD_FILE[] = "/ha.daemon.record";  ///< recordLog's
 
-// Diagnostic messages.
+/// Diagnostic messages.
 [[gnu::used]] static DaemonLog* const daemonLog = new DaemonLog(LOG_DIR, DAEMON_LOG_FILE);
 
-// Snapshots of status, processes, file systems and memory.
+/// Snapshots of status, processes, file systems and memory.
 [[gnu::used]] static DaemonLog* const recordLog = new DaemonLog(LOG_DIR, DAEMON_RECORD_FILE);
 
-// Use HA_LOG: it passes the place of its call.
+/// Use HA_LOG: it passes the place of its call.
 [[maybe_unused]] static void logAt(const char* file, int line, const std::string& message) {
     daemonLog->set(std::string(file) + ":" + std::to_string(line) + " " + message);
 }
 
 }  // namespace TERN::HA::Daemon
 
-// Logs "file.cpp:LINE message" to the including source file's daemonLog. `message` is a std::string or text.
+/// Logs "file.cpp:LINE message" to the including source file's daemonLog. `message` is a std::string or text.
 #define HA_LOG(message) ::TERN::HA::Daemon::logAt(__FILE_NAME__, __LINE__, (message))
