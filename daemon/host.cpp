@@ -83,12 +83,25 @@ std::string withoutLineEnd(std::string text) {
     return text;
 }
 
-void moveToDisk(DaemonLog& log, std::int64_t rotateSize) {
-    log.writeLogToDisk();
-    if (log.size() >= rotateSize) {
-        log.rotate();
+// Moves a log to disk and archives it when it has grown.
+class LogKeeper {
+ public:
+    LogKeeper(DaemonLog& log, std::int64_t rotateSize) : _log(log), _rotateSize(rotateSize) {}
+
+    void move(bool rotateNow) {
+        _log.writeLogToDisk();
+        if (rotateNow || _log.size() >= _nextRotation) {
+            _log.rotate();
+            // A log that could not be compressed is still there: every further attempt costs an archive.
+            _nextRotation = _log.size() + _rotateSize;
+        }
     }
-}
+
+ private:
+    DaemonLog& _log;
+    std::int64_t _rotateSize;
+    std::int64_t _nextRotation = _rotateSize;
+};
 
 // When the round after the one planned for `round` begins. Rounds that could not be kept are left out.
 std::chrono::steady_clock::time_point nextRound(std::chrono::steady_clock::time_point round,
@@ -355,6 +368,8 @@ void Host::measureLink() {
 void Host::keepLogs() {
     const auto logInterval = std::chrono::duration_cast<Clock::duration>(_options.logInterval);
     const auto snapshotInterval = std::chrono::duration_cast<Clock::duration>(_options.snapshotInterval);
+    LogKeeper daemonKeeper(*daemonLog, _options.rotateSize);
+    LogKeeper recordKeeper(*recordLog, _options.rotateSize);
     auto nextMove = Clock::now() + logInterval;
     auto nextSnapshot = Clock::now();
     while (!isStopping()) {
@@ -379,8 +394,8 @@ void Host::keepLogs() {
             nextSnapshot = Clock::now() + snapshotInterval;
         }
         if (rotateNow || Clock::now() >= nextMove) {
-            moveToDisk(*daemonLog, rotateNow ? 0 : _options.rotateSize);
-            moveToDisk(*recordLog, rotateNow ? 0 : _options.rotateSize);
+            daemonKeeper.move(rotateNow);
+            recordKeeper.move(rotateNow);
             nextMove = Clock::now() + logInterval;
         }
     }

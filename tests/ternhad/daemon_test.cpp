@@ -213,6 +213,29 @@ TEST_F(DaemonTest, ALogThatHasGrownIsRotated) {
     stop(daemon);
 }
 
+TEST_F(DaemonTest, ALogThatCannotBeCompressedDoesNotCostAnArchiveAtEachMove) {
+    test::replaceProgram("/bin/xz", "echo x >> /tmp/compressions; exit 1");
+    const std::string archive = "/var/log/ha/ha.daemon.log.0.xz";
+    test::writeFile(archive, "kept");
+    const auto compressions = [] {
+        return test::exists("/tmp/compressions") ? test::readFile("/tmp/compressions").size() / 2 : 0;
+    };
+    auto daemon = startAndWait({"--log-interval", "0.1", "--rotate-size", "4096"});
+    test::appendFile("/tmp/ha/ha.daemon.log", std::string(5000, 'x') + "\n");
+    EXPECT_TRUE(test::eventually(10s, [&] { return !test::exists(archive) && compressions() > 0; }));
+    // The next attempt comes when as much again has come; meanwhile the lines go on to be moved.
+    const auto attempts = compressions();
+    for (const char* line : {"one", "two", "three"}) {
+        test::appendFile("/tmp/ha/ha.daemon.log", std::string(line) + "\n");
+        EXPECT_TRUE(test::eventually(10s, [&] { return test::bufferText().empty(); }));
+    }
+    EXPECT_EQ(compressions(), attempts);
+    EXPECT_EQ(test::readFile("/var/log/ha/ha.daemon.log.1.xz"), "kept");
+    test::appendFile("/tmp/ha/ha.daemon.log", std::string(5000, 'x') + "\n");
+    EXPECT_TRUE(test::eventually(10s, [] { return test::exists("/var/log/ha/ha.daemon.log.2.xz"); }));
+    stop(daemon);
+}
+
 TEST_F(DaemonTest, AnAddressOfAnotherMachineEndsIt) {
     const auto result = test::run(test::daemonArguments("10.9.8.7", "127.0.0.2", "lo"));
     EXPECT_EQ(result.exitCode, 1);
