@@ -122,7 +122,18 @@ std::int64_t DaemonLog::size() const {
 }
 
 std::string DaemonLog::_formatedTime() const {
+    // Lines come in bursts: what was made for the first of a second serves the others. Without a destructor,
+    // so that a process can log to its very end.
+    struct Stamp {
+        std::time_t time = -1;
+        std::array<char, 32> text = {};
+    };
+    thread_local Stamp last;
+
     const std::time_t now = std::time(nullptr);
+    if (now == last.time) {
+        return last.text.data();
+    }
     std::tm local = {};
     tzset();  // localtime_r need not notice that the zone was changed
     localtime_r(&now, &local);
@@ -131,7 +142,12 @@ std::string DaemonLog::_formatedTime() const {
     std::array<char, 8> zone = {};
     (void)std::strftime(dateTime.data(), dateTime.size(), "%Y-%m-%dT%H:%M:%S", &local);
     (void)std::strftime(zone.data(), zone.size(), "%z", &local);
-    return std::string(dateTime.data()) + std::string(zone.data()).insert(3, ":");
+    const std::string stamp = std::string(dateTime.data()) + std::string(zone.data()).insert(3, ":");
+
+    last.text = {};
+    stamp.copy(last.text.data(), last.text.size() - 1);
+    last.time = now;
+    return stamp;
 }
 
 bool DaemonLog::_xz(const std::string& path) const {

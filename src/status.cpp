@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <ctime>
+#include <utility>
 
 #include "ha_log.h"
 #include "json_text.h"
@@ -131,16 +132,20 @@ bool Status::setErrHandlingDiskRemote(const Json::Value& disks) {
 
 Json::Value Status::toJson() {
     Json::Value json(Json::objectValue);
-    json["isRemoteAlive"] = isRemoteAlive();
-    json["isRemoteMDResync"] = isRemoteMDResync.load();
-    json["isRemoteDiskErrHandling"] = isRemoteDiskErrHandling.load();
-    json["isMDResync"] = isMDResync.load();
-    json["isDiskErrHandling"] = isDiskErrHandling.load();
-    json["isDRBDConnect"] = isDRBDConnect.load();
-    json["heartbeatPacketFailRate"] = static_cast<double>(heartbeatPacketFailRate.load());
-    json["heartbeatLatency"] = static_cast<double>(heartbeatLatency.load());
-    json["diskErrorHandlingDisk"] = getErrHandlingDisk();
-    json["diskErrorHandlingDiskRemote"] = getErrHandlingDiskRemote();
+    // The keys are literals, which need no copy.
+    const auto set = [&json](const char* key, Json::Value value) {
+        json[Json::StaticString(key)] = std::move(value);
+    };
+    set("isRemoteAlive", isRemoteAlive());
+    set("isRemoteMDResync", isRemoteMDResync.load());
+    set("isRemoteDiskErrHandling", isRemoteDiskErrHandling.load());
+    set("isMDResync", isMDResync.load());
+    set("isDiskErrHandling", isDiskErrHandling.load());
+    set("isDRBDConnect", isDRBDConnect.load());
+    set("heartbeatPacketFailRate", static_cast<double>(heartbeatPacketFailRate.load()));
+    set("heartbeatLatency", static_cast<double>(heartbeatLatency.load()));
+    set("diskErrorHandlingDisk", getErrHandlingDisk());
+    set("diskErrorHandlingDiskRemote", getErrHandlingDiskRemote());
     return json;
 }
 

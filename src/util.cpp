@@ -1,6 +1,7 @@
 #include "util.h"
 
 #include <array>
+#include <utility>
 
 #include "file.h"
 #include "ha_log.h"
@@ -54,14 +55,26 @@ std::vector<std::string> devListToHumanReadable(const std::vector<std::string>& 
     if (table.empty()) {
         return devices;
     }
+    // Every device is looked for in all entries: what they say is read once.
+    struct Disk {
+        std::string device;
+        std::string name;
+    };
+    std::vector<Disk> disks;
+    for (auto member = table.begin(); member != table.end(); ++member) {
+        Disk disk;
+        std::string container;
+        if (member->isObject() && readString((*member)["HD_DEVNAME"], disk.device) &&
+            readString((*member)["HD_CONTAINER"], container)) {
+            disk.name = readableName(member.name(), container);
+            disks.push_back(std::move(disk));
+        }
+    }
     std::vector<std::string> names;
     for (const std::string& device : devices) {
-        for (auto member = table.begin(); member != table.end(); ++member) {
-            std::string memberDevice;
-            std::string container;
-            if (member->isObject() && readString((*member)["HD_DEVNAME"], memberDevice) &&
-                memberDevice == device && readString((*member)["HD_CONTAINER"], container)) {
-                names.push_back(readableName(member.name(), container));
+        for (const Disk& disk : disks) {
+            if (disk.device == device) {
+                names.push_back(disk.name);
             }
         }
     }

@@ -38,6 +38,11 @@ class DaemonLogTest : public test::SandboxTest {
         setenv("TZ", "UTC0", 1);
     }
 
+    void setAt(std::time_t time, const char* text) {
+        const test::FixedTime now(time);
+        log.set(text);
+    }
+
     DaemonLog log{"/var/log/ha", "/ha.daemon.log"};
 };
 
@@ -79,23 +84,30 @@ TEST_F(DaemonLogTest, StampsAreRightAfter2038) {
 }
 
 TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheProcess) {
-    const test::FixedTime now(1794730821);
-    log.set("first");
+    setAt(1794730821, "first");
     setenv("TZ", "CET-1", 1);
-    log.set("second");
-    EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T08:20:21+00:00 first\n2026-11-15T09:20:21+01:00 second\n");
+    setAt(1794730822, "second");
+    EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T08:20:21+00:00 first\n2026-11-15T09:20:22+01:00 second\n");
 }
 
 TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheMachine) {
-    const test::FixedTime now(1794730821);
     unsetenv("TZ");
     test::removeTree("/etc/localtime");
     std::filesystem::create_symlink("/usr/share/zoneinfo/Asia/Kolkata", "/etc/localtime");
-    log.set("first");
+    setAt(1794730821, "first");
     test::removeTree("/etc/localtime");
     std::filesystem::create_symlink("/usr/share/zoneinfo/America/Phoenix", "/etc/localtime");
-    log.set("second");
-    EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T13:50:21+05:30 first\n2026-11-15T01:20:21-07:00 second\n");
+    setAt(1794730822, "second");
+    EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T13:50:21+05:30 first\n2026-11-15T01:20:22-07:00 second\n");
+}
+
+TEST_F(DaemonLogTest, StampsFollowAClockThatIsSetBack) {
+    setAt(1794730821, "first");
+    setAt(1794730820, "second");
+    setAt(1794730821, "third");
+    EXPECT_EQ(test::readFile(BUFFER),
+              "2026-11-15T08:20:21+00:00 first\n2026-11-15T08:20:20+00:00 second\n"
+              "2026-11-15T08:20:21+00:00 third\n");
 }
 
 TEST_F(DaemonLogTest, StampsAreThoseOfTheMoment) {
