@@ -16,11 +16,11 @@ const EarlyObject early;
 
 }  // namespace
 
-const TERN::HA::Daemon::DaemonLog* otherDaemonLog() {
+TERN::HA::Daemon::DaemonLog* otherDaemonLog() {
     return TERN::HA::Daemon::daemonLog;
 }
 
-const TERN::HA::Daemon::DaemonLog* otherRecordLog() {
+TERN::HA::Daemon::DaemonLog* otherRecordLog() {
     return TERN::HA::Daemon::recordLog;
 }
 

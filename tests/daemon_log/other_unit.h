@@ -5,8 +5,8 @@
 // A second source file with a pair of log objects of its own.
 namespace test {
 
-const TERN::HA::Daemon::DaemonLog* otherDaemonLog();
-const TERN::HA::Daemon::DaemonLog* otherRecordLog();
+TERN::HA::Daemon::DaemonLog* otherDaemonLog();
+TERN::HA::Daemon::DaemonLog* otherRecordLog();
 
 // Logs through this file's own object.
 void logFromOtherUnit(const char* message);

@@ -1,5 +1,7 @@
 // Two nodes for a long time: with events at random, with a link that loses datagrams, or cut again and again.
 // script/soak runs it in a sandbox.
+#include <unistd.h>
+
 #include <CLI/CLI.hpp>
 #include <algorithm>
 #include <array>
@@ -9,6 +11,7 @@
 #include <fstream>
 #include <future>
 #include <random>
+#include <sstream>
 #include <stdexcept>
 
 #include "support/sandbox_check.h"
@@ -27,6 +30,7 @@ struct Options {
     unsigned int loss = 0;  // percent of the datagrams that reach a node
     std::string events = "all";
     int cuts = 0;
+    int idle = 0;
 };
 
 // A node, and what is true of it.
@@ -66,7 +70,25 @@ struct Side {
 struct Figures {
     long descriptors = 0;
     long residentKilobytes = 0;
+    long anonymousKilobytes = 0;
 };
+
+struct Usage {
+    double cpuSeconds = 0;
+    long wakeUps = 0;
+};
+
+// The number that follows `key` in a file of lines "key: number ...".
+long valueOf(const std::string& path, const std::string& key) {
+    std::ifstream file(path);
+    std::string line;
+    while (std::getline(file, line)) {
+        if (line.rfind(key + ":", 0) == 0) {
+            return std::stol(line.substr(key.size() + 1));
+        }
+    }
+    return 0;
+}
 
 Figures figuresOf(Side& side) {
     Figures figures;
@@ -75,14 +97,33 @@ Figures figuresOf(Side& side) {
         static_cast<void>(entry);
         ++figures.descriptors;
     }
-    std::ifstream status(proc + "/status");
-    std::string line;
-    while (std::getline(status, line)) {
-        if (line.rfind("VmRSS:", 0) == 0) {
-            figures.residentKilobytes = std::stol(line.substr(6));
-        }
-    }
+    figures.residentKilobytes = valueOf(proc + "/status", "VmRSS");
+    figures.anonymousKilobytes = valueOf(proc + "/status", "RssAnon");
     return figures;
+}
+
+// Of the daemon's threads and, for the time, of the programs that it has run. Threads that have ended no
+// longer tell how often they woke; each was one wake-up at least.
+Usage usageOf(Side& side) {
+    Usage usage;
+    const std::string proc = side.proc();
+    for (const auto& task : std::filesystem::directory_iterator(proc + "/task")) {
+        usage.wakeUps += valueOf(task.path().string() + "/status", "voluntary_ctxt_switches");
+    }
+    const std::string text = test::readFile(proc + "/stat");
+    std::istringstream columns(text.substr(text.rfind(')') + 2));
+    std::string skipped;
+    for (int i = 0; i < 11; ++i) {
+        columns >> skipped;
+    }
+    long ticks = 0;
+    for (int i = 0; i < 4; ++i) {  // its own user and system time, and those of its children
+        long part = 0;
+        columns >> part;
+        ticks += part;
+    }
+    usage.cpuSeconds = static_cast<double>(ticks) / static_cast<double>(sysconf(_SC_CLK_TCK));
+    return usage;
 }
 
 class Soak {
@@ -146,6 +187,19 @@ class Soak {
         std::sort(seconds.begin(), seconds.end());
         std::printf("%d cuts, seconds until a node says dead: minimum %.2f, median %.2f, maximum %.2f\n",
                     _options.cuts, seconds.front(), seconds[seconds.size() / 2], seconds.back());
+    }
+
+    // What a node's daemon costs while nothing happens and nobody asks it.
+    void runIdle() {
+        const Usage before = usageOf(_a);
+        std::this_thread::sleep_for(std::chrono::seconds(_options.idle));
+        const Usage after = usageOf(_a);
+        const Figures figures = figuresOf(_a);
+        std::printf(
+            "idle: %.2f CPU seconds per hour, %.1f wake-ups per second, %ld kB resident, %ld kB anonymous\n",
+            (after.cpuSeconds - before.cpuSeconds) * 3600 / _options.idle,
+            static_cast<double>(after.wakeUps - before.wakeUps) / _options.idle, figures.residentKilobytes,
+            figures.anonymousKilobytes);
     }
 
     int deaths() {
@@ -343,10 +397,15 @@ int main(int argc, char** argv) {
                    "all; state: resyncs and disk errors only; none: nothing happens, and nobody may die")
         ->check(CLI::IsMember({"all", "state", "none"}));
     app.add_option("--cuts", options.cuts, "instead: cut the link so often, and measure");
+    app.add_option("--idle", options.idle, "instead: leave both alone for so many seconds, and measure");
     CLI11_PARSE(app, argc, argv);
 
     Soak soak(options);
     try {
+        if (options.idle > 0) {
+            soak.runIdle();
+            return 0;
+        }
         if (options.cuts > 0) {
             soak.runCuts();
             return 0;
