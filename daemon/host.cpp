@@ -4,7 +4,9 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <csignal>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
@@ -25,7 +27,6 @@ using TERN::HA::Daemon::recordLog;
 
 namespace {
 
-constexpr unsigned int CONTROL_TIMEOUT = 0;  // the server side of the socket does not use it
 constexpr auto STOP_LIMIT = std::chrono::milliseconds(1500);
 constexpr auto STOP_STEP = std::chrono::milliseconds(20);
 
@@ -117,7 +118,7 @@ bool storeFlag(std::atomic<bool>& flag, bool found) {
 
 }  // namespace
 
-Host::Host(const Options& options) : _options(options), _control(options.socket, CONTROL_TIMEOUT) {
+Host::Host(const Options& options) : _options(options), _control(options.socket) {
     drbdIF(_options.interface);
     localIP(_options.localIp);
     remoteIP(_options.remoteIp);
@@ -129,9 +130,9 @@ int Host::run() {
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);  // inherited by the threads: only waitForStop takes them
     setUpInterruption();
 
-    if (_control.hasError() || !_control.serverBind()) {
-        std::cerr << "ternhad: cannot bind the control socket " << _options.socket
-                  << ", the system log tells why\n";
+    if (!_control.listen()) {
+        std::cerr << "ternhad: cannot bind the control socket " << _options.socket << ": "
+                  << std::strerror(errno) << "\n";
         return 1;
     }
     HA_LOG("Started on " + _options.localIp + ", peer " + _options.remoteIp);
@@ -241,7 +242,7 @@ void Host::servePeer() {
 
 void Host::serveControl() {
     while (!isStopping()) {
-        _control.serverListen();
+        _control.serve();
     }
 }
 

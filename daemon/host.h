@@ -8,7 +8,7 @@
 #include <thread>
 #include <vector>
 
-#include "control.h"
+#include "control_server.h"
 #include "options.h"
 #include "status.h"
 
@@ -62,7 +62,7 @@ class Host {
 
     const Options& _options;
     TERN::HA::Daemon::Status _status;
-    TERN::HA::Daemon::MonitordSocket _control;
+    ControlServer _control;
 
     std::atomic<bool> _isHostnameKnown{false};
     bool _wasPeerResync = false;

@@ -10,6 +10,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <atomic>
 #include <filesystem>
 #include <functional>
 #include <thread>
@@ -136,6 +138,71 @@ TEST_F(DaemonTest, AnotherUserCannotReachTheSocket) {
     EXPECT_EQ(connectAsAnotherUser(), error);
     ASSERT_EQ(chmod(test::CONTROL_SOCKET, 0666), 0);
     EXPECT_EQ(connectAsAnotherUser(), error == EACCES ? 0 : -1);
+    stop(daemon);
+}
+
+// A connection over which nothing is sent.
+class SilentClient {
+ public:
+    SilentClient() {
+        sockaddr_un address = {};
+        address.sun_family = AF_UNIX;
+        std::string(test::CONTROL_SOCKET)
+            .copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
+        EXPECT_EQ(connect(_fd.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    }
+
+    // What the daemon has sent when it has closed the connection.
+    std::string receiveAll() const {
+        std::string all(4096, '\0');
+        all.resize(
+            static_cast<std::size_t>(std::max(recv(_fd.get(), all.data(), all.size(), 0), ssize_t{0})));
+        return all;
+    }
+
+ private:
+    test::Descriptor _fd{socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0), "cannot make a socket"};
+};
+
+TEST_F(DaemonTest, AClientThatSendsNothingHoldsUpTheOthersForFiveSeconds) {
+    auto daemon = startAndWait();
+    const SilentClient silent;
+    const test::Stopwatch stopwatch;
+    Json::Value status;
+    EXPECT_TRUE(TERN::HA::Daemon::MonitordSocket(test::CONTROL_SOCKET, 20).getServerData(status));
+    EXPECT_GE(stopwatch.elapsed(), 4s);
+    EXPECT_LT(stopwatch.elapsed(), 15s);
+    EXPECT_EQ(silent.receiveAll(), "");
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, AThousandClientsInARowAreServed) {
+    auto daemon = startAndWait();
+    for (int i = 0; i < 1000; ++i) {
+        ASSERT_TRUE(test::statusAt().isObject()) << i;
+    }
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, AHundredClientsAtOnceAreServedAlthoughSomeLeave) {
+    auto daemon = startAndWait();
+    std::atomic<int> served{0};
+    std::vector<std::thread> clients;
+    for (int i = 0; i < 100; ++i) {
+        clients.emplace_back([&served, i] {
+            if (i % 10 == 0) {
+                const SilentClient leaving;
+            } else if (Json::Value status;
+                       TERN::HA::Daemon::MonitordSocket(test::CONTROL_SOCKET, 60).getServerData(status)) {
+                ++served;
+            }
+        });
+    }
+    for (std::thread& client : clients) {
+        client.join();
+    }
+    EXPECT_EQ(served, 90);
+    EXPECT_TRUE(isUp());
     stop(daemon);
 }
 
