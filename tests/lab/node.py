@@ -113,11 +113,6 @@ class Node:
         """The connection state of the resource, such as Connected; empty when it is not set up."""
         return parse_drbd_state(self.run("cat /proc/drbd"))
 
-    def daemon_pid(self) -> int:
-        """The process that the supervisor has started last; 0 when it has ended."""
-        last = self.supervised()[-1]
-        return int(last[1]) if last[0] == "start" else 0
-
     def supervised(self) -> list[list[str]]:
         """The supervisor's account: ["start", PID] and ["end", PID, EXIT-CODE]."""
         return [line.split() for line in self.run("cat /run/lab/daemon").splitlines()]

@@ -44,11 +44,11 @@ def _kernel_package() -> str:
         relation, _, package = line.strip().partition(": ")
         if relation == "Depends" and package.startswith("linux-image-"):
             return package.partition(":")[0]
-    raise LabError(f"apt knows no kernel {KERNEL}:{ARCHITECTURE}; its indexes may be old: apt-get update")
+    raise LabError(f"apt knows no {KERNEL}:{ARCHITECTURE}; apt-get update may help")
 
 
 def _run(command: list[str], directory: Path) -> str:
     result = subprocess.run(command, cwd=directory, capture_output=True, text=True, check=False)
     if result.returncode != 0:
-        raise LabError(f"{' '.join(command)} failed:\n{result.stderr or result.stdout}")
+        raise LabError(f"{' '.join(command)} failed; apt-get update may help:\n{result.stderr or result.stdout}")
     return result.stdout

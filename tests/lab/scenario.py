@@ -132,11 +132,9 @@ def md_actions(lab: Lab, checks: Checks):
     checks.scene("The md mirror of node-b: resync counts, check and recover do not")
     none = [{"isMDResync": False, "isRemoteMDResync": False}] * 2
     checks.within(RESYNC_LIMIT, "no resync yet", lab.statuses, none)
+    lab.b.run(f"{SLOW_RESYNC}; mdadm --quiet --stop /dev/md0")
     begin = time.monotonic()
-    lab.b.run(
-        f"{SLOW_RESYNC}; mdadm --quiet --stop /dev/md0 &&"
-        " mdadm --quiet --assemble /dev/md0 --update=resync /dev/disk/md0 /dev/disk/md1"
-    )
+    lab.b.run("mdadm --quiet --assemble /dev/md0 --update=resync /dev/disk/md0 /dev/disk/md1")
     checks.within(
         RESYNC_LIMIT,
         "resync: known to itself, and to the peer",
@@ -236,7 +234,7 @@ def kill_daemon(lab: Lab, checks: Checks):
     checks.scene("The daemon of node-b is killed")
     lab.b.hold_daemon()
     begin = time.monotonic()
-    lab.b.run(f"kill -KILL {lab.b.daemon_pid()}")
+    lab.b.run("kill -KILL $(cat /run/lab/pid)")
     checks.within(DEATH_LIMIT, "node-a says dead", lab.a.status, DEAD | {"isDRBDConnect": True}, begin)
     checks.equal("the supervisor saw it killed", "137", lab.b.supervised()[-1][-1])
     lab.b.release_daemon()
@@ -254,7 +252,7 @@ def freeze_node(lab: Lab, checks: Checks):
 
 def unknown_request(lab: Lab, checks: Checks):
     checks.scene("node-a sends node-b a request that does not exist")
-    pid = lab.b.daemon_pid()
+    pid = lab.b.run("cat /run/lab/pid").strip()
     lab.a.run(f"ternha-lab-tool send {lab.b.address} no_such_request")
     checks.within(
         DEATH_LIMIT,
@@ -263,7 +261,7 @@ def unknown_request(lab: Lab, checks: Checks):
         [["end", "134"], ["start"]],
     )
     ended, started = lab.b.supervised()[-2:]
-    checks.that("it was that daemon, and is another now", ended[1] == str(pid) != started[1], pid, [ended, started])
+    checks.that("it was that daemon, and is another now", ended[1] == pid != started[1], pid, [ended, started])
     checks.within(RETURN_LIMIT, "both say alive", lab.statuses, [WELL] * 2)
 
 
@@ -276,7 +274,7 @@ def rotate_log(lab: Lab, checks: Checks):
     before = node.log()
     checks.equal("they are in the log", expected, lab_lines(before))
     archive = "/var/log/ha/ha.daemon.log.0.xz"
-    node.run(f"kill -HUP {node.daemon_pid()}")
+    node.run("kill -HUP $(cat /run/lab/pid)")
     checks.within(
         RETURN_LIMIT,
         "there is one archive of the log, and no log",
@@ -337,9 +335,7 @@ def measure(lab: Lab, checks: Checks):
     for node in lab.nodes:
         resident, anonymous = memory(node)
         checks.fact(f"memory on {node}: {resident} KiB resident, {anonymous} KiB of it anonymous")
-    lab.run(
-        "sed -i /interval/d /etc/ternha/ternhad.conf && kill -TERM $(tail -n 1 /run/lab/daemon | cut -d ' ' -f 2)"
-    )
+    lab.run("sed -i /interval/d /etc/ternha/ternhad.conf && kill -TERM $(cat /run/lab/pid)")
     checks.within(
         RETURN_LIMIT,
         "both have ended in order, and are alive again with the default intervals",
@@ -361,14 +357,14 @@ def measure(lab: Lab, checks: Checks):
 def memory(node: Node) -> tuple[int, int]:
     """The resident memory of the daemon and the anonymous part of it, KiB."""
     fields = dict(
-        line.split(":", 1) for line in node.run(f"cat /proc/{node.daemon_pid()}/status").splitlines()
+        line.split(":", 1) for line in node.run("cat /proc/$(cat /run/lab/pid)/status").splitlines()
     )
     return int(fields["VmRSS"].split()[0]), int(fields["RssAnon"].split()[0])
 
 
 def processor_use(lab: Lab) -> list[tuple[float, float]]:
     """For each node the processor's time, in seconds, that the daemon and its ended children have taken."""
-    outputs = lab.run("cat /proc/$(tail -n 1 /run/lab/daemon | cut -d ' ' -f 2)/stat")
+    outputs = lab.run("cat /proc/$(cat /run/lab/pid)/stat")
     times = [list(map(int, output.rpartition(")")[2].split()[11:15])) for output in outputs]
     return [((user + system) / TICKS, (c_user + c_system) / TICKS) for user, system, c_user, c_system in times]
 
