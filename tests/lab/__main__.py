@@ -14,7 +14,7 @@ import scenario
 from checks import Checks
 from consoles import Consoles
 from failure import CheckFailed, LabError
-from lab import Lab
+from lab import INTERRUPTIONS, Lab
 from node import Channel
 
 ROOT = Path(__file__).resolve().parents[2]
@@ -25,7 +25,7 @@ TARGETS = ["ternhad", "ternhactl", "ternha-lab-tool"]
 
 def main() -> int:
     options = parse_options()
-    for number in (signal.SIGINT, signal.SIGTERM, signal.SIGHUP):
+    for number in INTERRUPTIONS:
         signal.signal(number, interrupt)
     try:
         if options.on:
@@ -81,7 +81,8 @@ def run_lab(keep: bool) -> int:
 
 
 def build_programs():
-    configure = ["cmake", "--preset", "arm", "-B", BUILD, "-D", "TERNHA_BUILD_TESTS=OFF", "-D", "TERNHA_BUILD_LAB=ON"]
+    options = ["-D", "TERNHA_BUILD_TESTS=OFF", "-D", "TERNHA_BUILD_LAB=ON"]
+    configure = ["cmake", "--preset", "arm", "-B", BUILD, *options]
     for command in (configure, ["cmake", "--build", BUILD, "--target", *TARGETS]):
         result = subprocess.run(command, cwd=ROOT, capture_output=True, text=True, check=False)
         if result.returncode != 0:

@@ -66,7 +66,8 @@ class Checks:
 
     def _seen(self, what: str, duration: float, limit: float, expected: Any, seen: Any):
         if duration > limit:
-            raise CheckFailed(what, f"within {limit} s: {describe(expected)}", f"after {duration:.1f} s: {describe(seen)}")
+            late = f"after {duration:.1f} s: {describe(seen)}"
+            raise CheckFailed(what, f"within {limit} s: {describe(expected)}", late)
         self.passed += 1
         self._line("ok    ", f"{what} ({duration:.1f} s)")
 

@@ -14,9 +14,17 @@ PROMPT = 10  # seconds within which an emulator answers
 class Emulator:
     """A running emulator, controlled by the QEMU Machine Protocol. It dies with this process."""
 
-    def __init__(self, name: str, kernel: Path, initrd: Path, disks: dict[str, Path], link: socket.socket, agent: Path):
-        """Starts the machine called `name`. `link` is the datagram socket that its network interface is joined to,
-        `agent` the path of the socket that its command channel will listen on."""
+    def __init__(
+        self,
+        name: str,
+        kernel: Path,
+        initrd: Path,
+        disks: dict[str, Path],
+        link: socket.socket,
+        agent: Path,
+    ):
+        """Starts the machine called `name`. `disks` are images by serial number, `link` is the datagram socket
+        that its network interface is joined to, `agent` the path at which its command channel will listen."""
         self.name = name
         self.console, console = socket.socketpair()
         self._control, control = socket.socketpair()
@@ -37,7 +45,7 @@ class Emulator:
             "-device", "virtio-rng-device",
             "-netdev", f"dgram,id=link,local.type=fd,local.str={link.fileno()}",
             "-device", f"virtio-net-device,netdev=link,mac=52:54:00:00:00:{ord(name):02x}",
-        ]  # fmt: skip
+        ]
         for serial, image in disks.items():
             command += ["-drive", f"if=none,id={serial},file={image},format=raw,cache=unsafe"]
             command += ["-device", f"virtio-blk-device,drive={serial},serial={serial}"]

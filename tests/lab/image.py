@@ -29,12 +29,12 @@ PROGRAMS = {
     "net-tools": ["sbin/ifconfig"],
     "procps": ["bin/ps"],
     "xz-utils": ["usr/bin/xz"],
-}  # fmt: skip
+}
 
 MODULES = [
     "virtio_mmio", "virtio_net", "virtio_blk", "virtio_console", "virtio-rng", "crc32c_generic", "ext4", "drbd",
     "raid1",
-]  # fmt: skip
+]
 
 
 class Archive:

@@ -2,6 +2,7 @@
 
 import os
 import shutil
+import signal
 import socket
 import subprocess
 import tempfile
@@ -15,6 +16,7 @@ from node import STATUS, Channel, Node, parse_status
 MIB = 1024 * 1024
 DISKS = {"log": 16 * MIB, "drbd": 24 * MIB, "md0": 12 * MIB, "md1": 12 * MIB}  # by serial number
 BOOT_LIMIT = 60  # seconds
+INTERRUPTIONS = (signal.SIGINT, signal.SIGTERM, signal.SIGHUP)
 
 
 class Lab:
@@ -25,7 +27,7 @@ class Lab:
         self._kernel = kernel
         self._archive = archive
         self._consoles = consoles
-        self.directory = Path(tempfile.mkdtemp(prefix="ternha-lab."))
+        self.directory = Path()
         self._emulators: list[Emulator] = []
         self.nodes: list[Node] = []
 
@@ -61,6 +63,7 @@ class Lab:
             node.emulator.set_link(up)
 
     def _start(self):
+        self.directory = Path(tempfile.mkdtemp(prefix="ternha-lab."))
         system = self.directory / "system"
         system.write_bytes(self._archive)
         links = _link()
@@ -88,11 +91,14 @@ class Lab:
         return disks
 
     def _end(self):
+        signal.pthread_sigmask(signal.SIG_BLOCK, INTERRUPTIONS)
         for emulator in self._emulators:
             emulator.end()
         for node in self.nodes:
             node.channel.close()
-        shutil.rmtree(self.directory, ignore_errors=True)
+        if self.directory != Path():
+            shutil.rmtree(self.directory)
+        signal.pthread_sigmask(signal.SIG_UNBLOCK, INTERRUPTIONS)
 
 
 def _link() -> list[socket.socket]:

@@ -13,7 +13,7 @@ PACKAGES = [
     "libgcrypt20", "libgpg-error0", "libidn2-0", "libjsoncpp25", "liblz4-1", "liblzma5", "libproc2-0",
     "libstdc++6", "libsystemd0", "libudev1", "libunistring2", "libzstd1", "mdadm", "net-tools", "procps",
     "xz-utils",
-]  # fmt: skip
+]
 
 
 def unpacked(cache: Path) -> Path:

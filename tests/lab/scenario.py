@@ -96,7 +96,7 @@ def initial_sync(lab: Lab, checks: Checks):
     checks.scene("DRBD copies the disk for the first time")
     lab.a.run("drbdadm primary --force r0")
     checks.within(RESYNC_LIMIT, "DRBD is SyncSource on one, SyncTarget on the other", lambda: drbd_states(lab),
-                  ["SyncSource", "SyncTarget"])  # fmt: skip
+                  ["SyncSource", "SyncTarget"])
     checks.holds(
         LONGER_THAN_A_ROUND,
         "the sync counts as connected",
@@ -105,7 +105,7 @@ def initial_sync(lab: Lab, checks: Checks):
     )
     lab.run("drbdadm disk-options --resync-rate=100M r0")
     checks.within(RETURN_LIMIT, "the sync ends: DRBD is Connected, both disks up to date",
-                  lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)  # fmt: skip
+                  lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
     checks.holds(LONGER_THAN_A_ROUND, "both still say alive and connected", lab.statuses, [WELL] * 2)
     lab.run("drbdadm disk-options --resync-rate=2M r0")
 
@@ -261,7 +261,8 @@ def unknown_request(lab: Lab, checks: Checks):
         [["end", "134"], ["start"]],
     )
     ended, started = lab.b.supervised()[-2:]
-    checks.that("it was that daemon, and is another now", ended[1] == pid != started[1], pid, [ended, started])
+    is_other = ended[1] == pid != started[1]
+    checks.that("it was that daemon, and is another now", is_other, f"the end of {pid}", [ended, started])
     checks.within(RETURN_LIMIT, "both say alive", lab.statuses, [WELL] * 2)
 
 
