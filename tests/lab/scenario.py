@@ -14,7 +14,7 @@ DEATH_LIMIT = 5  # seconds until a peer that says nothing counts as dead
 CUT_LIMIT = 8  # until both ends of a cut link have seen it
 RESYNC_LIMIT = 3  # until both nodes know of a resync
 RETURN_LIMIT = 20  # until everything is well again
-LONGER_THAN_A_ROUND = 2.5  # seconds; the daemons look every second
+SOME_ROUNDS = 2  # seconds; the daemons look twice a second
 IDLE = 20  # seconds, of which the use of the processor is taken
 TICKS = 100  # of the processor's time, in a second
 
@@ -98,7 +98,7 @@ def initial_sync(lab: Lab, checks: Checks):
     checks.within(RESYNC_LIMIT, "DRBD is SyncSource on one, SyncTarget on the other", lambda: drbd_states(lab),
                   ["SyncSource", "SyncTarget"])
     checks.holds(
-        LONGER_THAN_A_ROUND,
+        SOME_ROUNDS,
         "the sync counts as connected",
         lambda: connected_during_state(lab),
         [("SyncSource", True), ("SyncTarget", True)],
@@ -106,7 +106,7 @@ def initial_sync(lab: Lab, checks: Checks):
     lab.run("drbdadm disk-options --resync-rate=100M r0")
     checks.within(RETURN_LIMIT, "the sync ends: DRBD is Connected, both disks up to date",
                   lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
-    checks.holds(LONGER_THAN_A_ROUND, "both still say alive and connected", lab.statuses, [WELL] * 2)
+    checks.holds(SOME_ROUNDS, "both still say alive and connected", lab.statuses, [WELL] * 2)
     lab.run("drbdadm disk-options --resync-rate=2M r0")
 
 
@@ -171,7 +171,7 @@ def check_uncounted(lab: Lab, checks: Checks, action: str):
         peer_record = json.loads(lab.a.result("status", started))
         return before, json.loads(record)["isMDResync"], after, peer_record["isRemoteMDResync"]
 
-    checks.holds(LONGER_THAN_A_ROUND, f"{action} does not count", look, (action, False, action, False))
+    checks.holds(SOME_ROUNDS, f"{action} does not count", look, (action, False, action, False))
 
 
 def check_snapshot(node: Node, checks: Checks, flag: str):
@@ -218,7 +218,7 @@ def split_brain(lab: Lab, checks: Checks):
         RETURN_LIMIT, "both say alive, but not connected", lab.statuses, [ALIVE | {"isDRBDConnect": False}] * 2
     )
     checks.holds(
-        LONGER_THAN_A_ROUND,
+        SOME_ROUNDS,
         "and it stays so",
         lab.statuses,
         [ALIVE | {"isDRBDConnect": False}] * 2,
