@@ -4,6 +4,7 @@ import base64
 import json
 import socket
 import time
+from collections import deque
 from pathlib import Path
 
 from failure import LabError
@@ -23,21 +24,23 @@ class Channel:
             raise LabError(f"{path}: {error.strerror}") from None
         self._input = b""
         self._last_id = 0
-        self._boot_ids: list[str] = []
+        self._boot_ids: deque[str] = deque()
 
     def wait_for_boot(self, limit: float) -> str:
         """Waits until the machine has come up once more, and returns the id of that boot."""
-        known = len(self._boot_ids)
         deadline = time.monotonic() + limit
-        while len(self._boot_ids) == known:
+        while not self._boot_ids:
             self._take_line(deadline, "come up")
-        return self._boot_ids[-1]
+        return self._boot_ids.popleft()
 
     def start(self, script: str) -> int:
         self._last_id = time.monotonic_ns()  # differs from those that others have used on this channel
         line = f"{self._last_id} {base64.b64encode(script.encode()).decode()}\n"
         self._socket.settimeout(COMMAND_LIMIT)
-        self._socket.sendall(line.encode())
+        try:
+            self._socket.sendall(line.encode())
+        except OSError as error:
+            raise LabError(f"{self._name} takes no command: {error}") from None
         return self._last_id
 
     def finish(self, script_id: int, limit: float = COMMAND_LIMIT) -> tuple[int, str]:
@@ -58,6 +61,8 @@ class Channel:
                 data = self._socket.recv(65536)
             except TimeoutError:
                 raise LabError(f"{self._name} did not {what} in time") from None
+            except OSError:
+                data = b""
             if not data:
                 raise LabError(f"the emulator of {self._name} has ended")
             self._input += data
