@@ -1,0 +1,124 @@
+"""Runs the lab: two emulated nodes and what happens to them."""
+
+import argparse
+import fcntl
+import signal
+import subprocess
+import sys
+import time
+from pathlib import Path
+
+import image
+import packages
+import scenario
+from checks import Checks
+from consoles import Consoles
+from failure import CheckFailed, LabError
+from lab import INTERRUPTIONS, Lab
+from node import Channel
+
+ROOT = Path(__file__).resolve().parents[2]
+CACHE = ROOT / "build/lab"
+BUILD = CACHE / "arm"
+TARGETS = ["ternhad", "ternhactl", "ternha-lab-tool"]
+
+
+def main() -> int:
+    options = parse_options()
+    for number in INTERRUPTIONS:
+        signal.signal(number, interrupt)
+    try:
+        if options.on:
+            return run_on_node(Path(options.on), " ".join(options.command))
+        return run_lab(options.keep)
+    except LabError as error:
+        print(f"lab: {error}", file=sys.stderr)
+        return 1
+    except KeyboardInterrupt:
+        print("lab: interrupted", file=sys.stderr)
+        return 130
+
+
+def parse_options():
+    parser = argparse.ArgumentParser(prog="script/lab", description="Two emulated 32-bit ARM nodes at work.")
+    parser.add_argument("--keep", action="store_true", help="leave both nodes up afterwards, until Ctrl-C")
+    parser.add_argument("--on", metavar="NODE", help="run a command on a kept node, by the path that --keep names")
+    parser.add_argument("command", nargs=argparse.REMAINDER, help="the command for --on")
+    options = parser.parse_args()
+    if bool(options.on) != bool(options.command):
+        parser.error("--on NODE and a command go together")
+    return options
+
+
+def interrupt(number, _frame):
+    raise KeyboardInterrupt(number)
+
+
+def run_lab(keep: bool) -> int:
+    CACHE.mkdir(parents=True, exist_ok=True)
+    with open(CACHE / "lock", "w") as lock:
+        fcntl.flock(lock, fcntl.LOCK_EX)  # runs side by side share what they are made from
+        build_programs()
+        guest_packages = packages.unpacked(CACHE)
+        archive = image.system(guest_packages, CACHE) + image.programs(BUILD)
+
+    begin = time.monotonic()
+    consoles = Consoles(CACHE / "consoles", begin)
+    checks = Checks(consoles, begin)
+    print(f"lab: the consoles of both nodes go to {consoles.path.relative_to(ROOT)}", flush=True)
+    failed = False
+    with Lab(image.kernel(guest_packages), archive, consoles) as lab:
+        try:
+            scenario.run(lab, checks)
+        except (CheckFailed, LabError) as failure:
+            failed = True
+            report(failure, consoles)
+        verdict = "1 failed, the rest not reached" if failed else "0 failed"
+        print(f"lab: {checks.passed} checks passed, {verdict}, in {checks.elapsed():.1f} s", flush=True)
+        if keep:
+            leave_up(lab)
+    return 1 if failed else 0
+
+
+def build_programs():
+    options = ["-D", "TERNHA_BUILD_TESTS=OFF", "-D", "TERNHA_BUILD_LAB=ON"]
+    configure = ["cmake", "--preset", "arm", "-B", BUILD, *options]
+    for command in (configure, ["cmake", "--build", BUILD, "--target", *TARGETS]):
+        result = subprocess.run(command, cwd=ROOT, capture_output=True, text=True, check=False)
+        if result.returncode != 0:
+            raise LabError(f"the programs cannot be built:\n{result.stdout}{result.stderr}")
+
+
+def report(failure: Exception, consoles: Consoles):
+    sys.stdout.flush()
+    if isinstance(failure, CheckFailed):
+        print(f"FAILED: {failure.what}", file=sys.stderr)
+        print(f"  expected: {failure.expected}\n  seen:     {failure.seen}", file=sys.stderr)
+        consoles.note(f"FAILED: {failure.what}")
+    else:
+        print(f"FAILED: {failure}", file=sys.stderr)
+    print(f"The last lines of the consoles, all of which are in {consoles.path}:", file=sys.stderr)
+    print(consoles.tail(), file=sys.stderr, flush=True)
+
+
+def leave_up(lab: Lab):
+    """Waits for Ctrl-C; the command channels are free meanwhile."""
+    print("Both nodes stay up until Ctrl-C. Look into them from another terminal, as in:")
+    for node in lab.nodes:
+        node.channel.close()
+        print(f"  script/lab --on {lab.directory}/{node} ternhactl status", flush=True)
+    try:
+        while True:
+            signal.pause()
+    except KeyboardInterrupt:
+        print("lab: ended", flush=True)
+
+
+def run_on_node(node: Path, command: str) -> int:
+    channel = Channel(node.name, node)
+    code, output = channel.finish(channel.start(command))
+    print(output, end="")
+    return code
+
+
+sys.exit(main())

@@ -1,0 +1,85 @@
+"""The checks of a run: a line for each that passes, the end of the run at the first that does not."""
+
+import time
+from typing import Any, Callable
+
+from consoles import Consoles
+from failure import CheckFailed
+
+POLL = 0.1  # seconds between two looks
+LONGEST = 3000  # characters of what was expected or seen that a failed run shows
+
+
+class Checks:
+    def __init__(self, consoles: Consoles, begin: float):
+        self._consoles = consoles
+        self._begin = begin
+        self.passed = 0
+
+    def elapsed(self) -> float:
+        return time.monotonic() - self._begin
+
+    def scene(self, title: str):
+        print(f"== {title}", flush=True)
+        self._consoles.note(f"== {title}")
+
+    def fact(self, text: str):
+        """Something worth knowing that nothing depends on."""
+        self._line("      ", text)
+
+    def that(self, what: str, holds: bool, expected: Any, seen: Any):
+        if not holds:
+            raise CheckFailed(what, describe(expected), describe(seen))
+        self.passed += 1
+        self._line("ok    ", what)
+
+    def equal(self, what: str, expected: Any, seen: Any):
+        self.that(what, expected == seen, expected, seen)
+
+    def within(self, limit: float, what: str, look: Callable[[], Any], expected: Any, since: float | None = None):
+        """Looks until it sees what is expected, in a look that begins at the latest `limit` seconds after `since`
+        (now, unless given): what the look itself takes on a busy machine is no fault of the nodes.
+
+        `expected` is a value, or for each node (or the one that is looked at) the members of its record that
+        matter, or a function that tells whether it is seen and whose documentation says what it stands for."""
+        start = time.monotonic() if since is None else since
+        while True:
+            begin_look = time.monotonic()
+            seen = look()
+            if begin_look - start > limit:
+                raise CheckFailed(what, f"within {limit} s: {describe(expected)}", describe(seen))
+            if matches(seen, expected):
+                self.passed += 1
+                return self._line("ok    ", f"{what} ({time.monotonic() - start:.1f} s)")
+            time.sleep(POLL)
+
+    def holds(self, duration: float, what: str, look: Callable[[], Any], expected: Any):
+        """Looks again and again: what is expected must be seen each time, for `duration` seconds."""
+        start = time.monotonic()
+        looks = 0
+        while looks < 3 or time.monotonic() - start < duration:
+            seen = look()
+            looks += 1
+            if not matches(seen, expected):
+                raise CheckFailed(what, f"for {duration} s: {describe(expected)}", describe(seen))
+        self.passed += 1
+        self._line("ok    ", f"{what} ({looks} looks in {time.monotonic() - start:.1f} s)")
+
+    def _line(self, mark: str, text: str):
+        print(f"{mark}{self.elapsed():6.1f} s  {text}", flush=True)
+        self._consoles.note(f"{mark}{text}")
+
+
+def matches(seen: Any, expected: Any) -> bool:
+    if callable(expected):
+        return expected(seen)
+    if isinstance(expected, list) and isinstance(seen, list):
+        return len(seen) == len(expected) and all(map(matches, seen, expected))
+    if isinstance(expected, dict) and isinstance(seen, dict):
+        return all(name in seen and seen[name] == value for name, value in expected.items())
+    return seen == expected
+
+
+def describe(value: Any) -> str:
+    text = value.__doc__ if callable(value) else str(value)
+    return text if len(text) <= LONGEST else f"... {text[-LONGEST:]}"

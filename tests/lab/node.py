@@ -1,0 +1,145 @@
+"""A node as the scenario sees it: commands that run on it, and what they tell."""
+
+import base64
+import json
+import socket
+import time
+from collections import deque
+from pathlib import Path
+
+from failure import LabError
+
+COMMAND_LIMIT = 30  # seconds, unless a command says otherwise
+
+
+class Channel:
+    """Runs scripts on a machine through its command channel, which goes on over a reboot."""
+
+    def __init__(self, name: str, path: Path):
+        self._name = name
+        self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
+        try:
+            self._socket.connect(str(path))
+        except OSError as error:
+            raise LabError(f"{path}: {error.strerror}") from None
+        self._input = b""
+        self._last_id = 0
+        self._boot_ids: deque[str] = deque()
+
+    def wait_for_boot(self, limit: float) -> str:
+        """Waits until the machine has come up once more, and returns the id of that boot."""
+        deadline = time.monotonic() + limit
+        while not self._boot_ids:
+            self._take_line(deadline, "come up")
+        return self._boot_ids.popleft()
+
+    def start(self, script: str) -> int:
+        self._last_id = time.monotonic_ns()  # differs from those that others have used on this channel
+        line = f"{self._last_id} {base64.b64encode(script.encode()).decode()}\n"
+        self._socket.settimeout(COMMAND_LIMIT)
+        try:
+            self._socket.sendall(line.encode())
+        except OSError as error:
+            raise LabError(f"{self._name} takes no command: {error}") from None
+        return self._last_id
+
+    def finish(self, script_id: int, limit: float = COMMAND_LIMIT) -> tuple[int, str]:
+        """The exit code and the output, standard error included, of a script that was started."""
+        deadline = time.monotonic() + limit
+        while True:
+            fields = self._take_line(deadline, "answer").split(" ")
+            if fields[0] == str(script_id) and len(fields) == 3:
+                return int(fields[1]), base64.b64decode(fields[2]).decode(errors="replace")
+
+    def close(self):
+        self._socket.close()
+
+    def _take_line(self, deadline: float, what: str) -> str:
+        while b"\n" not in self._input:
+            self._socket.settimeout(max(deadline - time.monotonic(), 0.001))
+            try:
+                data = self._socket.recv(65536)
+            except TimeoutError:
+                raise LabError(f"{self._name} did not {what} in time") from None
+            except OSError:
+                data = b""
+            if not data:
+                raise LabError(f"the emulator of {self._name} has ended")
+            self._input += data
+        line, _, self._input = self._input.partition(b"\n")
+        text = line.decode(errors="replace")
+        if text.startswith("hello "):
+            self._boot_ids.append(text.split()[1])
+        return text
+
+
+class Node:
+    """One of the two machines."""
+
+    def __init__(self, name: str, address: str, emulator, channel: Channel):
+        self.name = f"node-{name}"
+        self.address = address
+        self.emulator = emulator
+        self.channel = channel
+        self.boot_id = ""
+
+    def __str__(self):
+        return self.name
+
+    def wait_for_boot(self, limit: float = 60):
+        self.boot_id = self.channel.wait_for_boot(limit)
+
+    def run(self, script: str, limit: float = COMMAND_LIMIT) -> str:
+        """What the script prints; it must succeed."""
+        return self.result(script, self.channel.start(script), limit)
+
+    def result(self, script: str, script_id: int, limit: float = COMMAND_LIMIT) -> str:
+        code, output = self.channel.finish(script_id, limit)
+        if code != 0:
+            raise LabError(f"{self}: exit code {code} of: {script}\n{output}")
+        return output
+
+    def try_run(self, script: str) -> tuple[int, str]:
+        """The exit code and the output of the script."""
+        return self.channel.finish(self.channel.start(script))
+
+    def status(self) -> dict:
+        """What ternhactl tells of the node's record."""
+        return parse_status(self.run(STATUS))
+
+    def log(self) -> list[str]:
+        """The lines of the daemon log: those on disk, then those that are still buffered."""
+        return self.run("cat /var/log/ha/ha.daemon.log /tmp/ha/ha.daemon.log 2>/dev/null || true").splitlines()
+
+    def has_logged(self, text: str) -> bool:
+        return any(line.endswith(text) for line in self.log())
+
+    def drbd_state(self) -> str:
+        """The connection state of the resource, such as Connected; empty when it is not set up."""
+        return parse_drbd_state(self.run("cat /proc/drbd"))
+
+    def supervised(self) -> list[list[str]]:
+        """The supervisor's account: ["start", PID] and ["end", PID, EXIT-CODE]."""
+        return [line.split() for line in self.run("cat /run/lab/daemon").splitlines()]
+
+    def hold_daemon(self):
+        """The supervisor will not start the daemon once it has ended."""
+        self.run("touch /run/lab/hold")
+
+    def release_daemon(self):
+        self.run("rm -f /run/lab/hold")
+
+
+# A daemon that is being started, or killed, has no record for the moment.
+STATUS = "ternhactl status --json 2>/dev/null || echo null"
+
+
+def parse_status(text: str) -> dict:
+    return json.loads(text) or {}
+
+
+def parse_drbd_state(text: str) -> str:
+    for word in text.split():
+        if word.startswith("cs:"):
+            return word[3:]
+    return ""

@@ -1,0 +1,416 @@
+"""What happens to the two nodes, and what must be seen of it."""
+
+import base64
+import json
+import lzma
+import re
+import time
+
+from checks import Checks
+from lab import Lab
+from node import Node, parse_drbd_state, parse_status
+
+DEATH_LIMIT = 5  # seconds until a peer that says nothing counts as dead
+CUT_LIMIT = 8  # until both ends of a cut link have seen it
+RESYNC_LIMIT = 3  # until both nodes know of a resync
+RETURN_LIMIT = 20  # until everything is well again
+SOME_ROUNDS = 2  # seconds; the daemons look twice a second
+IDLE = 20  # seconds, of which the use of the processor is taken
+TICKS = 100  # of the processor's time, in a second
+
+ALIVE = {"isRemoteAlive": True}
+DEAD = {"isRemoteAlive": False}
+WELL = {"isRemoteAlive": True, "isDRBDConnect": True}
+APART = {"isRemoteAlive": False, "isDRBDConnect": False}
+
+SLOW_RESYNC = "echo 500 >/proc/sys/dev/raid/speed_limit_min; echo 500 >/proc/sys/dev/raid/speed_limit_max"
+FAST_RESYNC = "echo 200000 >/proc/sys/dev/raid/speed_limit_min; echo 200000 >/proc/sys/dev/raid/speed_limit_max"
+SYNC_ACTION = "cat /sys/block/md0/md/sync_action"
+
+
+def run(lab: Lab, checks: Checks):
+    for part in (
+        find_each_other,
+        initial_sync,
+        cut_link,
+        md_actions,
+        split_brain,
+        kill_daemon,
+        freeze_node,
+        unknown_request,
+        rotate_log,
+        reboot_peer,
+        measure,
+    ):
+        part(lab, checks)
+
+
+def find_each_other(lab: Lab, checks: Checks):
+    checks.scene("Two nodes start and find each other")
+    checks.equal("both run a 32-bit ARM kernel", ["armv7l\n"] * 2, lab.run("uname -m"))
+    check_tools(lab, checks)
+    lab.run(
+        "drbdadm --force create-md r0 && drbdadm up r0 && mdadm --create /dev/md0 --run --assume-clean --quiet"
+        " --level=1 --raid-devices=2 --metadata=1.2 /dev/disk/md0 /dev/disk/md1"
+    )
+    checks.within(RETURN_LIMIT, "DRBD is Connected on both", lambda: drbd_states(lab), ["Connected"] * 2)
+    lab.run("rm /run/lab/hold")
+    checks.within(RETURN_LIMIT, "both say alive and connected", lab.statuses, [WELL] * 2)
+    checks.within(
+        RETURN_LIMIT,
+        "both have logged the other's host name",
+        lambda: [
+            lab.a.has_logged(" Remote hostname is node-b"),
+            lab.b.has_logged(" Remote hostname is node-a"),
+        ],
+        [True] * 2,
+    )
+
+    def is_measured(records):
+        """a heartbeat latency above 0 and below 1000 ms, a non-OK rate of 0"""
+        return all(
+            0 < record.get("heartbeatLatency", 0) < 1000 and record["heartbeatPacketFailRate"] == 0
+            for record in records
+        )
+
+    checks.within(RETURN_LIMIT, "heartbeat latency above 0, non-OK rate 0", lab.statuses, is_measured)
+
+
+def check_tools(lab: Lab, checks: Checks):
+    names = {
+        "/bin/ping -V": "iputils",
+        "/sbin/ifconfig --version": "net-tools",
+        "/bin/ps --version": "procps-ng",
+        "/bin/df --version": "GNU coreutils",
+        "/bin/xz --version": "XZ Utils",
+    }
+    script = "; ".join(f"{command} 2>&1 | head -n 1" for command in names)
+    for output in lab.run(script):
+        for name, line in zip(names.values(), output.splitlines(), strict=True):
+            if name not in line:
+                checks.equal("ping, ifconfig, ps, df and xz are Debian's", list(names.values()), output)
+    checks.equal("ping, ifconfig, ps, df and xz are Debian's", True, True)
+
+
+def initial_sync(lab: Lab, checks: Checks):
+    checks.scene("DRBD copies the disk for the first time")
+    lab.a.run("drbdadm primary --force r0")
+    checks.within(RESYNC_LIMIT, "DRBD is SyncSource on one, SyncTarget on the other", lambda: drbd_states(lab),
+                  ["SyncSource", "SyncTarget"])
+    checks.holds(
+        SOME_ROUNDS,
+        "the sync counts as connected",
+        lambda: connected_during_state(lab),
+        [("SyncSource", True), ("SyncTarget", True)],
+    )
+    lab.run("drbdadm disk-options --resync-rate=8M r0")
+    checks.within(RETURN_LIMIT, "the sync ends: DRBD is Connected, both disks up to date",
+                  lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
+    checks.holds(SOME_ROUNDS, "both still say alive and connected", lab.statuses, [WELL] * 2)
+    lab.run("drbdadm disk-options --resync-rate=2M r0")
+
+
+def cut_link(lab: Lab, checks: Checks):
+    checks.scene("The link is cut, and joined again")
+    begin = time.monotonic()
+    lab.set_link(False)
+    checks.within(CUT_LIMIT, "both say dead and not connected after the cut", lab.statuses, [APART] * 2, begin)
+    for node in lab.nodes:
+        checks.equal(
+            f"{node} has logged it",
+            "Remote server status changed to dead",
+            last_change(node),
+        )
+    begin = time.monotonic()
+    lab.set_link(True)
+    checks.within(
+        RETURN_LIMIT, "both say alive and connected after the join", lab.statuses, [WELL] * 2, begin
+    )
+
+
+def md_actions(lab: Lab, checks: Checks):
+    checks.scene("The md mirror of node-b: resync counts, check and recover do not")
+    none = [{"isMDResync": False, "isRemoteMDResync": False}] * 2
+    checks.within(RESYNC_LIMIT, "no resync yet", lab.statuses, none)
+    lab.b.run(
+        f"{SLOW_RESYNC}; mdadm --quiet --stop /dev/md0 &&"
+        " mdadm --quiet --assemble /dev/md0 --update=resync /dev/disk/md0 /dev/disk/md1"
+    )
+    begin = resync_begin(lab.b)
+    checks.within(
+        RESYNC_LIMIT,
+        "resync: known to itself, and to the peer",
+        lab.statuses,
+        [{"isMDResync": False, "isRemoteMDResync": True}, {"isMDResync": True, "isRemoteMDResync": False}],
+        begin,
+    )
+    checks.equal("md says resync", "resync", lab.b.run(SYNC_ACTION).strip())
+    check_snapshot(lab.a, checks, "isRemoteMDResync")
+    check_snapshot(lab.b, checks, "isMDResync")
+    lab.b.run(FAST_RESYNC)
+    checks.within(RETURN_LIMIT, "md has ended the resync", lambda: lab.b.run(SYNC_ACTION).strip(), "idle")
+    checks.within(DEATH_LIMIT, "gone on both when it ends", lab.statuses, none)
+
+    lab.b.run(f"{SLOW_RESYNC}; echo check >/sys/block/md0/md/sync_action")
+    check_uncounted(lab, checks, "check")
+    lab.b.run(f"{FAST_RESYNC}; echo idle >/sys/block/md0/md/sync_action")
+    lab.b.run(
+        f"{SLOW_RESYNC}; disk=$(readlink -f /dev/disk/md1); mdadm --quiet /dev/md0 --fail $disk &&"
+        " mdadm --quiet /dev/md0 --remove $disk && mdadm --quiet --zero-superblock $disk &&"
+        " mdadm --quiet /dev/md0 --add $disk"
+    )
+    check_uncounted(lab, checks, "recover")
+    lab.b.run(FAST_RESYNC)
+    checks.within(RETURN_LIMIT, "md has ended the recovery", lambda: lab.b.run(SYNC_ACTION).strip(), "idle")
+
+
+def resync_begin(node: Node) -> float:
+    """When md began its latest resync, by this machine's clock; the node's own program takes a while to end."""
+    message, uptime = node.run(
+        "dmesg | grep 'md: resync of RAID array md0' | tail -n 1; cat /proc/uptime"
+    ).splitlines()
+    age = float(uptime.split()[0]) - float(message.strip("[").split("]")[0])
+    return time.monotonic() - age
+
+
+def check_uncounted(lab: Lab, checks: Checks, action: str):
+    checks.within(RESYNC_LIMIT, f"md says {action}", lambda: lab.b.run(SYNC_ACTION).strip(), action)
+
+    def look():
+        started = lab.a.channel.start("ternhactl status --json")
+        before, record, after = lab.b.run(f"{SYNC_ACTION}; ternhactl status --json; {SYNC_ACTION}").splitlines()
+        peer_record = json.loads(lab.a.result("status", started))
+        return before, json.loads(record)["isMDResync"], after, peer_record["isRemoteMDResync"]
+
+    checks.holds(SOME_ROUNDS, f"{action} does not count", look, (action, False, action, False))
+
+
+def check_snapshot(node: Node, checks: Checks, flag: str):
+    """A snapshot begins with the record in which the flag is set."""
+    parts = [
+        rf'^\{{.*"{flag}":true.*\}}$',
+        r"^ *\d+ .* ternhad --config",
+        r"^/dev/vd.* \d+% /var/log/ha$",
+        r"^MemTotal: +\d+ kB$",
+    ]
+
+    def is_complete(record):
+        """a record with the flag, then ternhad among the processes, /var/log/ha among the file systems, memory"""
+        position = 0
+        for part in parts:
+            found = re.compile(part, re.MULTILINE).search(record, position)
+            if not found:
+                return False
+            position = found.end()
+        return True
+
+    checks.within(
+        DEATH_LIMIT,
+        f"{node} has recorded {flag}, processes, file systems and memory",
+        lambda: node.run("cat /var/log/ha/ha.daemon.record /tmp/ha/ha.daemon.record 2>/dev/null || true"),
+        is_complete,
+    )
+
+
+def split_brain(lab: Lab, checks: Checks):
+    checks.scene("Split brain: both nodes write while the link is cut")
+    lab.set_link(False)
+    checks.within(CUT_LIMIT, "both say dead and not connected", lab.statuses, [APART] * 2)
+    lab.b.run("drbdadm primary r0")
+    lab.run("dd if=/dev/urandom of=/dev/drbd0 bs=4096 count=4 conv=fsync 2>/dev/null && drbdadm secondary r0")
+    lab.set_link(True)
+
+    def is_refused(states):
+        """StandAlone on one node or both, and on neither a state in which they are linked"""
+        return "StandAlone" in states and set(states) <= {"StandAlone", "WFConnection"}
+
+    checks.within(RETURN_LIMIT, "DRBD refuses to connect: StandAlone", lambda: drbd_states(lab), is_refused)
+    checks.within(
+        RETURN_LIMIT, "both say alive, but not connected", lab.statuses, [ALIVE | {"isDRBDConnect": False}] * 2
+    )
+    checks.holds(
+        SOME_ROUNDS,
+        "and it stays so",
+        lab.statuses,
+        [ALIVE | {"isDRBDConnect": False}] * 2,
+    )
+    checks.that("DRBD is still StandAlone", is_refused(drbd_states(lab)), is_refused.__doc__, drbd_states(lab))
+    lab.b.run("drbdadm disconnect r0; drbdadm connect --discard-my-data r0")
+    lab.a.run("drbdadm disconnect r0; drbdadm connect r0")
+    checks.within(RETURN_LIMIT, "resolved: both say connected again", lab.statuses, [WELL] * 2)
+    checks.within(RETURN_LIMIT, "and both disks are up to date", lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
+
+
+def kill_daemon(lab: Lab, checks: Checks):
+    checks.scene("The daemon of node-b is killed")
+    lab.b.hold_daemon()
+    begin = time.monotonic()
+    lab.b.run("kill -KILL $(cat /run/lab/pid)")
+    checks.within(DEATH_LIMIT, "node-a says dead", lab.a.status, DEAD | {"isDRBDConnect": True}, begin)
+    checks.equal("the supervisor saw it killed", "137", lab.b.supervised()[-1][-1])
+    lab.b.release_daemon()
+    checks.within(RETURN_LIMIT, "both say alive when it is started again", lab.statuses, [WELL] * 2)
+
+
+def freeze_node(lab: Lab, checks: Checks):
+    checks.scene("node-b is frozen: its emulator stands still")
+    begin = time.monotonic()
+    lab.b.emulator.freeze()
+    checks.within(DEATH_LIMIT, "node-a says dead", lab.a.status, DEAD, begin)
+    lab.b.emulator.thaw()
+    checks.within(RETURN_LIMIT, "both say alive and connected when it goes on", lab.statuses, [WELL] * 2)
+
+
+def unknown_request(lab: Lab, checks: Checks):
+    checks.scene("node-a sends node-b a request that does not exist")
+    pid = lab.b.run("cat /run/lab/pid").strip()
+    lab.a.run(f"ternha-lab-tool send {lab.b.address} no_such_request")
+    checks.within(
+        DEATH_LIMIT,
+        "the daemon has ended by SIGABRT and the supervisor has started another",
+        lambda: without_pids(lab.b.supervised()[-2:]),
+        [["end", "134"], ["start"]],
+    )
+    ended, started = lab.b.supervised()[-2:]
+    is_other = ended[1] == pid != started[1]
+    checks.that("it was that daemon, and is another now", is_other, f"the end of {pid}", [ended, started])
+    checks.within(RETURN_LIMIT, "both say alive", lab.statuses, [WELL] * 2)
+
+
+def rotate_log(lab: Lab, checks: Checks):
+    checks.scene("200 lines go into the log of node-a, which is moved and rotated")
+    node = lab.a
+    checks.equal("there is no archive yet", "", node.run("ls /var/log/ha | grep xz || true"))
+    node.run("ternha-lab-tool log 1 200")
+    expected = [f"lab line {number}" for number in range(1, 201)]
+    before = node.log()
+    checks.equal("they are in the log", expected, lab_lines(before))
+    archive = "/var/log/ha/ha.daemon.log.0.xz"
+    node.run("kill -HUP $(cat /run/lab/pid)")
+    checks.within(
+        RETURN_LIMIT,
+        "there is one archive of the log, and no log",
+        lambda: node.run("cd /var/log/ha && ls ha.daemon.log*").split(),
+        ["ha.daemon.log.0.xz"],
+    )
+    unpacked = node.run(f"/bin/xz --decompress --stdout {archive}")
+    packed = base64.b64decode(node.run(f"base64 {archive}"))
+    checks.equal(
+        "it is in xz's format: unpacked elsewhere it is the same",
+        unpacked,
+        lzma.decompress(packed, lzma.FORMAT_XZ).decode(),
+    )
+    checks.equal("it unpacks to the 200 lines", expected, lab_lines(unpacked.splitlines()))
+    checks.equal("and to all the lines that there were", before, unpacked.splitlines()[: len(before)])
+
+
+def reboot_peer(lab: Lab, checks: Checks):
+    checks.scene("node-a orders the reboot of node-b")
+    lab.b.run("ternha-lab-tool log 201 250")
+    on_disk = "cat /var/log/ha/ha.daemon.log 2>/dev/null || true"
+    expected = [f"lab line {number}" for number in range(201, 251)]
+    checks.equal("50 lines are not on the disk of node-b yet", [], lab_lines(lab.b.run(on_disk).splitlines()))
+    resets = len(lab.b.emulator.events("RESET"))
+    boot_id = lab.b.boot_id
+    before = lab.b.log()
+    checks.equal("but in its log", expected, lab_lines(before))
+
+    # The three at once: the node is up again soon.
+    order, rebooting, record = lab.a.run(
+        "ternhactl reboot-peer --yes | tail -n 1; ternhactl rebooting || true; ternhactl status --json", 45
+    ).splitlines()
+    checks.equal("the order is carried out", "The peer counts as rebooting until it answers again.", order)
+    checks.equal("node-a says rebooting", "yes", rebooting)
+    checks.equal("and dead", False, parse_status(record)["isRemoteAlive"])
+    checks.that("node-a has logged it", lab.a.has_logged(" Remote offline"), "Remote offline", lab.a.log()[-5:])
+
+    lab.b.wait_for_boot()
+    new_resets = lab.b.emulator.events("RESET")[resets:]
+    checks.equal(
+        "the emulator saw the guest reset itself, once",
+        [{"guest": True, "reason": "guest-reset"}],
+        [event["data"] for event in new_resets],
+    )
+    checks.that("node-b has another boot id", lab.b.boot_id != boot_id, f"other than {boot_id}", lab.b.boot_id)
+    after = lab.b.run(on_disk).splitlines()
+    checks.equal("the 50 lines are on its disk", expected, lab_lines(after))
+    checks.equal("and every other line up to the order", before, after[: len(before)])
+
+    lab.b.run("mdadm --quiet --assemble /dev/md0 /dev/disk/md0 /dev/disk/md1 && drbdadm up r0")
+    lab.b.release_daemon()
+    checks.within(RETURN_LIMIT, "both say alive and connected", lab.statuses, [WELL] * 2)
+    checks.equal("node-a no longer says rebooting", (1, "no\n"), lab.a.try_run("ternhactl rebooting"))
+
+
+def measure(lab: Lab, checks: Checks):
+    checks.scene("What ternhad takes")
+    for node in lab.nodes:
+        resident, anonymous = memory(node)
+        checks.fact(f"memory on {node}: {resident} KiB resident, {anonymous} KiB of it anonymous")
+    lab.run("sed -i /interval/d /etc/ternha/ternhad.conf && kill -TERM $(cat /run/lab/pid)")
+    checks.within(
+        RETURN_LIMIT,
+        "both have ended in order, and been started again with the default intervals",
+        lambda: [without_pids(node.supervised()[-2:]) for node in lab.nodes],
+        [[["end", "0"], ["start"]]] * 2,
+    )
+    checks.within(RETURN_LIMIT, "both say alive and connected", lab.statuses, [WELL] * 2)
+    before = processor_use(lab)
+    begin = time.monotonic()
+    time.sleep(IDLE)
+    after = processor_use(lab)
+    hour = 3600 / (time.monotonic() - begin)
+    for node, (own, children), (own_before, children_before) in zip(lab.nodes, after, before):
+        checks.fact(
+            f"idle, emulated, on {node}: {(own - own_before) * hour:.0f} CPU seconds per hour,"
+            f" and {(children - children_before) * hour:.0f} in the programs that it runs"
+        )
+
+
+def without_pids(entries: list[list[str]]) -> list[list[str]]:
+    return [entry[:1] + entry[2:] for entry in entries]
+
+
+def memory(node: Node) -> tuple[int, int]:
+    """The resident memory of the daemon and the anonymous part of it, KiB."""
+    fields = dict(
+        line.split(":", 1) for line in node.run("cat /proc/$(cat /run/lab/pid)/status").splitlines()
+    )
+    return int(fields["VmRSS"].split()[0]), int(fields["RssAnon"].split()[0])
+
+
+def processor_use(lab: Lab) -> list[tuple[float, float]]:
+    """For each node the processor's time, in seconds, that the daemon and its ended children have taken."""
+    outputs = lab.run("cat /proc/$(cat /run/lab/pid)/stat")
+    times = [list(map(int, output.rpartition(")")[2].split()[11:15])) for output in outputs]
+    return [((user + system) / TICKS, (c_user + c_system) / TICKS) for user, system, c_user, c_system in times]
+
+
+def drbd_states(lab: Lab) -> list[str]:
+    return [parse_drbd_state(output) for output in lab.run("cat /proc/drbd")]
+
+
+def drbd_disks(lab: Lab) -> list[str]:
+    """For each node the states of its own and the peer's disk, while Connected."""
+    found = [re.search(r"cs:Connected .* ds:(\S+)", output) for output in lab.run("cat /proc/drbd")]
+    return [match.group(1) if match else "" for match in found]
+
+
+def connected_during_state(lab: Lab) -> list[tuple[str, bool]]:
+    """For each node the DRBD state that held before and after it was asked, and whether it said connected."""
+    looks = []
+    for output in lab.run("grep cs: /proc/drbd; ternhactl status --json; grep cs: /proc/drbd"):
+        before, record, after = output.splitlines()
+        states = {parse_drbd_state(before), parse_drbd_state(after)}
+        looks.append(("/".join(sorted(states)), parse_status(record)["isDRBDConnect"]))
+    return looks
+
+
+def last_change(node: Node) -> str:
+    changes = [line for line in node.log() if "Remote server status changed" in line]
+    return changes[-1].split(" ", 2)[2] if changes else ""
+
+
+def lab_lines(lines: list[str]) -> list[str]:
+    """The lines that the lab's own tool has logged, without their times."""
+    return [line.split(" ", 1)[1] for line in lines if " lab line " in line]
