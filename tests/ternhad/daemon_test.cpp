@@ -12,8 +12,10 @@
 
 #include <algorithm>
 #include <atomic>
+#include <cstdio>
 #include <filesystem>
 #include <functional>
+#include <map>
 #include <thread>
 
 #include "support/sandbox.h"
@@ -336,6 +338,53 @@ TEST_F(DaemonTest, AnUnknownQuestionEndsItBySignal) {
     const auto status = daemon.waitFor(10s);
     ASSERT_TRUE(status.has_value());
     EXPECT_TRUE(WIFSIGNALED(*status) && WTERMSIG(*status) == SIGABRT) << *status;
+}
+
+// The answers that have come back to a socket so far, each of which must be `expected`.
+int answersAt(test::UdpSocket& socket, const std::string& expected, std::chrono::milliseconds limit) {
+    int count = 0;
+    while (const auto answer = socket.receive(limit)) {
+        EXPECT_EQ(answer->bytes, expected);
+        ++count;
+    }
+    return count;
+}
+
+TEST_F(DaemonTest, AFloodOfQuestionsGetsNoAnswerTwiceOrForSomebodyElse) {
+    test::writeFile("/tmp/.ha.hostname.original", "node-a");
+    auto daemon = startAndWait();
+    const std::map<std::string, std::string> answers = {
+        {"is_alive", "alive"},
+        {"is_md_resync", "not_resync"},
+        {"is_disk_err_handling", R"({"errHandlingDisk":[],"isDiskErrHandling":false})"},
+        {"remote_hostname", "node-a"}};
+    constexpr int QUESTIONS = 25000;
+    std::vector<std::thread> askers;
+    std::atomic<int> answered{0};
+    for (const auto& [question, expected] : answers) {
+        askers.emplace_back([&, question = question, expected = expected] {
+            test::UdpSocket socket("127.0.0.2");
+            int own = 0;
+            for (int i = 0; i < QUESTIONS; ++i) {
+                socket.send(question, "127.0.0.1", 7499);
+                if (i % 50 == 0) {
+                    own += answersAt(socket, expected, 0ms);
+                }
+            }
+            own += answersAt(socket, expected, 1s);
+            EXPECT_GT(own, 0);
+            EXPECT_LE(own, QUESTIONS);
+            // And now, that all is quiet, one answer for one question.
+            socket.send(question, "127.0.0.1", 7499);
+            EXPECT_EQ(answersAt(socket, expected, 1s), 1);
+            answered += own;
+        });
+    }
+    for (std::thread& asker : askers) {
+        asker.join();
+    }
+    std::printf("%d of %d questions answered\n", answered.load(), 4 * QUESTIONS);
+    stop(daemon);
 }
 
 TEST_F(DaemonTest, KnowsItsOwnTroubles) {
