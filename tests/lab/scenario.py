@@ -37,6 +37,7 @@ def run(lab: Lab, checks: Checks):
         split_brain,
         kill_daemon,
         freeze_node,
+        step_clock,
         unknown_request,
         rotate_log,
         reboot_peer,
@@ -259,6 +260,21 @@ def freeze_node(lab: Lab, checks: Checks):
     checks.within(DEATH_LIMIT, "node-a says dead", lab.a.status, DEAD, begin)
     lab.b.emulator.thaw()
     checks.within(RETURN_LIMIT, "both say alive and connected when it goes on", lab.statuses, [WELL] * 2)
+
+
+def step_clock(lab: Lab, checks: Checks):
+    checks.scene("The wall clock of node-b is stepped by an hour")
+
+    def changes():
+        return [len([line for line in node.log() if "Remote server status changed" in line]) for node in lab.nodes]
+
+    before = changes()
+    for direction, seconds in (("forward", "+ 3600"), ("back", "- 3600")):
+        lab.b.run(f"date -s @$(($(date +%s) {seconds})) >/dev/null")
+        checks.holds(
+            DEATH_LIMIT, f"{direction}: both still say alive and connected", lab.statuses, [WELL] * 2
+        )
+    checks.equal("neither has counted the other as dead meanwhile", before, changes())
 
 
 def unknown_request(lab: Lab, checks: Checks):
