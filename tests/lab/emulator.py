@@ -21,10 +21,10 @@ class Emulator:
         initrd: Path,
         disks: dict[str, Path],
         link: socket.socket,
-        agent: Path,
+        channel: Path,
     ):
         """Starts the machine called `name`. `disks` are images by serial number, `link` is the datagram socket
-        that its network interface is joined to, `agent` the path at which its command channel will listen."""
+        that its network interface is joined to, `channel` the path at which its command channel will listen."""
         self.name = name
         self.console, console = socket.socketpair()
         self._control, control = socket.socketpair()
@@ -40,8 +40,8 @@ class Emulator:
             "-kernel", kernel, "-initrd", initrd, "-append", f"console=ttyAMA0 quiet panic=5 node={name}",
             "-chardev", f"socket,id=console,fd={console.fileno()}", "-serial", "chardev:console",
             "-chardev", f"socket,id=control,fd={control.fileno()}", "-mon", "chardev=control,mode=control",
-            "-chardev", f"socket,id=agent,path={agent},server=on,wait=off",
-            "-device", "virtio-serial-device", "-device", "virtserialport,chardev=agent,name=agent",
+            "-chardev", f"socket,id=channel,path={channel},server=on,wait=off",
+            "-device", "virtio-serial-device", "-device", "virtserialport,chardev=channel,name=channel",
             "-device", "virtio-rng-device",
             "-netdev", f"dgram,id=link,local.type=fd,local.str={link.fileno()}",
             "-device", f"virtio-net-device,netdev=link,mac=52:54:00:00:00:{ord(name):02x}",

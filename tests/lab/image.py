@@ -130,7 +130,7 @@ def _system(packages: Path) -> bytes:
     _add_modules(archive, packages)
 
     archive.file("init", (GUEST / "init").read_bytes(), 0o755)
-    for name in ("agent", "supervisor"):
+    for name in ("channel", "supervisor"):
         archive.file(f"usr/lib/lab/{name}", (GUEST / name).read_bytes(), 0o755)
     archive.file("etc/drbd.conf", (GUEST / "drbd.conf").read_bytes())
     return archive.compressed()

@@ -68,11 +68,11 @@ class Lab:
         system.write_bytes(self._archive)
         links = _link()
         for index, name in enumerate("ab"):
-            agent = self.directory / f"node-{name}"
-            emulator = Emulator(name, self._kernel, system, self._make_disks(name), links[index], agent)
+            channel = self.directory / f"node-{name}"
+            emulator = Emulator(name, self._kernel, system, self._make_disks(name), links[index], channel)
             self._emulators.append(emulator)
             self._consoles.follow(name, emulator.console)
-            self.nodes.append(Node(name, f"10.11.0.{index + 1}", emulator, Channel(f"node-{name}", agent)))
+            self.nodes.append(Node(name, f"10.11.0.{index + 1}", emulator, Channel(f"node-{name}", channel)))
         for link in links:
             link.close()
         for node in self.nodes:
