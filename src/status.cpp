@@ -25,9 +25,11 @@ std::chrono::system_clock::time_point wallClock() {
 // Waits up to `timeout` seconds for `mutex`. The lock may come back without it: whoever asked goes ahead all
 // the same.
 Lock lockFor(std::timed_mutex& mutex, std::int32_t timeout) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(timeout);
-    Lock lock(mutex, std::defer_lock);
-    (void)lock.try_lock_until(wallClock() + (deadline - std::chrono::steady_clock::now()));
+    Lock lock(mutex, std::try_to_lock);
+    if (!lock.owns_lock()) {
+        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(timeout);
+        (void)lock.try_lock_until(wallClock() + (deadline - std::chrono::steady_clock::now()));
+    }
     return lock;
 }
 
