@@ -1,5 +1,6 @@
 #include "options.h"
 
+#include <arpa/inet.h>
 #include <net/if.h>
 #include <sys/un.h>
 
@@ -10,6 +11,12 @@ namespace ternhad {
 namespace {
 
 constexpr int WRONG_USAGE = 2;
+
+// As the library reads it: text that is no address to it, such as 010.0.0.1, would count as 0.0.0.0.
+std::string checkAddress(const std::string& text) {
+    in_addr address = {};
+    return inet_pton(AF_INET, text.c_str(), &address) == 1 ? "" : "not an IPv4 address: " + text;
+}
 
 // A path that is bound as it is: neither relative to wherever the process stands nor cut.
 std::string checkSocketPath(const std::string& path) {
@@ -53,11 +60,11 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
 
     app.add_option("--local-ip", options.localIp, "This node's address on the replication link")
         ->required()
-        ->check(CLI::ValidIPV4)
+        ->check(checkAddress)
         ->type_name("ADDRESS");
     app.add_option("--remote-ip", options.remoteIp, "The peer's address on the replication link")
         ->required()
-        ->check(CLI::ValidIPV4)
+        ->check(checkAddress)
         ->type_name("ADDRESS");
     app.add_option("--interface", options.interface, "The network interface of the replication link")
         ->required()

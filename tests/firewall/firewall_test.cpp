@@ -80,6 +80,8 @@ INSTANTIATE_TEST_SUITE_P(
                            "remote-ip is wrong: 10.0.0.0/8"},
         WrongConfiguration{"BigOctet", "local-ip = 10.0.0.1\nremote-ip = 10.0.0.256\ninterface = eth1\n",
                            "remote-ip is wrong: 10.0.0.256"},
+        WrongConfiguration{"LeadingZero", "local-ip = 10.0.0.1\nremote-ip = 10.0.0.02\ninterface = eth1\n",
+                           "remote-ip is wrong: 10.0.0.02"},
         WrongConfiguration{
             "TwoPeers", "local-ip = 10.0.0.1\nremote-ip = 10.0.0.2\nremote-ip = 10.0.0.3\ninterface = eth1\n",
             "remote-ip is wrong: 10.0.0.2\n10.0.0.3"},
