@@ -142,7 +142,7 @@ std::string DaemonLog::_formatedTime() const {
     std::array<char, 8> zone = {};
     (void)std::strftime(dateTime.data(), dateTime.size(), "%Y-%m-%dT%H:%M:%S", &local);
     (void)std::strftime(zone.data(), zone.size(), "%z", &local);
-    const std::string stamp = std::string(dateTime.data()) + std::string(zone.data()).insert(3, ":");
+    std::string stamp = std::string(dateTime.data()) + std::string(zone.data()).insert(3, ":");
 
     last.text = {};
     stamp.copy(last.text.data(), last.text.size() - 1);
