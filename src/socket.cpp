@@ -158,7 +158,9 @@ bool DaemonLocalSocket::_clientConnect() {
         timeval timeout = {};
         timeout.tv_sec = _timeout;
         if (setsockopt(_fd, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout) == -1) {
+            const int error = errno;
             syslog(LOG_ERR, "%s:%d Failed to set socket timeout", __FILE_NAME__, __LINE__);
+            errno = error;  // for the caller's own line
             _hasError = true;
             return false;
         }
