@@ -11,7 +11,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <mutex>
-#include <sstream>
+#include <new>
 #include <string_view>
 #include <vector>
 
@@ -61,12 +61,15 @@ bool readLine(const CommandPipe& pipe, Line& line) {
     return std::fgets(line.data(), static_cast<int>(line.size()), pipe._fp) != nullptr;
 }
 
-std::vector<std::string> split(const char* line) {
-    std::istringstream stream(line);
+// The words between blanks. Not by a stream, which would take a lack of memory for the end of the line.
+std::vector<std::string> split(std::string_view line) {
+    constexpr std::string_view BLANKS = " \t\n\v\f\r";
     std::vector<std::string> tokens;
-    std::string token;
-    while (stream >> token) {
-        tokens.push_back(token);
+    std::size_t begin = 0;
+    while ((begin = line.find_first_not_of(BLANKS, begin)) != std::string_view::npos) {
+        const std::size_t end = std::min(line.find_first_of(BLANKS, begin), line.size());
+        tokens.emplace_back(line.substr(begin, end - begin));
+        begin = end;
     }
     return tokens;
 }
@@ -184,8 +187,12 @@ std::string RebootRemote::getType() {
 }
 
 std::string RebootRemote::handle(Status&) {
-    daemonLog->writeLogToDisk();
-    recordLog->writeLogToDisk();
+    try {
+        daemonLog->writeLogToDisk();
+        recordLog->writeLogToDisk();
+    } catch (const std::bad_alloc&) {
+        // A node that is out of memory is one to be restarted: its logs are not worth waiting for.
+    }
     sync();  // the kernel restarts without flushing or unmounting anything
     const File trigger("/proc/sysrq-trigger", O_WRONLY | O_CREAT | O_TRUNC);
     if (trigger.isOpen()) {
@@ -319,7 +326,11 @@ CommandPipe::~CommandPipe() {
         _fp = nullptr;
         return;
     }
-    HA_LOG("Failed to exec " + _command + " return code: " + std::to_string(status));
+    try {
+        HA_LOG("Failed to exec " + _command + " return code: " + std::to_string(status));
+    } catch (const std::bad_alloc&) {
+        return;  // a destructor that throws would end the process
+    }
 }
 
 float heartbeatLatency() {

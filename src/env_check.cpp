@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
 
 #include "chkstate.h"
 #include "ha_log.h"
@@ -76,15 +77,11 @@ bool SocketServer::operator()(TERN::HA::Daemon::Status& status) {
     if (entry == CheckerFactory::opMap->end()) {
         std::abort();
     }
-    EnvCheck* const check = entry->second();
+    // Checks have neither members nor destructors, so that deleting one needs no virtual destructor.
+    const std::unique_ptr<EnvCheck> check(entry->second());
     if (server.socket.Send(check->handle(status)) == -1) {
         HA_LOG("Failed to sendto");
     }
-// Checks have neither members nor destructors, so that this is sound without a virtual one.
-#pragma GCC diagnostic push
-#pragma GCC diagnostic ignored "-Wdelete-non-virtual-dtor"
-    delete check;
-#pragma GCC diagnostic pop
     return true;
 }
 

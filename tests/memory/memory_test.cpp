@@ -1,0 +1,388 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <json/value.h>
+
+#include <chrono>
+#include <filesystem>
+#include <functional>
+#include <memory>
+#include <new>
+#include <optional>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "checker.h"
+#include "control.h"
+#include "env_check.h"
+#include "env_check/peer.h"
+#include "ha_log.h"
+#include "memory/failing_memory.h"
+#include "socket/local_sockets.h"
+#include "support/files.h"
+#include "support/programs.h"
+#include "support/sandbox.h"
+#include "support/system_log.h"
+#include "support/udp.h"
+#include "util.h"
+
+// Memory runs out once in each operation, at each place where it asks for some: it ends with std::bad_alloc
+// or with the result of a failure, nothing stays open, locked or half done, and the next time all is well.
+
+namespace {
+
+using namespace TERN::HA::Daemon;
+
+constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
+constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";
+constexpr char TRIGGER[] = "/proc/sysrq-trigger";
+constexpr char OUT_OF_MEMORY[] = "out of memory";
+
+// An operation, whose result is a text. What can be seen of it belongs to the result.
+struct Operation {
+    std::string name;
+    std::function<void()> prepare;
+    std::function<std::string()> run;
+    std::string result;                   // with enough memory
+    std::set<std::string> failures = {};  // results without, beside the exception
+    std::function<std::string()> look = [] { return std::string(); };  // what it leaves behind
+    std::string left = "";                                             // with enough memory
+    std::set<std::string> leavings = {};                               // the others
+};
+
+std::string yesNo(bool value) {
+    return value ? "yes" : "no";
+}
+
+class MemoryTest : public test::SandboxTest {
+ protected:
+    void SetUp() override {
+        test::SandboxTest::SetUp();
+        systemLog = std::make_unique<test::SystemLog>();
+    }
+
+    void TearDown() override {
+        systemLog.reset();
+        test::SandboxTest::TearDown();
+    }
+
+    static std::string runWithout(const Operation& operation, int number, bool& hasFailed) {
+        const test::FailingMemory memory(number);
+        std::string result;
+        try {
+            result = operation.run();
+            hasFailed = memory.hasFailed();
+        } catch (const std::bad_alloc&) {
+            hasFailed = true;
+            return OUT_OF_MEMORY;
+        }
+        return result;
+    }
+
+    static void expectWhole(const Operation& operation) {
+        bool hasFailed = true;
+        for (int number = 1; hasFailed; ++number) {
+            SCOPED_TRACE(operation.name + ", request number " + std::to_string(number));
+            operation.prepare();
+            const std::string result = runWithout(operation, number, hasFailed);
+            if (hasFailed) {
+                EXPECT_TRUE(result == OUT_OF_MEMORY || result == operation.result ||
+                            operation.failures.count(result) == 1)
+                    << result;
+                const std::string left = operation.look();
+                EXPECT_TRUE(left == operation.left || operation.leavings.count(left) == 1) << left;
+                operation.prepare();
+                EXPECT_EQ(operation.run(), operation.result) << "the next time";
+            } else {
+                EXPECT_GT(number, 1) << "no need for memory";
+                EXPECT_EQ(result, operation.result);
+            }
+            EXPECT_EQ(operation.look(), operation.left);
+        }
+    }
+
+    std::unique_ptr<test::SystemLog> systemLog;
+};
+
+// ---- The checks of this node ----
+
+TEST_F(MemoryTest, LocalChecks) {
+    const std::string disk = "/sys/devices/pci0/ata1/host0/target0:0:0/0:0:0:0/block/sda";
+    test::makeDirectories(disk);
+    std::filesystem::create_symlink(disk, "/sys/block/sda");
+    test::writeFile("/sys/block/md0/md/sync_action", "resync\n");
+    test::writeFile("/sys/class/ata_port/ata1/error_handling", "1\n");
+    test::writeFile("/tmp/ha/info_hd.remote", R"({"3":{"HD_DEVNAME":"sda"}})");
+
+    expectWhole({"isDRBDConnect", [] { test::writeFile("/proc/drbd", " 0: cs:Connected\n"); },
+                 [] { return yesNo(isDRBDConnect()); }, "yes"});
+    expectWhole({"isDRBDConnect without DRBD", [] { test::removeTree("/proc/drbd"); },
+                 [] { return yesNo(isDRBDConnect()); }, "no"});
+    expectWhole({"isMDResync", [] {}, [] { return yesNo(isMDResync()); }, "yes"});
+    expectWhole({"isDiskErrHandling",
+                 [] {},
+                 [] {
+                     Json::Value disks;
+                     const bool isHandling = isDiskErrHandling(disks);
+                     return yesNo(isHandling) + " " + std::to_string(disks.size());
+                 },
+                 "yes 1",
+                 {"no 0"}});
+    expectWhole({"devListToHumanReadable", [] {}, [] { return Util::devListToHumanReadable({"sda"}).at(0); },
+                 "Disk 3"});
+}
+
+// ---- Programs ----
+
+TEST_F(MemoryTest, Programs) {
+    remoteIP("127.0.0.2");
+    drbdIF("eth1");
+    test::replaceProgram("/bin/ping", "echo 'rtt min/avg/max/mdev = 0.1/2.5/0.3/0.4 ms'; exit 1");
+    // Names that need memory of their own.
+    test::replaceProgram("/sbin/ifconfig",
+                         "echo 'Iface MTU RX-OK-by-the-interface RX-ERR-by-the-interface'\n"
+                         "echo 'eth1 1500 60 40'");
+    test::replaceProgram("/bin/df", "echo disks");
+
+    expectWhole({"heartbeatLatency",
+                 [] {},
+                 [] { return std::to_string(heartbeatLatency()); },
+                 "2.500000",
+                 {"0.000000"}});
+    expectWhole({"networkNonOkRate",
+                 [] {},
+                 [] {
+                     InterfaceChecker interface;
+                     float rate = -1;
+                     const bool isKnown = interface.networkNonOkRate(rate);
+                     return yesNo(isKnown) + " " + std::to_string(rate);
+                 },
+                 "yes 0.400000",
+                 {"no -1.000000"}});
+    expectWhole({"recordDF",
+                 [] { test::removeTree("/tmp/ha/ha.daemon.record"); },
+                 [] {
+                     recordDF();
+                     return "";
+                 },
+                 "",
+                 {},
+                 [] {
+                     const bool isThere = test::exists("/tmp/ha/ha.daemon.record");
+                     return isThere ? test::recordEntries().at(0) : std::string("none");
+                 },
+                 "\ndisks\n",
+                 {"none"}});
+}
+
+// ---- Logs ----
+
+TEST_F(MemoryTest, Logs) {
+    const auto both = [] {
+        return (test::exists(LOG) ? test::readFile(LOG) : "") + "|" + test::bufferText();
+    };
+    expectWhole({"set",
+                 [] { test::removeTree(BUFFER); },
+                 [] {
+                     daemonLog->set("a line that is longer than a string holds by itself");
+                     return "";
+                 },
+                 "",
+                 {},
+                 [] { return test::exists(BUFFER) ? test::daemonLogMessages().at(0) : "none"; },
+                 "a line that is longer than a string holds by itself",
+                 {"none"}});
+    expectWhole({"writeLogToDisk",
+                 [] {
+                     test::removeTree(LOG);
+                     test::writeFile(BUFFER, "one\ntwo\n");
+                 },
+                 [] {
+                     daemonLog->writeLogToDisk();
+                     return "";
+                 },
+                 "",
+                 {},
+                 both,
+                 "one\ntwo\n|",
+                 {"|one\ntwo\n"}});
+    expectWhole({"rotate",
+                 [] {
+                     for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
+                         std::filesystem::remove(entry);
+                     }
+                     test::writeFile(LOG, "lines\n");
+                 },
+                 [] {
+                     daemonLog->rotate();
+                     return "";
+                 },
+                 "",
+                 {},
+                 // What is compressed but not moved on yet is taken up by the next rotation.
+                 [] {
+                     std::string all;
+                     for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
+                         const std::string path = entry.path();
+                         all += entry.path().filename().string() + ": " +
+                                (entry.path().extension() == ".xz"
+                                     ? test::run({"/bin/xz", "--decompress", "--stdout", path}).output
+                                     : test::readFile(path));
+                     }
+                     return all;
+                 },
+                 "ha.daemon.log.0.xz: lines\n",
+                 {"ha.daemon.log: lines\n", "ha.daemon.log.xz: lines\n"}});
+}
+
+// ---- The record ----
+
+TEST_F(MemoryTest, TheRecord) {
+    static Status status;
+    Json::Value disks(Json::arrayValue);
+    disks.append("a disk with quite a long name");
+    disks.append("another disk with a long name");
+    const auto names = [] {
+        std::string all;
+        for (const Json::Value& name : status.getErrHandlingDisk()) {
+            all += name.asString() + ",";
+        }
+        return all;
+    };
+    expectWhole({"setErrHandlingDisk",
+                 [] { status.setErrHandlingDisk(Json::Value()); },
+                 [disks] {
+                     status.setErrHandlingDisk(disks);
+                     return "";
+                 },
+                 "",
+                 {},
+                 names,
+                 "a disk with quite a long name,another disk with a long name,",
+                 {""}});
+    expectWhole({"toJson", [] {},
+                 [] { return std::to_string(status.toJson()["diskErrorHandlingDisk"].size()); }, "2"});
+    expectWhole({"setRemoteAlive", [] { status.setRemoteAlive(false); },
+                 [] { return yesNo(status.setRemoteAlive(true) && status.isRemoteAlive()); }, "yes"});
+}
+
+// ---- Exchanges ----
+
+TEST_F(MemoryTest, AskingThePeer) {
+    remoteIP(test::kPeerAddress);
+    test::FakePeer peer(R"({"errHandlingDisk":["sda","sdb"],"isDiskErrHandling":true})");
+    expectWhole({"IsRemoteDiskErrHandling", [] {},
+                 [] {
+                     Json::Value disks("as it was");
+                     const bool isHandling = IsRemoteDiskErrHandling()(disks);
+                     return yesNo(isHandling) + " " + std::to_string(disks.size());
+                 },
+                 "yes 2"});
+}
+
+// The server's socket stays open for good, so that it is made before the test begins.
+class AnswersWithoutMemoryTest : public MemoryTest {
+ protected:
+    void SetUp() override {
+        localIP(test::kPeerAddress);
+        std::thread firstPass([] {
+            Status status;
+            SocketServer()(status);
+        });
+        test::UdpSocket asker;
+        do {
+            asker.send("is_alive", test::kPeerAddress, test::kPeerPort);
+        } while (!asker.receive(std::chrono::milliseconds(50)));
+        firstPass.join();
+        MemoryTest::SetUp();
+    }
+};
+
+TEST_F(AnswersWithoutMemoryTest, AnsweringThePeer) {
+    Status status;
+    Json::Value disks(Json::arrayValue);
+    disks.append("sda");
+    status.setErrHandlingDisk(disks);
+    std::optional<test::UdpSocket> asker;
+    SocketServer server;
+    expectWhole({"a pass of the server",
+                 [&asker] {
+                     asker.emplace();
+                     asker->send("is_disk_err_handling", test::kPeerAddress, test::kPeerPort);
+                 },
+                 [&server, &status] { return yesNo(server(status)); },
+                 "yes",
+                 {},
+                 [&asker] {
+                     std::string all;
+                     for (const std::string& answer : test::arrived(*asker)) {
+                         all += answer;
+                     }
+                     return all;
+                 },
+                 R"({"errHandlingDisk":["sda"],"isDiskErrHandling":false})",
+                 {""}});
+}
+
+TEST_F(MemoryTest, ServingTheControlSocket) {
+    Status status;
+    MonitordSocket server(test::LOCAL_SOCKET, 0);
+    server.setStatus(&status);
+    ASSERT_TRUE(server.serverBind());
+    std::optional<test::RawClient> client;
+    Operation query{"a query",
+                    [&client] {
+                        client.emplace();
+                        client->send(R"({"act":"I"})");
+                    },
+                    [&server] { return yesNo(server.serverListen()); },
+                    "yes",
+                    {"no"},
+                    [&client] {
+                        const std::string answer = client->receiveAll();
+                        const bool isWhole = !answer.empty() && answer.front() == '{' && answer.back() == '}';
+                        return answer.empty() ? "closed" : isWhole ? "whole" : answer;
+                    },
+                    "whole",
+                    {"closed"}};
+    expectWhole(query);
+}
+
+TEST_F(MemoryTest, AskingOverTheControlSocket) {
+    test::HandlerSocket server([](const Json::Value&, Json::Value& reply) {
+        reply = "an answer that is longer than a string holds by itself";
+        return true;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    expectWhole({"clientSend", [] {},
+                 [] {
+                     test::HandlerSocket client({}, test::LOCAL_SOCKET, 5);
+                     Json::Value reply("as it was");
+                     const bool isAnswered = client.clientSend("question", reply);
+                     return yesNo(isAnswered) + " " + std::to_string(reply.asString().size());
+                 },
+                 "yes 54"});
+}
+
+// ---- The reboot ----
+
+// A node without memory is one to be restarted.
+TEST_F(MemoryTest, AnOrderedRebootHappens) {
+    test::writeFile(TRIGGER, "");
+    Status status;
+    expectWhole({"the answer to an order to reboot",
+                 [] {
+                     test::writeFile(BUFFER, "one\ntwo\n");
+                     test::writeFile("/tmp/ha/ha.daemon.record", "three\n");
+                     test::writeFile(TRIGGER, "");
+                 },
+                 [&status] { return RebootRemote().handle(status); },
+                 "",
+                 {},
+                 [] { return test::readFile(TRIGGER); },
+                 "b"});
+}
+
+}  // namespace
