@@ -133,6 +133,11 @@ int access(const char* path, int mode) noexcept {
     return fails("access") ? -1 : real(path, mode);
 }
 
+int stat(const char* path, struct stat* info) noexcept {
+    static auto* const real = test::realFunction<int(const char*, struct stat*)>("stat64", "__stat64_time64");
+    return fails("stat") ? -1 : real(path, info);
+}
+
 int glob64(const char* pattern, int flags, int (*onError)(const char*, int), glob64_t* matches) {
     static auto* const real = test::realFunction<int(const char*, int, int (*)(const char*, int), glob64_t*)>(
         "glob64", "__glob64_time64");
@@ -145,6 +150,12 @@ int posix_spawn(pid_t* child, const char* path, const posix_spawn_file_actions_t
         test::realFunction<int(pid_t*, const char*, const posix_spawn_file_actions_t*,
                                const posix_spawnattr_t*, char* const[], char* const[])>("posix_spawn");
     return fails("posix_spawn") ? failure : real(child, path, actions, attributes, argv, envp);
+}
+
+pid_t waitpid(pid_t child, int* status, int options) {
+    static auto* const real = test::realFunction<pid_t(pid_t, int*, int)>("waitpid");
+    const pid_t result = real(child, status, options);  // the end is waited for, as with SIGCHLD ignored
+    return fails("waitpid") ? -1 : result;
 }
 
 int pipe2(int* ends, int flags) noexcept {

@@ -116,7 +116,8 @@ std::vector<Operation> localChecks() {
          [] { test::writeFile("/tmp/ha/info_hd.remote", R"({"3":{"HD_DEVNAME":"sda"}})"); },
          [] { return Util::devListToHumanReadable({"sda"}).at(0); },
          "Disk 3",
-         {{"open", {{"sda", {line("util.cpp", "Failed to read HD info json: /tmp/ha/info_hd.remote")}}}},
+         {{"stat", {{"sda"}}},
+          {"open", {{"sda", {line("util.cpp", "Failed to read HD info json: /tmp/ha/info_hd.remote")}}}},
           {"read",
            {{"sda", {line("util.cpp", "Failed to read HD info json: /tmp/ha/info_hd.remote")}}, {"Disk 3"}}},
           {"close", {{"Disk 3"}}}}},
@@ -138,7 +139,9 @@ std::vector<Operation> programs() {
          "2.500000",
          {{"pipe", {{"0.000000", ping("Failed to exec ifconfig to get interface status")}}},
           {"fdopen", {{"0.000000", ping("Failed to exec ifconfig to get interface status")}}},
+          {"stat", {{"0.000000", ping("Failed to exec ifconfig to get interface status")}}},
           {"posix_spawn", {{"0.000000", ping("Failed to exec ifconfig to get interface status")}}},
+          {"waitpid", {{"2.500000", {line("checker.cpp", "Failed to exec /bin/ping return code: -1")}}}},
           {"close", {{"2.500000"}}}}},
     };
 }
@@ -171,6 +174,11 @@ std::vector<Operation> logs() {
           {"write", {{"two\n|"}, {"one\n|"}}},
           {"close", {{"one\ntwo\n|"}, {"one\ntwo\n|"}, {"one\ntwo\n|"}}}},
          [disk] { return disk() + "|" + test::bufferText(); }},
+        {"size",
+         [] { test::writeFile(LOG, "123456789\n"); },
+         [] { return std::to_string(daemonLog->size()); },
+         "10",
+         {{"stat", {{"0"}}}}},
     };
 }
 
@@ -303,6 +311,25 @@ TEST_F(FaultsTest, Programs) {
 
 TEST_F(FaultsTest, Logs) {
     expectAll(logs());
+}
+
+// Files are read and written to the end, whatever signals the host gets meanwhile.
+TEST_F(FaultsTest, AnInterruptedCallIsRepeated) {
+    for (const auto& operations : {localChecks(), logs()}) {
+        for (const Operation& operation : operations) {
+            for (const auto& [function, count] : callsOf(operation)) {
+                const bool isRepeated = function == "open" || function == "read" || function == "write";
+                for (int number = 1; isRepeated && number <= count; ++number) {
+                    SCOPED_TRACE(operation.name + ", " + function + " number " + std::to_string(number));
+                    begin(operation);
+                    const test::FailingCall failing(function, number, EINTR);
+                    const std::string result = operation.run();
+                    EXPECT_TRUE(failing.hasFailed());
+                    EXPECT_EQ(result + operation.look(), operation.result);
+                }
+            }
+        }
+    }
 }
 
 // Whatever fails on the way, the machine is told to restart, but for the last step itself.
