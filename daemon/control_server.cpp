@@ -20,6 +20,19 @@ constexpr timeval SILENCE_LIMIT = {5, 0};
 constexpr int BACKLOG = 100;
 constexpr int PAUSE = 1000;  // milliseconds
 
+// Closes a client's connection, whatever serving it ended by.
+class Connection {
+ public:
+    explicit Connection(int fd) : _fd(fd) {}
+    ~Connection() { close(_fd); }
+
+    Connection(const Connection&) = delete;
+    Connection& operator=(const Connection&) = delete;
+
+ private:
+    int _fd;
+};
+
 }  // namespace
 
 ControlServer::ControlServer(const std::string& path) : MonitordSocket(path, CLIENT_TIMEOUT), _path(path) {}
@@ -49,9 +62,9 @@ void ControlServer::serve() {
         }
         return;
     }
+    const Connection connection(client);
     setsockopt(client, SOL_SOCKET, SO_RCVTIMEO, &SILENCE_LIMIT, sizeof SILENCE_LIMIT);
     _serverListen(client);
-    close(client);
 }
 
 }  // namespace ternhad

@@ -6,7 +6,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <cstdio>
+#include <cstdlib>
 #include <cstring>
+#include <exception>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
@@ -33,6 +36,47 @@ constexpr auto STOP_STEP = std::chrono::milliseconds(20);
 // A question that took as long as this was not answered, whatever its result. The library waits for 3
 // seconds.
 constexpr auto ANSWER_LIMIT = std::chrono::milliseconds(2900);
+
+// How long the passes of a thread may all fail.
+constexpr auto FAILURE_LIMIT = std::chrono::seconds(10);
+
+// Runs a step of the daemon. False when memory, or another means of the machine, ran out in it: the step is
+// given up.
+template <typename Step>
+bool attempt(const Step& step) {
+    try {
+        step();
+        return true;
+    } catch (const std::exception& error) {
+        (void)std::fprintf(stderr, "ternhad: a step was given up: %s\n", error.what());
+        return false;
+    }
+}
+
+// The passes of one thread. One that is given up costs no more than its own results; when all fail for long,
+// what the daemon says of that matter is old, and no answer is better than a wrong one.
+class Passes {
+ public:
+    template <typename Pass>
+    void run(const Pass& pass) {
+        using Clock = std::chrono::steady_clock;
+        if (attempt(pass)) {
+            _failingSince.reset();
+        } else if (!_failingSince) {
+            _failingSince = Clock::now();
+        } else if (Clock::now() - *_failingSince >= FAILURE_LIMIT) {
+            std::abort();
+        }
+    }
+
+ private:
+    std::optional<std::chrono::steady_clock::time_point> _failingSince;
+};
+
+void moveLogs() {
+    daemonLog->writeLogToDisk();
+    recordLog->writeLogToDisk();
+}
 
 void ignoreSignal(int) {}
 
@@ -143,7 +187,7 @@ int Host::run() {
     notifyReady();
     waitForStop();
     notifyStopping();
-    HA_LOG("Stopping");
+    attempt([] { HA_LOG("Stopping"); });
     stopThreads();
     unlink(_options.socket.c_str());
     return _exitCode;
@@ -152,7 +196,8 @@ int Host::run() {
 void Host::startThread(void (Host::*body)()) {
     std::promise<void> promise;
     std::future<void> end = promise.get_future();
-    // An exception ends the process: a daemon without one of its threads would only seem to work.
+    // An exception that is left over ends the process: a daemon without one of its threads would only seem to
+    // work.
     std::thread thread([this, body, done = std::move(promise)]() mutable noexcept {
         (this->*body)();
         done.set_value();
@@ -202,17 +247,15 @@ void Host::stopThreads() {
     for (Worker& worker : _workers) {
         while (worker.end.wait_for(STOP_STEP) != std::future_status::ready) {
             if (Clock::now() > deadline) {
-                daemonLog->writeLogToDisk();
-                recordLog->writeLogToDisk();
+                attempt(moveLogs);
                 unlink(_options.socket.c_str());
                 _exit(_exitCode);
             }
-            interruptThreads();
+            attempt(interruptThreads);
         }
         worker.thread.join();
     }
-    daemonLog->writeLogToDisk();
-    recordLog->writeLogToDisk();
+    attempt(moveLogs);
 }
 
 void Host::stop(int exitCode) {
@@ -229,55 +272,67 @@ bool Host::sleepUntil(Clock::time_point time) {
 
 void Host::servePeer() {
     SocketServer server;
+    Passes passes;
     while (!isStopping()) {
-        if (!server(_status)) {
-            std::cerr << "ternhad: cannot answer the peer on " << _options.localIp
-                      << ", the daemon log tells why\n";
-            stop(1);
-            kill(getpid(), SIGTERM);
-        }
-        ++_peerAnswers;
+        passes.run([this, &server] {
+            if (!server(_status)) {
+                std::cerr << "ternhad: cannot answer the peer on " << _options.localIp
+                          << ", the daemon log tells why\n";
+                stop(1);
+                kill(getpid(), SIGTERM);
+            }
+            ++_peerAnswers;
+        });
     }
 }
 
 void Host::serveControl() {
+    Passes passes;
     while (!isStopping()) {
-        _control.serve();
+        passes.run([this] { _control.serve(); });
     }
 }
 
 void Host::watchPeer() {
     Liveness liveness;
+    Passes passes;
     auto next = Clock::now();
     do {
-        const bool wasAlive = _status.isRemoteAlive();
-        const bool isAlive = liveness.ask(wasAlive, [this] { return isStopping(); });
-        if (isStopping()) {
-            return;
-        }
-        _status.setRemoteAlive(isAlive);
-        ++_peerQuestions;
-        if (isAlive && !wasAlive) {
-            const std::lock_guard<std::mutex> lock(_mutex);
-            _hasPeerAppeared = true;
-            _wakeUp.notify_all();
-        } else if (wasAlive && !isAlive) {
-            _isHostnameKnown = false;
-            requestSnapshot();
-        }
+        passes.run([this, &liveness] { watchPeerOnce(liveness); });
         // A dead peer has cost more than an interval already and is asked again at once.
         next = nextRound(next, _options.checkInterval);
     } while (sleepUntil(next));
 }
 
+void Host::watchPeerOnce(Liveness& liveness) {
+    const bool wasAlive = _status.isRemoteAlive();
+    const bool isAlive = liveness.ask(wasAlive, [this] { return isStopping(); });
+    if (isStopping()) {
+        return;
+    }
+    _status.setRemoteAlive(isAlive);
+    ++_peerQuestions;
+    if (isAlive && !wasAlive) {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        _hasPeerAppeared = true;
+        _wakeUp.notify_all();
+    } else if (wasAlive && !isAlive) {
+        _isHostnameKnown = false;
+        requestSnapshot();
+    }
+}
+
 void Host::askPeer() {
+    Passes passes;
     auto next = Clock::now();
     while (!isStopping()) {
-        if (_status.isRemoteAlive()) {  // a dead one would only be waited for
-            askForDisks();
-            askForResync();
-            askForHostname();
-        }
+        passes.run([this] {
+            if (_status.isRemoteAlive()) {  // a dead one would only be waited for
+                askForDisks();
+                askForResync();
+                askForHostname();
+            }
+        });
         next = nextRound(next, _options.checkInterval);
         std::unique_lock<std::mutex> lock(_mutex);
         _wakeUp.wait_until(lock, next, [this] { return isStopping() || _hasPeerAppeared; });
@@ -329,41 +384,50 @@ void Host::askForHostname() {
 }
 
 void Host::checkSelf() {
+    Passes passes;
     auto next = Clock::now();
     do {
-        _status.isDRBDConnect = TERN::HA::Daemon::isDRBDConnect();
-
-        const bool hasResyncBegun = storeFlag(_status.isMDResync, TERN::HA::Daemon::isMDResync());
-
-        Json::Value disks(Json::arrayValue);
-        const bool isHandling = TERN::HA::Daemon::isDiskErrHandling(disks);
-        _status.setErrHandlingDisk(disks);
-        const bool hasHandlingBegun = storeFlag(_status.isDiskErrHandling, isHandling);
-
-        if (hasResyncBegun || hasHandlingBegun) {
-            requestSnapshot();
-        }
-        ++_selfChecks;
+        passes.run([this] { checkSelfOnce(); });
         next = nextRound(next, _options.checkInterval);
     } while (sleepUntil(next));
 }
 
+void Host::checkSelfOnce() {
+    _status.isDRBDConnect = TERN::HA::Daemon::isDRBDConnect();
+
+    const bool hasResyncBegun = storeFlag(_status.isMDResync, TERN::HA::Daemon::isMDResync());
+
+    Json::Value disks(Json::arrayValue);
+    const bool isHandling = TERN::HA::Daemon::isDiskErrHandling(disks);
+    _status.setErrHandlingDisk(disks);
+    const bool hasHandlingBegun = storeFlag(_status.isDiskErrHandling, isHandling);
+
+    if (hasResyncBegun || hasHandlingBegun) {
+        requestSnapshot();
+    }
+    ++_selfChecks;
+}
+
 void Host::measureLink() {
     TERN::HA::Daemon::InterfaceChecker interface;
+    Passes passes;
     auto next = Clock::now();
     do {
-        float rate = 0;
-        if (interface.networkNonOkRate(rate)) {
-            _status.heartbeatPacketFailRate = rate;
-        }
-        // A ping that nobody answers takes 10 seconds and tells nothing new.
-        const float latency = _status.isRemoteAlive() ? TERN::HA::Daemon::heartbeatLatency() : 0;
-        if (isStopping()) {
-            return;
-        }
-        _status.heartbeatLatency = latency;
+        passes.run([this, &interface] { measureLinkOnce(interface); });
         next = nextRound(next, _options.heartbeatInterval);
     } while (sleepUntil(next));
+}
+
+void Host::measureLinkOnce(TERN::HA::Daemon::InterfaceChecker& interface) {
+    float rate = 0;
+    if (interface.networkNonOkRate(rate)) {
+        _status.heartbeatPacketFailRate = rate;
+    }
+    // A ping that nobody answers takes 10 seconds and tells nothing new.
+    const float latency = _status.isRemoteAlive() ? TERN::HA::Daemon::heartbeatLatency() : 0;
+    if (!isStopping()) {
+        _status.heartbeatLatency = latency;
+    }
 }
 
 void Host::keepLogs() {
@@ -371,6 +435,7 @@ void Host::keepLogs() {
     const auto snapshotInterval = std::chrono::duration_cast<Clock::duration>(_options.snapshotInterval);
     LogKeeper daemonKeeper(*daemonLog, _options.rotateSize);
     LogKeeper recordKeeper(*recordLog, _options.rotateSize);
+    Passes passes;
     auto nextMove = Clock::now() + logInterval;
     auto nextSnapshot = Clock::now();
     while (!isStopping()) {
@@ -388,15 +453,19 @@ void Host::keepLogs() {
             return;
         }
         if (snapshotNow || Clock::now() >= nextSnapshot) {
-            TERN::HA::Daemon::recordStatus(_status);
-            TERN::HA::Daemon::recordPS();
-            TERN::HA::Daemon::recordDF();
-            TERN::HA::Daemon::recordMemoryInfo();
+            passes.run([this] {
+                TERN::HA::Daemon::recordStatus(_status);
+                TERN::HA::Daemon::recordPS();
+                TERN::HA::Daemon::recordDF();
+                TERN::HA::Daemon::recordMemoryInfo();
+            });
             nextSnapshot = Clock::now() + snapshotInterval;
         }
         if (rotateNow || Clock::now() >= nextMove) {
-            daemonKeeper.move(rotateNow);
-            recordKeeper.move(rotateNow);
+            passes.run([&daemonKeeper, &recordKeeper, rotateNow] {
+                daemonKeeper.move(rotateNow);
+                recordKeeper.move(rotateNow);
+            });
             nextMove = Clock::now() + logInterval;
         }
     }

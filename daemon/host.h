@@ -8,7 +8,9 @@
 #include <thread>
 #include <vector>
 
+#include "checker.h"
 #include "control_server.h"
+#include "liveness.h"
 #include "options.h"
 #include "status.h"
 
@@ -53,6 +55,9 @@ class Host {
     void measureLink();
     void keepLogs();
 
+    void watchPeerOnce(Liveness& liveness);
+    void checkSelfOnce();
+    void measureLinkOnce(TERN::HA::Daemon::InterfaceChecker& interface);
     void askForDisks();
     void askForResync();
     void askForHostname();

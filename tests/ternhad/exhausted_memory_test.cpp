@@ -1,0 +1,68 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+
+#include <string>
+
+#include "support/sandbox.h"
+#include "ternhad/machine.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using test::Machine;
+
+class ExhaustedMemoryTest : public ::testing::Test {
+ protected:
+    void SetUp() override {
+        test::connect(a.node, "10.0.0.1", b.node, "10.0.0.2");
+        std::vector<std::string> command = {"/usr/bin/env", std::string("LD_PRELOAD=") + EXHAUSTED_MEMORY};
+        const auto arguments = test::daemonArguments(a.address, a.peer, "eth1");
+        command.insert(command.end(), arguments.begin(), arguments.end());
+        a.daemon.emplace(a.node.start(command));
+        b.start();
+        EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
+    }
+
+    bool bothSee(bool alive) { return a.sees("isRemoteAlive", alive) && b.sees("isRemoteAlive", alive); }
+
+    // Steps of the first node's daemon that were given up.
+    int givenUp() const {
+        int count = 0;
+        const std::string said = a.daemon->error();
+        for (std::size_t at = 0; (at = said.find("a step was given up", at)) != std::string::npos; ++at) {
+            ++count;
+        }
+        return count;
+    }
+
+    Machine a{"node-a", "10.0.0.1", "10.0.0.2"};
+    Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
+};
+
+TEST_F(ExhaustedMemoryTest, ThatComesBackHasEndedNothing) {
+    a.write("/tmp/no-memory", "");
+    EXPECT_TRUE(test::eventually(20s, [this] { return givenUp() > 20; })) << a.daemon->error();
+    test::removeTree(a.node.path("/tmp/no-memory"));
+
+    a.write("/sys/block/md0/md/sync_action", "resync\n");
+    EXPECT_TRUE(test::eventually(20s, [this] {
+        return bothSee(true) && a.sees("isMDResync", true) && b.sees("isRemoteMDResync", true);
+    }));
+    a.daemon->signal(SIGTERM);
+    const auto status = a.daemon->waitFor(10s);
+    ASSERT_TRUE(status.has_value());
+    EXPECT_EQ(*status, 0);
+}
+
+// What it says would be old.
+TEST_F(ExhaustedMemoryTest, ThatStaysAwayEndsTheDaemon) {
+    const test::Stopwatch stopwatch;
+    a.write("/tmp/no-memory", "");
+    const auto status = a.daemon->waitFor(60s);
+    ASSERT_TRUE(status.has_value());
+    EXPECT_TRUE(WIFSIGNALED(*status)) << *status;
+    EXPECT_GE(stopwatch.elapsed(), 10s);
+}
+
+}  // namespace
