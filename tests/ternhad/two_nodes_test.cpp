@@ -62,6 +62,28 @@ TEST_F(TwoNodesTest, ADaemonThatStandsStillIsDeadUntilItGoesOn) {
     EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
 }
 
+TEST(SuspendedDaemonTest, ComesBackToTheTruthWithinTwoIntervals) {
+    constexpr auto INTERVAL = 3s;
+    Machine a{"node-a", "10.0.0.1", "10.0.0.2"};
+    Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
+    test::connect(a.node, "10.0.0.1", b.node, "10.0.0.2");
+    for (Machine* machine : {&a, &b}) {
+        machine->daemon.emplace(machine->node.start({TERNHAD, "--local-ip", machine->address, "--remote-ip",
+                                                     machine->peer, "--interface", "eth1", "--check-interval",
+                                                     std::to_string(INTERVAL.count())}));
+    }
+    const auto isTrue = [&](bool isResync) {
+        return a.sees("isRemoteAlive", true) && b.sees("isRemoteAlive", true) &&
+               a.sees("isRemoteMDResync", isResync) && b.sees("isMDResync", isResync);
+    };
+    ASSERT_TRUE(test::eventually(20s, [&] { return isTrue(false); }));
+    b.daemon->signal(SIGSTOP);
+    ASSERT_TRUE(test::eventually(20s, [&] { return a.sees("isRemoteAlive", false); }));
+    b.write("/sys/block/md0/md/sync_action", "resync\n");
+    b.daemon->signal(SIGCONT);
+    EXPECT_TRUE(test::eventually(2 * INTERVAL, [&] { return isTrue(true); }));
+}
+
 TEST_F(TwoNodesTest, ADaemonThatWasKilledIsDeadUntilItIsStartedAgain) {
     b.daemon->signal(SIGKILL);
     ASSERT_TRUE(b.daemon->waitFor(10s).has_value());
