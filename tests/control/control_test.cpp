@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <optional>
+#include <ostream>
 
 #include "env_check.h"
 #include "socket/local_sockets.h"
@@ -123,6 +124,10 @@ struct Refusal {
     std::string line;
 };
 
+void PrintTo(const Refusal& refusal, std::ostream* stream) {
+    *stream << refusal.name;
+}
+
 const std::string LONGEST_REQUEST = R"({"a":")" + std::string(2087, 'y') + R"("})";
 
 class RefusalTest : public ControlTest, public ::testing::WithParamInterface<Refusal> {};
@@ -223,6 +228,10 @@ struct OddReply {
     const char* name;
     const char* text;
 };
+
+void PrintTo(const OddReply& reply, std::ostream* stream) {
+    *stream << reply.name;
+}
 
 class OddReplyTest : public test::SandboxTest, public ::testing::WithParamInterface<OddReply> {};
 

@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <cstdlib>
 #include <filesystem>
+#include <ostream>
 #include <thread>
 
 #include "daemon_log/clock.h"
@@ -59,6 +60,10 @@ struct Zone {
     const char* tz;
     const char* stamp;  // of 2026-11-15 08:20:21 UTC
 };
+
+void PrintTo(const Zone& zone, std::ostream* stream) {
+    *stream << zone.tz;
+}
 
 class ZoneTest : public DaemonLogTest, public ::testing::WithParamInterface<Zone> {};
 

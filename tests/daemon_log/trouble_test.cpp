@@ -33,7 +33,7 @@ class LogTroubleTest : public test::SandboxTest {
 
     static void setReadOnly(const char* directory, bool isReadOnly) {
         const unsigned long readOnly = MS_RDONLY;
-        ASSERT_EQ(mount(nullptr, directory, nullptr, MS_REMOUNT | (isReadOnly ? readOnly : 0), "size=16k"),
+        ASSERT_EQ(mount("tmpfs", directory, "tmpfs", MS_REMOUNT | (isReadOnly ? readOnly : 0), "size=16k"),
                   0);
     }
 

@@ -1,6 +1,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <ostream>
 #include <stdexcept>
 
 #include "checker.h"
@@ -50,6 +51,10 @@ struct End {
     const char* script;
     const char* status;
 };
+
+void PrintTo(const End& end, std::ostream* stream) {
+    *stream << end.script;
+}
 
 class EndTest : public CommandPipeTest, public ::testing::WithParamInterface<End> {};
 

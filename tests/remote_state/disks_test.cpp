@@ -1,6 +1,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <ostream>
+
 #include "checker.h"
 #include "env_check/peer.h"
 #include "support/json.h"
@@ -64,6 +66,10 @@ struct Answer {
     bool result;
     const char* disks;
 };
+
+void PrintTo(const Answer& answer, std::ostream* stream) {
+    *stream << answer.text;
+}
 
 class ReadableAnswerTest : public PeersDisksTest, public ::testing::WithParamInterface<Answer> {};
 

@@ -10,6 +10,7 @@
 #include <csignal>
 #include <memory>
 #include <optional>
+#include <ostream>
 #include <system_error>
 #include <thread>
 #include <vector>
@@ -116,6 +117,10 @@ struct HostileRequest {
     const char* name;
     std::string bytes;
 };
+
+void PrintTo(const HostileRequest& request, std::ostream* stream) {
+    *stream << request.name;
+}
 
 class HostileRequestTest : public ServerSocketTest, public ::testing::WithParamInterface<HostileRequest> {};
 

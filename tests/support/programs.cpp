@@ -32,7 +32,7 @@ void check(bool done, const std::string& what) {
 
 void cover(const std::string& path, const std::string& by) {
     const std::string program = std::filesystem::canonical(path);
-    check(mount(by.c_str(), program.c_str(), nullptr, MS_BIND, nullptr) == 0, "cannot cover " + program);
+    check(mount(by.c_str(), program.c_str(), "", MS_BIND, nullptr) == 0, "cannot cover " + program);
 }
 
 void writeScript(const std::string& path, const std::string& script) {

@@ -34,8 +34,8 @@ mode_t modeOf(const char* path) {
     return info.st_mode & 07777;
 }
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr auto STOP_LIMIT = 20s;  // the sanitizers have their own work at the end of a process
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__) || defined(TERNHAD_IS_WRAPPED)
+constexpr auto STOP_LIMIT = 20s;  // sanitizers and valgrind have their own work at the end of a process
 #else
 constexpr auto STOP_LIMIT = 2s;
 #endif
@@ -378,7 +378,6 @@ TEST_F(DaemonTest, AFloodOfQuestionsGetsNoAnswerTwiceOrForSomebodyElse) {
                 }
             }
             own += answersAt(socket, expected, 1s);
-            EXPECT_GT(own, 0);
             EXPECT_LE(own, QUESTIONS);
             // And now, that all is quiet, one answer for one question.
             socket.send(question, "127.0.0.1", 7499);
@@ -389,6 +388,7 @@ TEST_F(DaemonTest, AFloodOfQuestionsGetsNoAnswerTwiceOrForSomebodyElse) {
     for (std::thread& asker : askers) {
         asker.join();
     }
+    EXPECT_GT(answered, 0);
     std::printf("%d of %d questions answered\n", answered.load(), 4 * QUESTIONS);
     stop(daemon);
 }

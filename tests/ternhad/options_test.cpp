@@ -1,6 +1,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <ostream>
+
 #include "support/files.h"
 #include "support/programs.h"
 #include "support/sandbox.h"
@@ -24,6 +26,10 @@ struct WrongUsage {
     std::vector<std::string> arguments;
     const char* message;
 };
+
+void PrintTo(const WrongUsage& usage, std::ostream* stream) {
+    *stream << usage.name;
+}
 
 class WrongUsageTest : public OptionsTest, public ::testing::WithParamInterface<WrongUsage> {};
 
