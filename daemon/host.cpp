@@ -59,18 +59,21 @@ class Passes {
  public:
     template <typename Pass>
     void run(const Pass& pass) {
-        using Clock = std::chrono::steady_clock;
         if (attempt(pass)) {
-            _failingSince.reset();
-        } else if (!_failingSince) {
+            _areFailing = false;
+        } else if (!_areFailing) {
+            _areFailing = true;
             _failingSince = Clock::now();
-        } else if (Clock::now() - *_failingSince >= FAILURE_LIMIT) {
+        } else if (Clock::now() - _failingSince >= FAILURE_LIMIT) {
             std::abort();
         }
     }
 
  private:
-    std::optional<std::chrono::steady_clock::time_point> _failingSince;
+    using Clock = std::chrono::steady_clock;
+
+    bool _areFailing = false;
+    Clock::time_point _failingSince;
 };
 
 void moveLogs() {
