@@ -28,10 +28,11 @@ for directory in /usr/*; do
     mount -t overlay overlay -o "lowerdir=$directory,upperdir=$layer/upper,workdir=$layer/work" "$directory"
 done
 
-# All that is not the machine's own. Directories that dpkg has only opened are in the layers too.
+# All that is not the machine's own. Directories that dpkg has only opened are in the layers too. The build tree,
+# where other tests write, is a file system of its own wherever it is.
 changes() {
     {
-        find /etc /var /tmp /run \( -path /var/lib/dpkg -o -path "$layers" -o -path /run/dpkg \) -prune -o -print
+        find /etc /var /tmp /run -xdev \( -path /var/lib/dpkg -o -path "$layers" -o -path /run/dpkg \) -prune -o -print
         find "$layers" -path '*/upper/*' ! -type d
     } | sort
 }
