@@ -34,7 +34,8 @@ class DaemonLog {
     DaemonLog& operator=(const DaemonLog&) = delete;
 
     /// Appends time stamp, space, `text` (any length, any bytes) and newline to the buffer file with one
-    /// open, one write and one close. The line is dropped when the buffer file cannot be opened.
+    /// open, one write and one close. The line is dropped when the buffer file cannot be opened. The stamp
+    /// follows a change of TZ at once, one of the machine's time zone with the next second.
     void set(const std::string& text);
 
     /// Moves the buffered lines to the end of the persistent log, a write per line, and leaves the buffer

@@ -6,6 +6,7 @@
 #include <array>
 #include <chrono>
 #include <cstdio>
+#include <cstdlib>
 #include <ctime>
 #include <string_view>
 #include <thread>
@@ -122,16 +123,19 @@ std::int64_t DaemonLog::size() const {
 }
 
 std::string DaemonLog::_formatedTime() const {
-    // Lines come in bursts: what was made for the first of a second serves the others. Without a destructor,
-    // so that a process can log to its very end.
+    // Lines come in bursts: what was made for the first of a second serves the others in the same zone.
+    // Without a destructor, so that a process can log to its very end.
     struct Stamp {
-        std::time_t time = -1;
+        std::time_t time = 0;
+        std::array<char, 64> zone = {};
         std::array<char, 32> text = {};
     };
     thread_local Stamp last;
 
     const std::time_t now = std::time(nullptr);
-    if (now == last.time) {
+    const char* variable = std::getenv("TZ");
+    const std::string_view zoneName = variable != nullptr ? variable : ":/etc/localtime";
+    if (last.text[0] != '\0' && now == last.time && zoneName == last.zone.data()) {
         return last.text.data();
     }
     std::tm local = {};
@@ -144,9 +148,12 @@ std::string DaemonLog::_formatedTime() const {
     (void)std::strftime(zone.data(), zone.size(), "%z", &local);
     std::string stamp = std::string(dateTime.data()) + std::string(zone.data()).insert(3, ":");
 
-    last.text = {};
-    stamp.copy(last.text.data(), last.text.size() - 1);
-    last.time = now;
+    last = {};
+    if (zoneName.size() < last.zone.size()) {
+        zoneName.copy(last.zone.data(), zoneName.size());
+        stamp.copy(last.text.data(), last.text.size() - 1);
+        last.time = now;
+    }
     return stamp;
 }
 

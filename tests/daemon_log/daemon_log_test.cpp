@@ -95,6 +95,28 @@ TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheProcess) {
     EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T08:20:21+00:00 first\n2026-11-15T09:20:22+01:00 second\n");
 }
 
+TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheProcessWithinASecond) {
+    const std::string kolkata = ":/usr/share/zoneinfo/" + std::string(60, '/') + "Asia/Kolkata";
+    setAt(1794730821, "first");
+    setenv("TZ", "CET-1", 1);
+    setAt(1794730821, "second");
+    setenv("TZ", "", 1);
+    setAt(1794730821, "third");
+    setenv("TZ", kolkata.c_str(), 1);
+    setAt(1794730821, "fourth");
+    setenv("TZ", (kolkata.substr(0, kolkata.size() - 12) + "America/Phoenix").c_str(), 1);
+    setAt(1794730821, "fifth");
+    EXPECT_EQ(test::readFile(BUFFER),
+              "2026-11-15T08:20:21+00:00 first\n2026-11-15T09:20:21+01:00 second\n"
+              "2026-11-15T08:20:21+00:00 third\n2026-11-15T13:50:21+05:30 fourth\n"
+              "2026-11-15T01:20:21-07:00 fifth\n");
+}
+
+TEST_F(DaemonLogTest, TheSecondBefore1970HasItsStamp) {
+    setAt(-1, "x");
+    EXPECT_EQ(test::readFile(BUFFER), "1969-12-31T23:59:59+00:00 x\n");
+}
+
 TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheMachine) {
     unsetenv("TZ");
     test::removeTree("/etc/localtime");
