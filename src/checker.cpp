@@ -482,7 +482,7 @@ std::string getLocalHostname() {
 
 bool isHadConstraints() {
     return PLATExec("/var/packages/FailoverPair/target/sbin/ternha", "--local-has-constraint",
-                    static_cast<const char*>(nullptr)) == 0;
+                    static_cast<const char*>(nullptr), static_cast<const char*>(nullptr)) == 0;
 }
 
 }  // namespace TERN::HA::Daemon
