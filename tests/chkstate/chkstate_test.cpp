@@ -31,6 +31,7 @@ using test::arrived;
 using test::kPeerAddress;
 using test::kPeerPort;
 using test::UdpSocket;
+using ::testing::AllOf;
 using ::testing::ElementsAre;
 using ::testing::Field;
 using ::testing::IsEmpty;
@@ -151,7 +152,7 @@ TEST_F(TransportTest, TheDestructorClosesTheSocket) {
         EXPECT_NE(fcntl(descriptor, F_GETFD), -1);
     }
     EXPECT_EQ(fcntl(descriptor, F_GETFD), -1);
-    const HASocketCommServer successor(kOwnAddress);
+    HASocketCommServer successor(kOwnAddress);
     EXPECT_FALSE(successor.HasError());
 }
 
@@ -174,7 +175,8 @@ TEST_F(TransportTest, WithoutASocketTheSystemLogSaysSoAndEveryCallFails) {
     }
     const auto line =
         AllOf(Field(&test::SystemLog::Entry::priority, LOG_USER | LOG_ERR),
-              Field(&test::SystemLog::Entry::text, test::LogLine("chkstate.cpp", "Failed to set socket")));
+              Field(&test::SystemLog::Entry::text,
+                    AllOf(test::LogLine("chkstate.cpp", "Failed to set socket"), test::NamesItsCallSite())));
     EXPECT_THAT(log.entries(), ElementsAre(line, line, line));
     EXPECT_EQ(test::bufferText(), "");
 }
@@ -182,9 +184,9 @@ TEST_F(TransportTest, WithoutASocketTheSystemLogSaysSoAndEveryCallFails) {
 TEST_F(TransportTest, AnOptionThatCannotBeSetIsAnErrorAndNothingIsBound) {
     test::SystemLog log;
     const test::FailingCall failing(test::SystemCall::SetSocketOption, EDOM);
-    const HASocketCommClient client(kOwnAddress, 1);
+    HASocketCommClient client(kOwnAddress, 1);
     EXPECT_TRUE(client.HasError());
-    const HASocketCommServer server(kOwnAddress, 1);
+    HASocketCommServer server(kOwnAddress, 1);
     EXPECT_TRUE(server.HasError());
     EXPECT_FALSE(test::isBound(kOwnAddress, kPeerPort));
     EXPECT_THAT(log.entries(), IsEmpty());
@@ -193,7 +195,7 @@ TEST_F(TransportTest, AnOptionThatCannotBeSetIsAnErrorAndNothingIsBound) {
 
 TEST_F(TransportTest, AServerWithoutTimeoutSetsNoOption) {
     const test::FailingCall failing(test::SystemCall::SetSocketOption, EDOM);
-    const HASocketCommServer server(kOwnAddress);
+    HASocketCommServer server(kOwnAddress);
     EXPECT_FALSE(server.HasError());
 }
 
@@ -207,10 +209,10 @@ TEST_F(ServerTest, AnAddressThatTheHostDoesNotHaveIsAnError) {
 }
 
 TEST_F(ServerTest, APortThatIsTakenIsAnError) {
-    const HASocketCommServer first(kOwnAddress);
+    HASocketCommServer first(kOwnAddress);
     EXPECT_FALSE(first.HasError());
     EXPECT_TRUE(HASocketCommServer(kOwnAddress).HasError());
-    const HASocketCommServer second(kOwnAddress, 1);
+    HASocketCommServer second(kOwnAddress, 1);
     EXPECT_TRUE(second.HasError());
     EXPECT_EQ(errno, EADDRINUSE);
 }

@@ -32,6 +32,7 @@ namespace {
 
 using namespace TERN::HA::Daemon;
 using test::LogLine;
+using ::testing::Each;
 using ::testing::ElementsAreArray;
 using ::testing::Matcher;
 
@@ -266,6 +267,7 @@ class FaultsTest : public test::SandboxTest {
         }
         EXPECT_EQ(result + operation.look(), outcome.result);
         if (!outcome.daemonLog.empty()) {
+            EXPECT_THAT(logged(), Each(test::NamesItsCallSite()));
             EXPECT_THAT(logged(), ElementsAreArray(outcome.daemonLog));
         }
         begin(operation);

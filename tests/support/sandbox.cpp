@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 #include <syslog.h>
 
+#include <algorithm>
 #include <filesystem>
 
 #include "support/files.h"
@@ -102,6 +103,25 @@ std::vector<std::string> recordEntries() {
         }
     }
     return entries;
+}
+
+bool hasCallSite(const std::string& message) {
+    static const Pattern kMessage("^([a-z_]+\\.cpp):([0-9]+) ");
+    static const std::string kPlace = "%s:%d ";
+    const std::vector<std::string> found = kMessage.find(message);
+    if (found.empty() || !exists(TERNHA_LIBRARY_SOURCES "/" + found.at(1))) {
+        return false;
+    }
+    const std::vector<std::string> source = lines(readFile(TERNHA_LIBRARY_SOURCES "/" + found.at(1)));
+    const size_t number = std::stoul(found.at(2));
+    if (number < 1 || number > source.size()) {
+        return false;
+    }
+    const std::string& line = source.at(number - 1);
+    std::string literal = line.substr(std::min(line.find('"'), line.size() - 1) + 1);
+    literal.erase(0, literal.compare(0, kPlace.size(), kPlace) == 0 ? kPlace.size() : 0);
+    literal.erase(std::min(literal.find_first_of("\"%\\"), literal.size()));
+    return !literal.empty() && message.compare(found.at(0).size(), literal.size(), literal) == 0;
 }
 
 }  // namespace test

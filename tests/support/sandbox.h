@@ -53,4 +53,13 @@ MATCHER_P2(LogLine, file, message,
     return number.find_first_not_of("0123456789") == std::string::npos;
 }
 
+/// True when `message`, as in "checker.cpp:88 Failed to get meminfo", names the line of the library's source
+/// that holds the beginning of its text.
+bool hasCallSite(const std::string& message);
+
+/// Matches a message of which hasCallSite() is true.
+MATCHER(NamesItsCallSite, "") {
+    return hasCallSite(arg);
+}
+
 }  // namespace test

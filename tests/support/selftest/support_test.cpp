@@ -5,6 +5,8 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
+
 #include "support/files.h"
 #include "support/programs.h"
 #include "support/sandbox.h"
@@ -54,6 +56,23 @@ TEST_F(SupportTest, ReadsTheDaemonLog) {
     EXPECT_THAT(daemonLogMessages().front(), Not(LogLine("check.cpp", "Failed to get meminfo")));
     EXPECT_THAT("checker.cpp:8x Failed", Not(LogLine("checker.cpp", "Failed")));
     EXPECT_THAT("checker.cpp: Failed", Not(LogLine("checker.cpp", "Failed")));
+}
+
+TEST_F(SupportTest, KnowsTheCallSiteOfAMessage) {
+    const std::string source = readFile(TERNHA_LIBRARY_SOURCES "/checker.cpp");
+    const auto end = source.begin() + static_cast<std::ptrdiff_t>(source.find("\"Failed to get meminfo\""));
+    const auto number = std::count(source.begin(), end, '\n') + 1;
+    const auto message = [](std::ptrdiff_t at, const char* text) {
+        return "checker.cpp:" + std::to_string(at) + " " + text;
+    };
+    EXPECT_TRUE(test::hasCallSite(message(number, "Failed to get meminfo")));
+    EXPECT_FALSE(test::hasCallSite(message(number - 1, "Failed to get meminfo")));
+    EXPECT_FALSE(test::hasCallSite(message(number + 1, "Failed to get meminfo")));
+    EXPECT_FALSE(test::hasCallSite(message(number, "Failed to get memory")));
+    EXPECT_FALSE(test::hasCallSite(message(0, "Failed to get meminfo")));
+    EXPECT_FALSE(test::hasCallSite(message(1000000, "Failed to get meminfo")));
+    EXPECT_FALSE(test::hasCallSite("nothing.cpp:1 Failed to get meminfo"));
+    EXPECT_FALSE(test::hasCallSite("Failed to get meminfo"));
 }
 
 TEST_F(SupportTest, NoticesALogLineWithoutATimeStamp) {
