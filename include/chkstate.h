@@ -31,7 +31,7 @@ class HASocketComm {
 
     /// True when the construction failed; errno then tells why, until something else changes it. Calls on
     /// such an object fail like those on any bad socket.
-    bool HasError() const;
+    bool HasError();
 
     /// Sends the bytes of `data` as one datagram, without a terminating zero: a client to its peer, a server
     /// to the sender of the datagram that it received last (before the first one: to its own address).

@@ -34,7 +34,7 @@ class DaemonLocalSocket {
     DaemonLocalSocket& operator=(const DaemonLocalSocket&) = delete;
 
     /// True after a failure that this object does not recover from.
-    bool hasError() const;
+    bool hasError();
 
     /// Makes the object a server: replaces the socket file at its path and listens, 100 connections waiting
     /// at most. The mode of the file follows the process's umask. True on success.

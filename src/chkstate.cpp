@@ -56,7 +56,9 @@ HASocketComm::~HASocketComm() {
     }
 }
 
-bool HASocketComm::HasError() const {
+// Not const: the qualifier would be part of the exported name.
+// NOLINTNEXTLINE(readability-make-member-function-const)
+bool HASocketComm::HasError() {
     return hasError;
 }
 
