@@ -28,7 +28,11 @@ Lock lockFor(std::timed_mutex& mutex, std::int32_t timeout) {
     Lock lock(mutex, std::try_to_lock);
     if (!lock.owns_lock()) {
         const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(timeout);
-        (void)lock.try_lock_until(wallClock() + (deadline - std::chrono::steady_clock::now()));
+        auto rest = deadline - std::chrono::steady_clock::now();
+        // Again when the wall clock was set forward, which ends a wait before its time.
+        while (rest.count() > 0 && !lock.try_lock_until(wallClock() + rest)) {
+            rest = deadline - std::chrono::steady_clock::now();
+        }
     }
     return lock;
 }

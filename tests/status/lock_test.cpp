@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "status.h"
+#include "status/stepped_clock.h"
 #include "support/sandbox.h"
 #include "support/wait.h"
 
@@ -76,6 +77,12 @@ TEST_F(StatusLockTest, DisksAreReplacedWithoutTheLock) {
     expectToGoAhead(status.errHandlingDiskMutex,
                     [&] { EXPECT_TRUE(status.setErrHandlingDisk(disks("sdx"))); });
     EXPECT_EQ(status.getErrHandlingDisk(), disks("sdx"));
+}
+
+TEST_F(StatusLockTest, AWaitIsAsLongWhenTheWallClockIsSetForward) {
+    test::stepClockAfterNextLook();
+    expectToGoAhead(status.errHandlingDiskMutex,
+                    [&] { EXPECT_EQ(status.getErrHandlingDisk(), disks("sda")); });
 }
 
 TEST_F(StatusLockTest, ThePeersDisksAreReadWithoutTheLock) {
