@@ -23,7 +23,7 @@ class SocketTest : public SandboxTest {
     }
 
     void TearDown() override {
-        EXPECT_THAT(_systemLog->texts(), ::testing::Each(NamesItsCallSite()));
+        EXPECT_THAT(_systemLog->texts(), ::testing::Each(::testing::Truly(hasCallSite)));
         EXPECT_THAT(_systemLog->entries(),
                     ::testing::Each(::testing::Field(&SystemLog::Entry::priority, LOG_USER | LOG_ERR)));
         closelog();

@@ -109,8 +109,11 @@ bool hasCallSite(const std::string& message) {
     static const Pattern kMessage("^([a-z_]+\\.cpp):([0-9]+) ");
     static const std::string kPlace = "%s:%d ";
     const std::vector<std::string> found = kMessage.find(message);
-    if (found.empty() || !exists(TERNHA_LIBRARY_SOURCES "/" + found.at(1))) {
+    if (found.empty()) {
         return false;
+    }
+    if (!exists(TERNHA_LIBRARY_SOURCES "/" + found.at(1))) {
+        return true;
     }
     const std::vector<std::string> source = lines(readFile(TERNHA_LIBRARY_SOURCES "/" + found.at(1)));
     const size_t number = std::stoul(found.at(2));

@@ -39,7 +39,12 @@ std::vector<std::string> daemonLogMessages();
 /// time stamp fails the test.
 std::vector<std::string> recordEntries();
 
-/// Matches exactly FILE + ":" + a decimal number + " " + MESSAGE.
+/// True when `message`, as in "checker.cpp:88 Failed to get meminfo", names the line of the library's source
+/// that holds the beginning of its text, or a file that is not one of the library's.
+bool hasCallSite(const std::string& message);
+
+/// Matches exactly FILE + ":" + a decimal number + " " + MESSAGE; for a file of the library's, the number of
+/// the line that logs it.
 MATCHER_P2(LogLine, file, message,
            std::string(negation ? "is not" : "is") + " \"" + file + ":<number> " + message + "\"") {
     const std::string line = arg;
@@ -50,16 +55,7 @@ MATCHER_P2(LogLine, file, message,
         return false;
     }
     const std::string number = line.substr(start.size(), line.size() - start.size() - end.size());
-    return number.find_first_not_of("0123456789") == std::string::npos;
-}
-
-/// True when `message`, as in "checker.cpp:88 Failed to get meminfo", names the line of the library's source
-/// that holds the beginning of its text.
-bool hasCallSite(const std::string& message);
-
-/// Matches a message of which hasCallSite() is true.
-MATCHER(NamesItsCallSite, "") {
-    return hasCallSite(arg);
+    return number.find_first_not_of("0123456789") == std::string::npos && hasCallSite(line);
 }
 
 }  // namespace test
