@@ -7,7 +7,9 @@
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <climits>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <mutex>
@@ -56,9 +58,25 @@ class Glob {
     bool _matched;
 };
 
-// The next line, or the next 511 bytes of a longer one, with its newline; false at the end of the output.
-bool readLine(const CommandPipe& pipe, Line& line) {
-    return std::fgets(line.data(), static_cast<int>(line.size()), pipe._fp) != nullptr;
+// The next line, or the next 511 bytes of a longer one, with its newline; nothing at the end of the output.
+// Like fgets, for which a signal would be the end.
+std::string_view readLine(const CommandPipe& pipe, Line& line) {
+    std::size_t size = 0;
+    while (size < line.size() - 1) {
+        const int byte = getc_unlocked(pipe._fp);
+        if (byte != EOF) {
+            line[size++] = static_cast<char>(byte);
+            if (byte == '\n') {
+                break;
+            }
+        } else if (std::ferror(pipe._fp) != 0 && errno == EINTR) {
+            std::clearerr(pipe._fp);
+        } else {
+            break;
+        }
+    }
+    line[size] = '\0';
+    return {line.data(), size};
 }
 
 // The words between blanks. Not by a stream, which would take a lack of memory for the end of the line.
@@ -344,7 +362,7 @@ float heartbeatLatency() {
         return 0.0F;
     }
     float average = 0.0F;
-    while (readLine(ping, line)) {
+    while (!readLine(ping, line).empty()) {
         if (std::sscanf(line.data(), "rtt min/avg/max/mdev = %*f/%f/%*f/%*f ms", &average) == 1) {
             break;
         }
@@ -374,7 +392,7 @@ bool InterfaceChecker::_interfaceDetail(const std::string& ifname,
         return false;
     }
     Line line = {};
-    if (!readLine(ifconfig, line)) {
+    if (readLine(ifconfig, line).empty()) {
         HA_LOG("Failed to get title from ifconfig output");
         return false;
     }
@@ -383,12 +401,12 @@ bool InterfaceChecker::_interfaceDetail(const std::string& ifname,
         const std::vector<std::string> title = split(line.data());
         for (std::size_t i = 0; i < title.size(); ++i) {
             if (startsWith(title[i], "RX") || startsWith(title[i], "TX")) {
-                columns[title[i]] = static_cast<long long>(i);
+                columns.emplace(title[i], i);
             }
         }
     }
     bool isFound = false;
-    while (readLine(ifconfig, line)) {
+    while (!readLine(ifconfig, line).empty()) {
         // A prefix suffices (eth1 finds eth10 as well); the first such line counts.
         if (isFound || columns.empty() || !startsWith(line.data(), ifname)) {
             continue;
@@ -443,8 +461,8 @@ void recordCMD(const char* const* argv) {
         return;
     }
     std::string output;
-    while (readLine(command, line)) {
-        output += line.data();
+    for (std::string_view piece; !(piece = readLine(command, line)).empty();) {
+        output += piece;
     }
     // Before the pipe closes: what a failing program printed is recorded, then its failure is reported.
     recordLog->set("\n" + output);

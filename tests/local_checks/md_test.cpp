@@ -21,6 +21,7 @@ class MdTest : public test::SandboxTest {
 
 TEST_F(MdTest, WithoutArraysEachCallLeavesALine) {
     test::makeDirectories("/sys/block/sda");
+    setAction("xmd0", "resync\n");  // only names that begin so count
     EXPECT_FALSE(isMDResync());
     EXPECT_FALSE(isMDResync());
     EXPECT_THAT(test::daemonLogMessages(),
@@ -102,6 +103,7 @@ TEST_F(MdTest, AValueIsTheWholeFirstLine) {
     EXPECT_FALSE(isValue(std::string(100000, 'x'), std::string(99999, 'x')));
     EXPECT_FALSE(isValue(std::string(99999, 'x'), std::string(100000, 'x')));
     EXPECT_FALSE(isSysfsValue("/tmp", "1"));  // a directory opens and has no lines
+    EXPECT_TRUE(isSysfsValue("/tmp", ""));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
     EXPECT_FALSE(isSysfsValue("/tmp/missing", ""));
     EXPECT_THAT(test::daemonLogMessages(),

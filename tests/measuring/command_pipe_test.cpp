@@ -10,6 +10,9 @@
 
 namespace {
 
+static_assert(!std::is_copy_constructible_v<TERN::HA::Daemon::CommandPipe>);
+static_assert(!std::is_copy_assignable_v<TERN::HA::Daemon::CommandPipe>);
+
 using TERN::HA::Daemon::CommandPipe;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;

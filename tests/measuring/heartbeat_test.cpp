@@ -76,6 +76,14 @@ TEST_F(HeartbeatTest, OnlyTheFirstSummaryCounts) {
     EXPECT_FLOAT_EQ(heartbeatLatency(), 0.15F);
 }
 
+TEST_F(HeartbeatTest, NothingIsReadAfterTheSummary) {
+    // More than a pipe holds: ping ends by SIGPIPE.
+    test::replaceProgram("/bin/ping", std::string(SUMMARY) + "exec /usr/bin/head -c 200000 /dev/zero");
+    EXPECT_FLOAT_EQ(heartbeatLatency(), 0.15F);
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("checker.cpp", "Failed to exec /bin/ping return code: 13")));
+}
+
 TEST_F(HeartbeatTest, APingThatCannotBeStartedLeavesTwoLines) {
     test::hideProgram("/bin/ping");
     EXPECT_EQ(heartbeatLatency(), 0.0F);

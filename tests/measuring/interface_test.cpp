@@ -11,8 +11,10 @@ namespace {
 
 using namespace std::chrono_literals;
 using TERN::HA::Daemon::InterfaceChecker;
+using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
+using ::testing::MatchesRegex;
 
 constexpr char TITLE[] = "Iface      MTU    RX-OK RX-ERR RX-DRP RX-OVR    TX-OK TX-ERR TX-DRP TX-OVR Flg";
 
@@ -57,6 +59,16 @@ TEST_F(InterfaceTest, TheRealIfconfigCountsPackets) {
     ASSERT_TRUE(socket.receive(5s).has_value());
     EXPECT_EQ(sample(), 0.0F);
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+// Were the title or the interface not found, the rate would be 0 all the same.
+TEST_F(InterfaceTest, TheRealIfconfigHasTheTitleAndTheLineThatAreLookedFor) {
+    test::UdpSocket socket("127.0.0.1");
+    socket.send("packet", "127.0.0.1", socket.port());
+    ASSERT_TRUE(socket.receive(5s).has_value());
+    const std::vector<std::string> output = test::lines(test::run({"/sbin/ifconfig", "-s"}).output);
+    EXPECT_THAT(output, Contains(MatchesRegex("Iface +MTU +RX-OK +RX-ERR .* TX-OK +TX-ERR .*")));
+    EXPECT_THAT(output, Contains(MatchesRegex("lo +[0-9]+ +[1-9][0-9]* +0 .*")));
 }
 
 TEST_F(InterfaceTest, IfconfigIsAskedForItsShortListing) {
@@ -118,8 +130,8 @@ TEST_F(InterfaceTest, TheRateIsNotClamped) {
 }
 
 TEST_F(InterfaceTest, TheDivisionIsInSinglePrecision) {
-    print(line("eth1", "0 16777217 0 0 16777216 0 0 0"));
-    EXPECT_EQ(sample(), 16777216.0F / 33554432.0F);
+    print(line("eth1", "1 16777217 0 0 0 0 0 0"));
+    EXPECT_EQ(sample(), 16777216.0F / 16777218.0F);  // in double precision it rounds to another float
 }
 
 TEST_F(InterfaceTest, AnInterfaceThatIsNotListedCountsTheColumns) {
@@ -145,6 +157,40 @@ TEST_F(InterfaceTest, APrefixOfTheLineSufficesAndTheFirstLineCounts) {
     checker = {};
     print(std::string(TITLE) + "\n" + eth10 + eth1);
     EXPECT_EQ(sample(), 1.0F);
+}
+
+TEST_F(InterfaceTest, AColumnThatComesTwiceCountsOnce) {
+    print("Iface RX-OK RX-ERR RX-ERR\neth1 60 40 340");
+    EXPECT_FLOAT_EQ(sample(), 0.4F);
+}
+
+TEST_F(InterfaceTest, WordsAreWhatAnyBlanksPart) {
+    print("Iface\tRX-OK \v RX-ERR\f\r\neth1\t60\r40\v");
+    EXPECT_FLOAT_EQ(sample(), 0.4F);
+}
+
+TEST_F(InterfaceTest, LongLinesAreReadInPiecesOf511Bytes) {
+    // The last column begins where the second piece of the title does; a piece of a line counts as a line.
+    const std::string title = "Iface RX-OK" + std::string(500, ' ');
+    ASSERT_EQ(title.size(), 511U);
+    print(title + "RX-ERR\neth1 60 40");
+    EXPECT_EQ(sample(), 0.0F);
+    checker = {};
+    print("Iface RX-OK RX-ERR\n" + std::string(511, 'x') + "eth1 60 40");
+    EXPECT_FLOAT_EQ(sample(), 0.4F);
+}
+
+TEST_F(InterfaceTest, OnlyTheFirstMatchingLineHasToBeInOrder) {
+    print(line("eth1", "60 40 0 0 0 0 0 0") + "\neth1 1500\neth1 1500 99999999999999999999 0 0 0 0 0 0 0");
+    EXPECT_FLOAT_EQ(sample(), 0.4F);
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
+}
+
+TEST_F(InterfaceTest, TheListingIsReadToItsEnd) {
+    // More than a pipe holds: it would end by a signal if nobody read on.
+    print(line("eth1", "60 40 0 0 0 0 0 0"), "printf '%0200000d' 0; exit 0");
+    EXPECT_FLOAT_EQ(sample(), 0.4F);
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
 TEST_F(InterfaceTest, AnIfconfigThatCannotBeStartedLeavesThreeLines) {
@@ -186,6 +232,13 @@ INSTANTIATE_TEST_SUITE_P(Counters, OutOfRangeTest,
                          ::testing::Values("9223372036854775807", "-9223372036854775808",
                                            "99999999999999999999", "-99999999999999999999",
                                            "0x7fffffffffffffff"));
+
+TEST_F(InterfaceTest, ACounterOutOfRangeIsReportedBeforeTheFailureOfIfconfig) {
+    print(line("eth1", "99999999999999999999 0 0 0 0 0 0 0"), "exit 1");
+    expectFailure(ElementsAre(test::LogLine("checker.cpp", "strtoll failed: 99999999999999999999"),
+                              test::LogLine("checker.cpp", "Failed to exec /sbin/ifconfig return code: 256"),
+                              test::LogLine("checker.cpp", "Failed to get interface detail")));
+}
 
 TEST_F(InterfaceTest, TheLargestCountersDoNotHarm) {
     print(line("eth1",

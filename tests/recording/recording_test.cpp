@@ -1,5 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <unistd.h>
 
 #include "checker.h"
@@ -27,9 +28,10 @@ class RecordingTest : public test::SandboxTest {
 };
 
 TEST_F(RecordingTest, AnEntryIsTheStampsLineTheOutputAndAnEmptyLine) {
-    test::replaceProgram("/bin/df", "echo Filesystem; echo tmpfs");
+    test::replaceProgram("/bin/df", "echo Filesystem; echo tmpfs; echo $# arguments");
     recordDF();
-    EXPECT_THAT(test::recordText(), MatchesRegex("....-..-..T..:..:..[+-]..:.. \nFilesystem\ntmpfs\n\n"));
+    EXPECT_THAT(test::recordText(),
+                MatchesRegex("....-..-..T..:..:..[+-]..:.. \nFilesystem\ntmpfs\n0 arguments\n\n"));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
@@ -48,6 +50,26 @@ TEST_F(RecordingTest, LongLinesAreJoined) {
     record("printf '%0511d' 0; printf '%01000d' 0; echo end; printf '%0600d' 0");
     EXPECT_THAT(test::recordEntries(),
                 ElementsAre("\n" + std::string(1511, '0') + "end\n" + std::string(600, '0')));
+}
+
+TEST_F(RecordingTest, EveryByteIsRecorded) {
+    record("printf 'a\\000b\\nc\\377\\n'");
+    EXPECT_THAT(test::recordEntries(), ElementsAre(std::string("\na\0b\nc\377\n", 8)));
+}
+
+TEST_F(RecordingTest, ASignalDoesNotCutTheOutput) {
+    struct sigaction action = {};
+    struct sigaction before = {};
+    action.sa_handler = [](int) {};  // without SA_RESTART
+    ASSERT_EQ(sigaction(SIGUSR1, &action, &before), 0);
+    record("i=0; while [ $i -lt 200 ]; do i=$((i + 1)); kill -USR1 $PPID; echo $i; done");
+    ASSERT_EQ(sigaction(SIGUSR1, &before, nullptr), 0);
+    std::string all = "\n";
+    for (int i = 1; i <= 200; ++i) {
+        all += std::to_string(i) + "\n";
+    }
+    EXPECT_THAT(test::recordEntries(), ElementsAre(all));
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
 TEST_F(RecordingTest, OnlyStandardOutputIsRecorded) {
@@ -108,6 +130,13 @@ TEST_F(RecordingTest, TheMemoryIsRecordedAsTheKernelShowsIt) {
     test::writeFile("/proc/meminfo", meminfo);
     recordMemoryInfo();
     EXPECT_THAT(test::recordEntries(), ElementsAre("\n" + meminfo));
+}
+
+TEST_F(RecordingTest, MemoryFiguresThatAreEmptyAreAnEntryToo) {
+    test::writeFile("/proc/meminfo", "");
+    recordMemoryInfo();
+    EXPECT_THAT(test::recordEntries(), ElementsAre("\n"));
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
 TEST_F(RecordingTest, WithoutMemoryFiguresThereIsALineAndNoEntry) {
