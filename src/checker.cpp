@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <exception>
 #include <mutex>
 #include <new>
 #include <string_view>
@@ -125,9 +126,11 @@ std::string IsRemoteAlive::handle(Status&) {
     return ALIVE;
 }
 
-bool IsRemoteAlive::operator()() {
+bool IsRemoteAlive::operator()() try {
     std::string reply;
     return _sendToRemote(reply) && reply == ALIVE;
+} catch (const std::exception&) {
+    return false;  // no memory
 }
 
 // ---- Host name of the peer ----
@@ -140,12 +143,14 @@ std::string GetRemoteHostname::handle(Status&) {
     return getLocalHostname();
 }
 
-bool GetRemoteHostname::operator()(std::string& hostname) {
+bool GetRemoteHostname::operator()(std::string& hostname) try {
     if (!_sendToRemote(hostname)) {
         HA_LOG("Failed to get remote hostname");
         return false;
     }
     return true;
+} catch (const std::exception&) {
+    return false;  // no memory
 }
 
 // ---- The peer's md resync ----
@@ -259,7 +264,7 @@ bool isDRBDConnect() {
 
 // ---- md resync and ATA error handling ----
 
-bool isSysfsValue(const std::string& path, const std::string& expected) {
+bool isSysfsValue(const std::string& path, const std::string& expected) try {
     const File file(path.c_str(), O_RDONLY);
     if (!file.isOpen()) {
         HA_LOG("Failed to open sysfs file " + path);
@@ -278,9 +283,11 @@ bool isSysfsValue(const std::string& path, const std::string& expected) {
         }
     }
     return line == expected;
+} catch (const std::exception&) {
+    return false;  // no memory
 }
 
-bool isMDResync() {
+bool isMDResync() try {
     const Glob arrays("/sys/block/md*");
     if (!arrays.matched()) {
         HA_LOG("Failed to set globBuf from /sys/block/md*");
@@ -289,9 +296,11 @@ bool isMDResync() {
     return std::any_of(arrays.begin(), arrays.end(), [](const char* array) {
         return isSysfsValue(std::string(array) + "/md/sync_action", RESYNC);
     });
+} catch (const std::exception&) {
+    return false;  // no memory
 }
 
-bool isDiskErrHandling(Json::Value& disks) {
+bool isDiskErrHandling(Json::Value& disks) try {
     const Glob ports("/sys/class/ata_port/ata*");
     if (!ports.matched()) {
         HA_LOG("Failed to set globBuf from /sys/class/ata_port/ata*");
@@ -310,6 +319,8 @@ bool isDiskErrHandling(Json::Value& disks) {
         }
     }
     return !disks.empty();
+} catch (const std::exception&) {
+    return false;  // no memory
 }
 
 bool devNameByAtaPath(char* path, std::string& name) {

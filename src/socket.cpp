@@ -11,6 +11,7 @@
 #include <csignal>
 #include <cstddef>
 #include <cstring>
+#include <exception>
 #include <utility>
 
 #include "ha_log.h"
@@ -129,7 +130,7 @@ bool DaemonLocalSocket::serverListen() {
     return _serverListen(fd);
 }
 
-bool DaemonLocalSocket::_serverListen(int fd) {
+bool DaemonLocalSocket::_serverListen(int fd) try {
     std::fill(std::begin(_buffer), std::end(_buffer), '\0');
     if (recv(fd, _buffer, sizeof _buffer - 1, 0) == -1) {
         syslog(LOG_ERR, "%s:%d Failed to recv: %m", __FILE_NAME__, __LINE__);
@@ -153,6 +154,10 @@ bool DaemonLocalSocket::_serverListen(int fd) {
         return false;
     }
     return true;
+} catch (const std::exception&) {  // no memory
+    syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__,
+           static_cast<const char*>(_buffer));
+    return false;
 }
 
 bool DaemonLocalSocket::_clientConnect() {
@@ -178,7 +183,7 @@ bool DaemonLocalSocket::_clientConnect() {
     return true;
 }
 
-bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& reply) {
+bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& reply) try {
     if (_hasError) {
         syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
         return false;
@@ -207,6 +212,10 @@ bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& repl
         return false;
     }
     return true;
+} catch (const std::exception&) {  // no memory
+    syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
+    _hasError = true;
+    return false;
 }
 
 }  // namespace TERN::HA::Daemon
