@@ -127,6 +127,10 @@ TEST_F(MemoryTest, LocalChecks) {
     md.prepare = [] { test::removeTree("/sys/block/md0"); };
     md.result = "no";
     expectWhole(md);
+    md.name = "isSysfsValue of a file that is not there";
+    const std::string missing = "/sys/block/md0/md/sync_action";
+    md.run = [&missing] { return yesNo(isSysfsValue(missing, "resync")); };
+    expectWhole(md);
     Operation errors{"isDiskErrHandling",
                      [] {},
                      [] {
@@ -303,6 +307,16 @@ TEST_F(MemoryTest, AskingWhetherThePeerIsAlive) {
     const bool hasFailed = memory.hasFailed();
     EXPECT_TRUE(isAlive);
     EXPECT_FALSE(hasFailed);
+}
+
+// With an address so long that it needs some, lack of it is a missing answer.
+TEST_F(MemoryTest, AskingAPeerWithoutAnAddress) {
+    remoteIP("no address, and longer than a string holds by itself");
+    const test::FailingMemory memory(1);
+    const bool isAlive = IsRemoteAlive()();
+    const bool hasFailed = memory.hasFailed();
+    EXPECT_FALSE(isAlive);
+    EXPECT_TRUE(hasFailed);
 }
 
 TEST_F(MemoryTest, AskingThePeer) {
