@@ -55,6 +55,15 @@ class DaemonTest : public ::testing::Test {
         return daemon;
     }
 
+    // Until it listens for the peer's questions, too: those that come before are lost.
+    static void waitForAnswers() {
+        test::UdpSocket asker("127.0.0.4");
+        EXPECT_TRUE(test::eventually(10s, [&asker] {
+            asker.send("is_alive", "127.0.0.1", 7499);
+            return asker.receive(50ms).has_value();
+        }));
+    }
+
     // Ends it as a supervisor does and expects what that may expect.
     static void stop(test::Process& daemon, int signal = SIGTERM) {
         const test::Stopwatch stopwatch;
@@ -339,6 +348,7 @@ TEST_F(DaemonTest, ASocketThatCannotBeBoundEndsIt) {
 
 TEST_F(DaemonTest, AnUnknownQuestionEndsItBySignal) {
     auto daemon = startAndWait();
+    waitForAnswers();
     test::UdpSocket stranger("127.0.0.3", 40000);
     stranger.send("who_are_you", "127.0.0.1", 7499);
     const auto status = daemon.waitFor(10s);
@@ -359,6 +369,7 @@ int answersAt(test::UdpSocket& socket, const std::string& expected, std::chrono:
 TEST_F(DaemonTest, AFloodOfQuestionsGetsNoAnswerTwiceOrForSomebodyElse) {
     test::writeFile("/tmp/.ha.hostname.original", "node-a");
     auto daemon = startAndWait();
+    waitForAnswers();
     const std::map<std::string, std::string> answers = {
         {"is_alive", "alive"},
         {"is_md_resync", "not_resync"},
