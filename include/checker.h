@@ -1,5 +1,5 @@
 /// @file
-/// The five questions to the peer, the checks of this node, and what is recorded of it.
+/// The five peer checks, the local checks, diagnostic recording and host identity.
 
 #pragma once
 
@@ -16,151 +16,174 @@
 
 namespace TERN::HA::Daemon {
 
-// The five questions to the peer. All may be asked from any thread; each asking blocks up to 3 seconds for
-// the answer (RebootRemote longer). Failures are logged, with the texts given here, and never thrown.
+// The five peer checks. An asking side (call operator) sends its request to remoteIP("") and blocks for up to
+// 3 seconds for the reply, RebootRemote for longer. Failures are reported by the result and logged with the
+// texts given here. Nothing throws, not even when memory runs out: the check fails. Thread-safe.
 
-/// "is_alive": is the peer's daemon up and answering?
+/// "is_alive": liveness probe.
 class IsRemoteAlive : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// True exactly when the answer is "alive". Stores and logs nothing: the caller hands the result to
+    /// Probe the peer. Returns true exactly when the reply is "alive", false for any other reply and when
+    /// none arrived. Logs nothing and stores nothing: the caller passes the result to
     /// Status::setRemoteAlive.
     bool operator()() override;
+
+    /// Return "alive".
     std::string handle(Status& status) override;
     std::string getType() override;
 
-    static CheckerRegister<IsRemoteAlive> reg;  ///< makes the question known when the library is loaded
+    static CheckerRegister<IsRemoteAlive> reg;  ///< registers the check when the library is loaded
 };
 
-/// "is_md_resync": is the peer resynchronising an md array?
+/// "is_md_resync": whether the peer has an md resync in progress.
 class IsRemoteMDResync : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// True exactly when the answer is "resync". False also when there is no answer: "Failed to recv remote
-    /// md resync responce".
+    /// Return true exactly when the reply is "resync". Returns false for any other reply, and when none
+    /// arrived, logging "Failed to recv remote md resync responce".
     bool operator()() override;
+
+    /// Return "resync" when `status.isMDResync` is set, "not_resync" otherwise.
     std::string handle(Status& status) override;
     std::string getType() override;
 
-    static CheckerRegister<IsRemoteMDResync> reg;  ///< makes the question known when the library is loaded
+    static CheckerRegister<IsRemoteMDResync> reg;  ///< registers the check when the library is loaded
 };
 
-/// "is_disk_err_handling": is the peer handling disk errors, and on which disks?
+/// "is_disk_err_handling": whether the peer is handling disk errors, and on which disks.
 ///
-/// The answer must fit the 63 bytes of a datagram: two disk names of usual length do, three do not. An answer
-/// that was cut counts as one that cannot be parsed.
+/// The reply must fit in 63 bytes: two disk names such as "sda" fit, three do not. The asking side sees a
+/// truncated reply as one that cannot be parsed.
 class IsRemoteDiskErrHandling : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// Returns the peer's flag and puts its list (array of device names; null when the answer has none) into
-    /// `disks`; the two are independent. False with `disks` as it was when there is no answer ("Failed to
-    /// recv remote disk error handling responce") or it is not a JSON object with a readable flag ("Failed to
-    /// parse remote disk error info").
+    /// Return the peer's flag and store its list, as sent, in `disks`.
+    ///
+    /// The flag and the list are independent of each other. A reply without the list sets `disks` to null,
+    /// one without the flag returns false. Returns false with `disks` unchanged when no reply arrived
+    /// ("Failed to recv remote disk error handling responce") and when the reply is not JSON or its flag
+    /// cannot be read as a bool ("Failed to parse remote disk error info").
     bool operator()(Json::Value& disks) override;
+
+    /// Return the flag and the list of `status` as compact JSON. Blocks for the lock of the list.
     std::string handle(Status& status) override;
     std::string getType() override;
 
-    static CheckerRegister<IsRemoteDiskErrHandling>
-        reg;  ///< makes the question known when the library is loaded
+    static CheckerRegister<IsRemoteDiskErrHandling> reg;  ///< registers the check when the library is loaded
 };
 
-/// "reboot_remote": makes the peer reboot at once.
+/// "reboot_remote": make the peer reboot at once.
 class RebootRemote : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// Asks the peer to reboot and follows it down: NodeRebootPending from the request on, then, when
-    /// `status` no longer counts the peer as alive ("Remote offline") or after 30 tests one second apart,
-    /// NodeRebooting. It does not clear the alive bit: another thread must do so through
-    /// Status::setRemoteAlive. Always true, also when the request went unanswered, as it does when the peer
-    /// obeys ("Failed to reboot remote, but keep checking"). Blocks up to 33 seconds.
+    /// Order the peer to reboot and follow it down. Returns true.
+    ///
+    /// Logs "Failed to reboot remote, but keep checking" when no reply arrived, which is normal: a peer that
+    /// obeys cannot reply. Then sets NodeRebootPending in `status` and tests up to 30 times, a second apart,
+    /// whether the peer is still alive; "Remote offline" is logged when it is not. In either case
+    /// NodeRebooting is then set and NodeRebootPending cleared. This function never clears NodeAlive:
+    /// another thread must do so through Status::setRemoteAlive. Blocks for up to 33 seconds.
     bool operator()(Status& status);
 
-    /// Reboots this machine: moves both logs to disk, flushes the file systems and writes "b" to
-    /// /proc/sysrq-trigger. Returns the empty string when that file cannot be written.
+    /// Reboot this machine: move both logs to disk, flush the file systems and write "b" to
+    /// /proc/sysrq-trigger. Returns the empty string when the machine goes on nevertheless, as it does when
+    /// that file cannot be written.
     std::string handle(Status& status) override;
     std::string getType() override;
 
-    static CheckerRegister<RebootRemote> reg;  ///< makes the question known when the library is loaded
+    static CheckerRegister<RebootRemote> reg;  ///< registers the check when the library is loaded
 };
 
-/// "remote_hostname": what is the peer's own host name?
+/// "remote_hostname": the peer's own host name.
 class GetRemoteHostname : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// Puts the answer (up to 63 bytes, possibly empty, with the line end if the peer's name has one) into
-    /// `hostname` and returns true; false when there is no answer: "Failed to get remote hostname". Do not
-    /// use `hostname` then.
+    /// Store the reply in `hostname`: 0 to 63 bytes as sent, possibly with a line end. Returns true on
+    /// success; when no reply arrived, logs "Failed to get remote hostname" and returns false.
     bool operator()(std::string& hostname);
+
+    /// Return getLocalHostname().
     std::string handle(Status& status) override;
     std::string getType() override;
 
-    static CheckerRegister<GetRemoteHostname> reg;  ///< makes the question known when the library is loaded
+    static CheckerRegister<GetRemoteHostname> reg;  ///< registers the check when the library is loaded
 };
 
-// Local checks. They keep nothing between calls and may run on any thread.
+// Local checks. They keep no state and never throw. Thread-safe. They block for as long as the kernel takes
+// to read its files.
 
-/// True when any line of /proc/drbd holds one of the connection states in which both nodes are linked
-/// ("Connected", the handshake, sync and verify states; a plain case-sensitive substring anywhere). With
-/// several resources one that is connected suffices. False otherwise; "Failed to open /proc/drbd" when it
-/// cannot be opened.
+/// Return true when any line of /proc/drbd contains a connection state in which both nodes are linked:
+/// "Connected" or a handshake, resync or verify state. The test is for a case-sensitive substring; with
+/// several resources, one that is connected is enough. Logs "Failed to open /proc/drbd" and returns false
+/// when that file cannot be opened.
 bool isDRBDConnect();
 
-/// True when the sync_action of any md array reads exactly "resync" (recover, check and the like do not
-/// count). Without md arrays: false and "Failed to set globBuf from /sys/block/md*".
+/// Return true when the sync_action of any md array is exactly "resync"; recover, check and the others do not
+/// count. Logs "Failed to set globBuf from /sys/block/md*" and returns false when there is no md array.
 bool isMDResync();
 
-/// True when at least one disk is on an ATA port whose error handling runs. `disks` becomes the array of
-/// those disks' device names, in the order of the sorted port paths (ata10 before ata2). Without ATA ports:
-/// false, `disks` as it was, and "Failed to set globBuf from /sys/class/ata_port/ata*". A port whose disk has
-/// no name counts for nothing: "Failed to get dev name by ata path: " and the port's path.
+/// Find the disks on ATA ports under error handling.
+///
+/// @param disks  becomes an array of their device names in the order of the sorted port paths (ata10 before
+///               ata2); unchanged when there are no ATA ports
+/// @return true when there is at least one such disk. Logs "Failed to set globBuf from
+///         /sys/class/ata_port/ata*" when there are no ATA ports, and "Failed to get dev name by ata path: "
+///         and the path for a port whose disk has no name; such a port does not count.
 bool isDiskErrHandling(Json::Value& disks);
 
-/// Puts the device name (at most 7 characters) of the disk on the ATA port whose path or name is `path` into
-/// `name`; false with `name` as it was when the port has none. `path` may be modified.
+/// Store the device name (1 to 7 characters) of the disk on the ATA port `path` (a path or a bare port name)
+/// in `name`. Returns false with `name` unchanged when the port has no disk. `path` may be modified.
 bool devNameByAtaPath(char* path, std::string& name);
 
-/// True exactly when the first line of the file at `path`, without its newline, equals `expected`. False and
-/// "Failed to open sysfs file " with the path when it cannot be opened.
+/// Return true when the first line of the file at `path`, without its newline, equals `expected`. Logs
+/// "Failed to open sysfs file " and the path, and returns false, when the file cannot be opened.
 bool isSysfsValue(const std::string& path, const std::string& expected);
 
-/// Runs a program and holds the stream of its output. One thread at a time.
+/// A running program and the stream of its standard output. Not thread-safe: use an object from one thread at
+/// a time.
 class CommandPipe {
  public:
-    /// Starts argv[0] with the null-terminated vector `argv`, without a shell. When that fails, or the vector
-    /// is empty, _failed is set and the log has "Failed to exec command: " and the program's path.
+    /// Start argv[0] with the null-terminated argument vector `argv`, without a shell. On failure, and for an
+    /// empty vector, sets _failed and logs "Failed to exec command: " and the program's path.
     explicit CommandPipe(const char* const* argv);
 
-    /// Closes the stream and waits for the program to end. Unless that exited with code 0 the log has "Failed
-    /// to exec PATH return code: N", N being the raw wait status in decimal (256 for exit code 1).
+    /// Close the stream and wait for the program, without limit. Logs "Failed to exec PATH return code: N"
+    /// unless it exited with code 0; N is the raw wait status in decimal (256 for exit code 1).
     ~CommandPipe();
 
     CommandPipe(const CommandPipe&) = delete;
     CommandPipe& operator=(const CommandPipe&) = delete;
 
-    FILE* _fp;     ///< the program's standard output, read by the owner with fgets; null when not started
-    bool _failed;  ///< it could not be started
-    std::string _command;  ///< its path, for messages
+    FILE* _fp;             ///< the program's standard output; null when it could not be started
+    bool _failed;          ///< the program could not be started
+    std::string _command;  ///< path of the program, for messages
 };
 
-/// The average round trip to remoteIP("") in milliseconds, from three requests of /bin/ping. 0 when ping
-/// cannot be started (two lines in the log) or printed no average. Blocks 0.4 seconds and the round trips, 10
-/// seconds when nothing answers.
+/// Return the average round trip to remoteIP("") in milliseconds, measured by /bin/ping with three requests.
+/// Returns 0 when ping could not be started or printed no average; the log then has the reason. Blocks for
+/// about 0.4 seconds and the round trips, for 10 seconds when the peer does not reply. Thread-safe.
 float heartbeatLatency();
 
-/// The share of packets of the DRBD interface (drbdIF("")) that were not OK (errors, drops, overruns), from
-/// sample to sample. An object belongs to one thread at a time.
+/// Non-OK packet rate of the DRBD interface (drbdIF("")), from one sample to the next. Not thread-safe: use
+/// an object from one thread at a time.
 class InterfaceChecker {
  public:
-    /// Puts the share since the previous call, the first time since the counters began, into `rate` and
-    /// returns true. 0 to 1 in normal operation; outside that when the counters went backwards. An interface
-    /// that is not listed is no failure. False with `rate` as it was when /sbin/ifconfig cannot be run or
-    /// printed nothing, lines too short or a counter out of range; the last line logged is then "Failed to
-    /// get interface detail". Blocks until ifconfig ends.
+    /// Sample the counters of /sbin/ifconfig.
+    ///
+    /// @param rate  receives the share of packets that were not OK (errors, drops, overruns) since the
+    ///              previous sample, since the counters were reset for the first one. 0 to 1; outside this
+    ///              range when the counters went backwards. Unchanged on failure.
+    /// @return true on success, also when the interface is not listed: the rate is then meaningless. False,
+    ///         with "Failed to get interface detail" as the last line logged, when ifconfig could not be
+    ///         started or printed nothing, a line too short, or a counter out of range.
+    ///
+    /// Blocks until ifconfig ends.
     bool networkNonOkRate(float& rate);
 
  private:
@@ -172,33 +195,35 @@ class InterfaceChecker {
     long long _lastNonOkTotal = 0;
 };
 
-// Recording: each call adds one entry to the record log, which begins on the line after its time stamp. Any
-// thread; failures go to the daemon log and leave no entry.
+// Diagnostic recording: each call appends one entry to the record log, whose text begins on the line after
+// the time stamp. A failure goes to the daemon log and leaves no entry. Thread-safe.
 
-/// The record as compact JSON.
+/// Record the status as compact JSON. Blocks for the locks of the record.
 void recordStatus(Status& status);
 
-/// Everything that argv[0], run with the null-terminated vector `argv`, writes to its standard output; an
-/// entry is made also when that is nothing or the program fails. None when it cannot be started (two lines in
-/// the daemon log). Blocks until the program ends, and holds its whole output in memory.
+/// Run argv[0] with the null-terminated argument vector `argv` and record everything that it writes to its
+/// standard output; empty output and a failing program are recorded, too. Blocks until the program ends and
+/// holds its output in memory.
 void recordCMD(const char* const* argv);
 
-/// The process list, by /bin/ps.
+/// Record the process list (/bin/ps). Blocks as recordCMD does.
 void recordPS();
 
-/// The usage of the file systems, by /bin/df.
+/// Record the file-system usage (/bin/df). Blocks as recordCMD does, without limit on a dead network file
+/// system.
 void recordDF();
 
-/// The content of /proc/meminfo; "Failed to get meminfo" when it cannot be opened.
+/// Record /proc/meminfo. Logs "Failed to get meminfo" when it cannot be opened.
 void recordMemoryInfo();
 
-/// This node's own host name, as it was before the cluster's shared name replaced it: the bytes of
-/// /tmp/.ha.hostname.original, a trailing newline included; empty while that is missing or empty. A name once
-/// read is kept for the life of the process. Thread-safe.
+/// Return this node's own host name, as it was before the HA package took over the shared name: the bytes of
+/// /tmp/.ha.hostname.original, a trailing newline included. Returns the empty string while that file is
+/// missing or empty. A name once read is kept for the life of the process. Thread-safe; blocks for the
+/// reading of a small file.
 std::string getLocalHostname();
 
-/// True when the cluster's tool reports a constraint on this node (it exits with status 0). Any thread;
-/// blocks until the tool ends.
+/// Return true when the HA tool reports a constraint on this node (it exits with status 0), false otherwise
+/// and when it cannot be started. Blocks until the tool ends. Thread-safe.
 bool isHadConstraints();
 
 }  // namespace TERN::HA::Daemon

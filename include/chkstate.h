@@ -1,5 +1,5 @@
 /// @file
-/// The datagrams of the peer protocol.
+/// Datagram transport of the peer protocol.
 
 #pragma once
 
@@ -11,59 +11,68 @@
 
 #pragma GCC visibility push(default)
 
-/// The UDP port on which every node answers its peer.
+/// UDP port on which every node answers its peer.
 constexpr std::uint16_t HA_PEER_PORT = 7499;
 
-/// One short text datagram over UDP/IPv4 as a question, one as the answer.
+/// Transport of one short text datagram as a request and one as its reply, over UDP/IPv4. Base of the server
+/// and the client end; owns its socket.
 ///
-/// An object belongs to one thread at a time and owns its socket. Create a server or a client; this base
-/// holds what both share. There is no virtual destructor: destroy an object through its own type.
+/// Not thread-safe: use an object from one thread at a time. The destructor is not virtual: destroy an object
+/// through its own type.
 class HASocketComm {
  public:
-    /// Opens the socket and takes `ip` (dotted quad) and HA_PEER_PORT as the peer's address. A string that is
-    /// not a dotted quad counts as 0.0.0.0. When no socket can be had, HasError() is true and the system log
-    /// says so.
+    /// Open the socket and set the peer's address.
+    ///
+    /// @param ip  the peer's IPv4 address, dotted quad; anything else counts as 0.0.0.0. The port is
+    ///            HA_PEER_PORT.
+    ///
+    /// HasError() is true when no socket could be opened; the system log then has "Failed to set socket".
     explicit HASocketComm(const std::string& ip);
     ~HASocketComm();
 
     HASocketComm(const HASocketComm&) = delete;
     HASocketComm& operator=(const HASocketComm&) = delete;
 
-    /// True when the construction failed; errno then tells why, until something else changes it. Calls on
-    /// such an object fail like those on any bad socket.
+    /// Return true when the construction failed; errno has the reason right after it. Send and Recv on such
+    /// an object return -1.
     bool HasError();
 
-    /// Sends the bytes of `data` as one datagram, without a terminating zero: a client to its peer, a server
-    /// to the sender of the datagram that it received last (before the first one: to its own address).
-    /// Returns the number of bytes sent, -1 on failure.
+    /// Send `data` as one datagram, without a terminating zero. A client sends to its peer; a server sends to
+    /// the sender of the datagram that it received last, and to its own address before the first one.
+    ///
+    /// @return the number of bytes sent, -1 on failure. Never waits for the peer.
     int Send(const std::string& data);
 
-    /// Receives one datagram into `out` and returns the number of bytes received, 0 for an empty datagram. At
-    /// most 63 bytes are read, the rest of a longer datagram is lost, and `out` ends before the first zero
-    /// byte. Returns -1 and leaves `out` as it was when the time-out ran out, a signal came or the receive
-    /// failed. Blocks up to the receive time-out, without one until a datagram comes.
+    /// Receive one datagram.
+    ///
+    /// @param out  receives the text up to the first zero byte; at most 63 bytes of the datagram are read,
+    ///             the rest is discarded. Unchanged on failure.
+    /// @return the number of bytes received, 0 for an empty datagram, -1 on time-out, interruption by a
+    ///         signal or any other failure. Blocks up to the receive time-out; without one, until a datagram
+    ///         arrives.
     virtual int Recv(std::string& out) = 0;
 
  protected:
     /// A time-out. Not a timeval, whose size depends on the including program's choice of time_t.
     struct TimeValue {
         std::uint32_t seconds;      ///< whole seconds
-        std::int32_t microseconds;  ///< and the rest
+        std::int32_t microseconds;  ///< remainder, 0 to 999999
     };
 
-    int sockFd;             ///< the socket; -1 when there is none to be had
-    sockaddr_in peerAddr;   ///< where Send goes: the peer, for a server the sender of what it received last
-    TimeValue recvTimeout;  ///< of the socket; 0: none
+    int sockFd;             ///< the socket; -1 when it could not be opened
+    sockaddr_in peerAddr;   ///< destination of Send
+    TimeValue recvTimeout;  ///< receive time-out of the socket; 0: none
     bool hasError;          ///< see HasError()
 };
 
-/// Bound to `ip`, port HA_PEER_PORT: receives questions and answers whoever asked last.
+/// Server end: bound to this node's address, replies to the sender of the last request.
 class HASocketCommServer : public HASocketComm {
  public:
-    /// Without a receive time-out. HasError() when the address cannot be bound.
+    /// Bind the socket to `ip`, port HA_PEER_PORT, without a receive time-out. HasError() is true when the
+    /// address cannot be bound.
     explicit HASocketCommServer(const std::string& ip);
 
-    /// With a receive time-out of `timeoutSec` seconds (0: none).
+    /// The same, with a receive time-out of `timeoutSec` seconds (0: none).
     HASocketCommServer(const std::string& ip, unsigned int timeoutSec);
 
     int Recv(std::string& out) override;
@@ -72,11 +81,11 @@ class HASocketCommServer : public HASocketComm {
     socklen_t peerAddrLen;
 };
 
-/// Asks the node at `ip`. The system picks the source port at the first Send; any datagram that reaches this
-/// port counts as the answer.
+/// Client end: sends requests to the node at `ip`. The kernel picks the source port at the first Send. Recv
+/// takes any datagram that reaches this port for the reply, whoever sent it.
 class HASocketCommClient : public HASocketComm {
  public:
-    /// With a receive time-out of `timeoutSec` seconds (0: none).
+    /// Open a client with a receive time-out of `timeoutSec` seconds (0: none).
     HASocketCommClient(const std::string& ip, unsigned int timeoutSec);
 
     int Recv(std::string& out) override;

@@ -1,5 +1,5 @@
 /// @file
-/// The control socket of the daemon.
+/// Control socket of the daemon: its requests, and the client that sends them.
 
 #pragma once
 
@@ -14,36 +14,45 @@
 
 namespace TERN::HA::Daemon {
 
-/// The daemon's control socket: local tools read its status or order a reboot of the peer.
+/// The control socket, through which local tools read the daemon's status or order a reboot of the peer.
 ///
-/// A request is an object whose "act" is a string; its first character decides:
-///   "I"  the reply is Status::toJson()
-///   "r"  the reply's "is_froce_reboot_remote" tells whether the peer is being rebooted
-///   "R"  reboots the peer; the reply is null and comes after up to 33 seconds, in which nobody else is
-///   served
-/// Anything else is not answered and leaves a line in the daemon log: "Unknown action " or "Failed get action
-/// from content: ".
+/// A request is a JSON object whose member "act" is a string. Its first character selects the action, the
+/// rest is ignored:
 ///
-/// As a client make a fresh object for each call. One thread at a time.
+///   "I"  reply with Status::toJson()
+///   "r"  reply with an object whose "is_froce_reboot_remote" (bool) is Status::isRemoteRebooting()
+///   "R"  reboot the peer (RebootRemote); the reply is null and takes up to 33 seconds, during which no other
+///        request is served
+///
+/// Any other action gets no reply and logs "Unknown action " and the value of "act"; a request without "act"
+/// logs "Failed get action from content: " and the request.
+///
+/// Not thread-safe: use an object from one thread at a time. As a client, construct an object per call. No
+/// operation throws.
 class MonitordSocket : public DaemonLocalSocket {
  public:
-    /// `path` and `timeout` (seconds) as for DaemonLocalSocket.
+    /// Construct as DaemonLocalSocket does: `path` of the socket file, `timeout` of a client in seconds.
     MonitordSocket(std::string path, unsigned int timeout);
 
-    /// Server: the record to answer from, not owned. Set it before the first request is served.
+    /// Server: set the record that requests are answered from. Not owned; must be set before the first
+    /// request is served.
     void setStatus(Status* status);
 
-    /// Server: answers one request as described above; false when it is refused.
+    /// Server: carry out `request` as described above and store its reply in `reply`. Returns true when the
+    /// reply is to be sent, false when the request was refused. Blocks for up to 33 seconds in "R", and for
+    /// the locks of the record otherwise.
     bool serverHandle(const Json::Value& request, Json::Value& reply) override;
 
-    /// Client: the daemon's status into `out`; false when there is no answer.
+    /// Client: store the daemon's status (see Status::toJson) in `out`. Returns false, with `out` unchanged,
+    /// when no reply arrived. Blocks as clientSend does.
     bool getServerData(Json::Value& out);
 
-    /// Client: orders the peer's reboot; true once the daemon has followed it down. Give the object a
-    /// time-out above 33 seconds.
+    /// Client: order a reboot of the peer. Returns true once the daemon has sent its reply, false when none
+    /// arrived. Construct the object with a time-out above 33 seconds.
     bool rebootRemote();
 
-    /// Client: true when the daemon answers that the peer is being rebooted.
+    /// Client: return true when the daemon replied that the peer is being rebooted, false otherwise. Blocks
+    /// as clientSend does.
     bool isRebootRemote();
 
  private:

@@ -1,5 +1,5 @@
 /// @file
-/// The log.
+/// Daemon log: buffered under /tmp/ha, persistent under the directory that the host chose.
 
 #pragma once
 
@@ -12,46 +12,48 @@
 
 namespace TERN::HA::Daemon {
 
-/// A log that survives a crash of its process: each line goes at once to a small buffer file under /tmp/ha,
-/// moves from there to the persistent log when the host says so, and is archived with /bin/xz.
+/// Log sink. set appends a line to a small buffer file under /tmp/ha, writeLogToDisk moves the buffered lines
+/// to the persistent log, rotate compresses the persistent log and shifts its archives. No line is kept in
+/// process memory, so a crash of the process loses none.
 ///
-/// A line in both files: local time with zone, one space, the text, a newline, as in
+/// Format of a line in both files: local time with zone, one space, the text, a newline, as in
 ///   2026-11-15T09:23:41+01:00 util.cpp:88 Failed to get ha hostname
 ///
-/// No operation reports a failure or throws for trouble with files: a log has nowhere to report to. The host
-/// provides both directories; nothing here makes them.
+/// No operation reports a failure or throws for file trouble: a log sink has nowhere to report to. Running
+/// out of memory throws std::bad_alloc. The host creates both directories.
 ///
-/// Thread-safe. Operations on one object run one after another. Each waits up to 60 seconds for the object's
-/// mutex and then goes ahead without it, so that a stuck holder delays logging but never stops it. Separate
-/// objects, and separate processes, may share their files: each line is one append.
+/// Thread-safe. Operations on one object are serialised by its mutex, for which each waits up to 60 seconds
+/// and then proceeds without the lock: a stuck holder delays logging but never stops it. Several objects and
+/// processes may share the same files, because a line is one append.
 class DaemonLog {
  public:
-    /// The persistent log is `directory` + `fileName`, the buffer "/tmp/ha" + `fileName`: the file name
-    /// brings its leading "/", the directory has no trailing one. Opens nothing.
+    /// Construct a log whose persistent file is `directory` + `fileName` and whose buffer file is "/tmp/ha" +
+    /// `fileName`. No separator is inserted: `fileName` begins with "/" and `directory` does not end with
+    /// one. Opens nothing.
     DaemonLog(std::string directory, std::string fileName);
 
     DaemonLog(const DaemonLog&) = delete;
     DaemonLog& operator=(const DaemonLog&) = delete;
 
-    /// Appends time stamp, space, `text` (any length, any bytes) and newline to the buffer file with one
-    /// open, one write and one close. The line is dropped when the buffer file cannot be opened. The stamp
-    /// follows a change of TZ at once, one of the machine's time zone with the next second.
+    /// Append time stamp, space, `text` (any length, any bytes) and newline to the buffer file: one open, one
+    /// write, one close. Drops the line when the buffer file cannot be opened. The time stamp follows a
+    /// change of TZ at once and a change of the machine's time zone from the next second on.
     void set(const std::string& text);
 
-    /// Moves the buffered lines to the end of the persistent log, a write per line, and leaves the buffer
-    /// file empty (made when missing). A last line without a newline gains one, after a tenth of a second in
-    /// which its end may still come. The buffer is emptied also when the persistent log cannot be opened or
-    /// written: those lines are lost, so that the buffer never grows without bound. A line that another
-    /// object appends between the last read and the truncation is lost too.
+    /// Move the buffered lines to the end of the persistent log, one write per line, and truncate the buffer
+    /// file, which is created when missing. A last line without newline gains one, after a tenth of a second
+    /// in which its writer may still complete it. The buffer is truncated even when the persistent log cannot
+    /// be opened or written, so that it never grows without bound: those lines are lost, and so is a line
+    /// that another object appends between the last read and the truncation.
     void writeLogToDisk();
 
-    /// Compresses the persistent log and every uncompressed archive (log + ".0" to ".39"), then moves each
-    /// archive (".N.xz") one number up and the log to ".0.xz". The former archive 39 is lost; a missing
-    /// archive leaves a gap that moves along. Afterwards the persistent log does not exist until the next
-    /// writeLogToDisk. Blocks while /bin/xz runs.
+    /// Compress the persistent log and every uncompressed archive with /bin/xz, then move each archive
+    /// (".N.xz") one number up and the log to ".0.xz". Archive 39 is lost; a missing archive leaves a gap
+    /// that moves up as well. The persistent log does not exist until the next writeLogToDisk. Results of
+    /// compression and renaming are ignored. Blocks for up to 41 runs of /bin/xz.
     void rotate();
 
-    /// Size of the persistent log in bytes; 0 when it is missing or cannot be looked at. Does not lock.
+    /// Return the size of the persistent log in bytes, 0 when it is missing or inaccessible. Does not lock.
     std::int64_t size() const;
 
  private:
@@ -61,7 +63,7 @@ class DaemonLog {
 
     std::string _logPath;
     std::string _bufferPath;
-    std::vector<std::string> _rotateFiles;  ///< the log itself, then its archives 0 to 39, all without ".xz"
+    std::vector<std::string> _rotateFiles;  ///< the log, then archives 0 to 39, without ".xz"
     std::timed_mutex _mutex;
     std::int32_t _lockTimeout;  ///< seconds
 };

@@ -1,5 +1,5 @@
 /// @file
-/// The questions to the peer: their base, their registry, and the server that answers them.
+/// Peer checks: their base class, their registry, and the server that answers them.
 
 #pragma once
 
@@ -14,58 +14,69 @@ class Status;
 
 #pragma GCC visibility push(default)
 
-/// A question that one node asks the other, with both its sides: the asking side (a call operator), run on
-/// the node that wants to know, and the answering side (handle), run on the other node by SocketServer.
+/// Base of all peer checks. A peer check is one request of the peer protocol, with both its sides: the
+/// asking side (a call operator) runs on the node that wants to know, the answering side (handle) runs on
+/// the other node, called by SocketServer.
 ///
-/// On the wire, UDP port HA_PEER_PORT: the question is the check's type name, the answer the string that
-/// handle returned, each one datagram without terminator; 63 bytes at most arrive.
+/// On the wire (UDP, port HA_PEER_PORT) the request is the check's type name and the reply is the string
+/// that handle returned: one datagram each, without terminator, of which the receiver reads at most 63
+/// bytes.
 ///
-/// A check has no data members and no destructor of its own, and so may be deleted through an EnvCheck
-/// pointer although there is no virtual destructor. Keep it that way in every check. Checks may be used from
-/// any thread.
+/// A check has no data members and no destructor of its own. That is what makes deleting it through an
+/// EnvCheck pointer sound although the destructor is not virtual; keep it so in every derived class.
+///
+/// Thread-safe: a check keeps no state, any thread may call it. No operation throws; a check that runs out of
+/// memory fails like one whose exchange failed.
 class EnvCheck {
  public:
-    /// Asks the peer. This one does not ask and returns true.
+    /// Run the check against the peer. The base class sends nothing and returns true.
     virtual bool operator()();
 
-    /// Asks the peer, with the details of its answer in `out`. This one does not ask, leaves `out` as it is
-    /// and returns true.
+    /// Run the check against the peer and store the details of its reply in `out`. The base class sends
+    /// nothing, leaves `out` unchanged and returns true.
     virtual bool operator()(Json::Value& out);
 
-    /// The answer of this node, from its `status`. This one answers "Undefine".
+    /// Return this node's reply, computed from its `status`. The base class returns "Undefine".
     virtual std::string handle(TERN::HA::Daemon::Status& status);
 
-    /// The type name: the question on the wire and the key in the registry. Here "Undefine".
+    /// Return the type name: the request on the wire and the key in the registry. The base class returns
+    /// "Undefine", which no registry holds.
     virtual std::string getType();
 
  protected:
-    /// One exchange with the node at remoteIP(""): sends getType() and puts the answer into `reply`. True
-    /// when anything came back within 3 seconds, an empty answer included; otherwise false with `reply` as it
-    /// was. Asks once, never again by itself. Blocks up to 3 seconds. Logs "Failed to start socket client"
-    /// when it has no socket to ask with, and nothing else.
+    /// Send getType() to the node at remoteIP("") and receive its reply.
+    ///
+    /// @param reply  receives the reply, 0 to 63 bytes; unchanged on failure
+    /// @return true when a datagram arrived within 3 seconds, an empty one included; false on time-out and
+    ///         on any error. Logs "Failed to start socket client" when no socket could be opened, and
+    ///         nothing for other failures.
+    ///
+    /// One attempt, no retransmission. Blocks for up to 3 seconds, less when a signal interrupts it.
     bool _sendToRemote(std::string& reply);
 };
 
-/// The registry: how to make the check that a question names.
+/// Registry of the peer checks: maps a request to the function that creates its check.
 class CheckerFactory {
  public:
-    /// From type name to function; null until the first registration. Filled while libraries are loaded, and
-    /// only read, without a lock, afterwards. Never freed.
+    /// Type name to factory function; the caller owns the check that the function returns. Null until the
+    /// first registration. Filled by static initialisation and only read afterwards: not locked. Never
+    /// freed.
     static std::map<std::string, EnvCheck* (*)()>* opMap;
 };
 
-/// Makes a check of type T; the caller deletes it.
+/// Create a check of type T. The caller owns it.
 template <class T>
 EnvCheck* createEnvCheckT() {
     return new T;
 }
 
-/// Registers T under a name for as long as the process lives. A name that is taken keeps its first owner. Use
-/// it for static objects only: the registry is not locked.
+/// Registers the check T while it is constructed. Use it for static objects only: the registry is not
+/// locked.
 template <class T>
 class CheckerRegister {
  public:
-    /// Registers T under `name`.
+    /// Register createEnvCheckT<T> under `name`, for the life of the process. A name that is already
+    /// registered keeps its first factory.
     explicit CheckerRegister(const std::string& name) {
         if (CheckerFactory::opMap == nullptr) {
             CheckerFactory::opMap = new std::map<std::string, EnvCheck* (*)()>;
@@ -74,24 +85,32 @@ class CheckerRegister {
     }
 };
 
-/// The answering end: one object, or several, in one thread of the host.
+/// The answering end of the peer protocol. Stateless: all objects of a process share one server socket.
 class SocketServer {
  public:
-    /// Serves at most one question of the peer from `status` and returns true, whether or not one came.
-    /// Blocks up to 30 seconds for it, less when a signal comes. Questions that arrive between two calls wait
-    /// in the socket. The first call binds localIP(""), port HA_PEER_PORT, for the rest of the process.
-    /// Returns false at once when that failed, in every call: the log then has "Failed to start socket
-    /// server" and the system's error text. Logs "Failed to sendto" when an answer cannot be sent.
+    /// Serve at most one request of the peer.
     ///
-    /// A question that is no registered type name ends the process with SIGABRT, unanswered: only the peer
-    /// speaks on this port, and a peer that speaks otherwise must not be taken for a working one.
+    /// The first call binds the server socket to localIP(""), port HA_PEER_PORT, for the life of the process.
+    /// Requests that arrive between two calls queue up in the socket.
     ///
-    /// One thread only: all calls share one socket and the sender that it remembers.
+    /// @param status  the record that the reply is computed from
+    /// @return true, whether or not a request arrived; false when the server socket could not be opened or
+    ///         bound. Every later call then fails at once, too, and logs "Failed to start socket server"
+    ///         directly followed by the system's error text. A reply that cannot be sent is logged as
+    ///         "Failed to sendto".
+    ///
+    /// A request that is not a registered type name ends the process with SIGABRT and gets no reply: only the
+    /// peer speaks on this port, and a peer that speaks anything else must not be taken for a working one.
+    ///
+    /// Blocks for up to 30 seconds for a request, less when a signal interrupts it, and then for as long as
+    /// the check's handle takes. Not thread-safe: call it from one thread only, because all calls share the
+    /// socket and the sender that it remembers.
     bool operator()(TERN::HA::Daemon::Status& status);
 };
 
-// Addresses of this process. A non-empty `value` replaces what is stored; the stored string, empty at first,
-// is returned in every case. Set them before starting the threads that read them: they are not locked.
+// Addresses of this process. A non-empty `value` replaces the stored string; an empty one only reads it.
+// Return the stored string, which is empty at first. Not thread-safe: set them before the threads that read
+// them are started.
 std::string drbdIF(const std::string& value);    ///< name of the network interface that carries DRBD
 std::string localIP(const std::string& value);   ///< this node's IPv4 address, dotted quad
 std::string remoteIP(const std::string& value);  ///< the peer's IPv4 address, dotted quad

@@ -1,5 +1,5 @@
 /// @file
-/// The two logs of every source file.
+/// Log objects of a source file, and the macro that logs through them.
 
 #pragma once
 
@@ -7,30 +7,31 @@
 
 #include "daemon_log.h"
 
-// The two logs, for every source file that includes this header. All names here have internal linkage: each
-// source file owns a pair of log objects, so that one file's lines never wait for another's. All pairs name
-// the same files. The objects are made while the program or library is loaded and are never freed, so that
-// lines can still be logged while it is being torn down; "used" keeps the pointers, and so the objects from
-// counting as leaks, in files that never log.
+// Every name here has internal linkage: each source file that includes this header owns a pair of log
+// objects, and all pairs name the same files. A mutex therefore serialises the callers of one source file
+// only. The objects are created by static initialisation and never freed, so that logging works until the
+// very end of the process; "used" keeps the pointers alive in files that never log, so that leak checkers
+// stay quiet.
 
 namespace TERN::HA::Daemon {
 
-constexpr char LOG_DIR[] = "/var/log/ha";                   ///< where the persistent logs are
-constexpr char DAEMON_LOG_FILE[] = "/ha.daemon.log";        ///< daemonLog's
-constexpr char DAEMON_RECORD_FILE[] = "/ha.daemon.record";  ///< recordLog's
+constexpr char LOG_DIR[] = "/var/log/ha";                   ///< directory of the persistent logs
+constexpr char DAEMON_LOG_FILE[] = "/ha.daemon.log";        ///< file name of daemonLog
+constexpr char DAEMON_RECORD_FILE[] = "/ha.daemon.record";  ///< file name of recordLog
 
-/// Diagnostic messages.
+/// Diagnostic messages of this source file.
 [[gnu::used]] static DaemonLog* const daemonLog = new DaemonLog(LOG_DIR, DAEMON_LOG_FILE);
 
-/// Snapshots of status, processes, file systems and memory.
+/// Diagnostic snapshots: status, processes, file systems, memory.
 [[gnu::used]] static DaemonLog* const recordLog = new DaemonLog(LOG_DIR, DAEMON_RECORD_FILE);
 
-/// Use HA_LOG: it passes the place of its call.
+/// Log "file:line message" to daemonLog. Call it through HA_LOG, which passes its call site.
 [[maybe_unused]] static void logAt(const char* file, int line, const std::string& message) {
     daemonLog->set(std::string(file) + ":" + std::to_string(line) + " " + message);
 }
 
 }  // namespace TERN::HA::Daemon
 
-/// Logs "file.cpp:LINE message" to the including source file's daemonLog. `message` is a std::string or text.
+/// Log "file.cpp:LINE message" with file and line of the call site. `message` is a std::string or a literal.
+/// Blocks and fails as DaemonLog::set does.
 #define HA_LOG(message) ::TERN::HA::Daemon::logAt(__FILE_NAME__, __LINE__, (message))

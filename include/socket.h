@@ -1,5 +1,5 @@
 /// @file
-/// Requests and replies over a Unix socket.
+/// Local JSON socket: one request and one reply per connection over a Unix stream socket.
 
 #pragma once
 
@@ -12,53 +12,63 @@
 
 namespace TERN::HA::Daemon {
 
-/// A request and its reply over a Unix stream socket of this machine, each one JSON text in one send and one
-/// receive of at most 2095 bytes. An object is either a server (serverBind once, then serverListen again and
-/// again) or a client (clientSend once). A derived class gives the requests their meaning.
+/// One end of a Unix stream socket that carries one JSON request and one JSON reply per connection. Either
+/// text is sent by one send(2) and read by one recv(2) of at most 2095 bytes, without length or terminator.
 ///
-/// Failures are reported by the result and, at LOG_ERR, in the system log, whose identity and facility are
-/// the host's; nothing throws. An object that failed to bind, listen or exchange refuses everything
-/// afterwards: make a new one.
+/// An object is either a server (call serverBind once, then serverListen in a loop) or a client (call
+/// clientSend once). A derived class implements what a request means in serverHandle.
 ///
-/// An object belongs to one thread at a time. There is no virtual destructor: destroy an object through its
-/// own type.
+/// Operations report failure by their result and log it to the system log at LOG_ERR, under the identity and
+/// facility that the host chose with openlog. None throws; running out of memory is a failure like others.
+/// The error flag is sticky: after a failure to open, bind, listen or exchange, the object refuses every
+/// further call.
+///
+/// Not thread-safe: use an object from one thread at a time. The destructor is not virtual: destroy an object
+/// through its own type.
 class DaemonLocalSocket {
  public:
-    /// `path`: of the socket file, cut to its first 107 characters. `timeout`: seconds that a client waits
-    /// for its reply; 0 (or above 2147483647): for ever. Opens a socket; hasError() when there is none to be
-    /// had.
+    /// Open the socket.
+    ///
+    /// @param path     of the socket file; cut to its first 107 characters
+    /// @param timeout  receive time-out of a client, in seconds; 0 or above 2147483647: none
+    ///
+    /// hasError() is true when no socket could be opened.
     DaemonLocalSocket(std::string path, unsigned int timeout);
     ~DaemonLocalSocket();
 
     DaemonLocalSocket(const DaemonLocalSocket&) = delete;
     DaemonLocalSocket& operator=(const DaemonLocalSocket&) = delete;
 
-    /// True after a failure that this object does not recover from.
+    /// Return the error flag: true after a failure from which this object does not recover.
     bool hasError();
 
-    /// Makes the object a server: replaces the socket file at its path and listens, 100 connections waiting
-    /// at most. The mode of the file follows the process's umask. True on success.
+    /// Server: remove a stale socket file, bind the path and listen with a backlog of 100. The file's mode
+    /// follows the process's umask. Returns true on success. Does not block.
     bool serverBind();
 
-    /// Waits, without bound or until a signal comes, for one connection, serves the one request that it
-    /// carries and closes it. False when there was none to accept, it held no JSON, serverHandle refused it
-    /// or the reply could not be sent; the next call may succeed all the same. Blocks in the receive for as
-    /// long as the client keeps the connection open without sending.
+    /// Server: accept one connection, serve its request and close it.
+    ///
+    /// Returns true when a reply was sent. Returns false when the accept failed or was interrupted by a
+    /// signal, the request was not JSON, serverHandle refused it, or the reply could not be sent; none of
+    /// these sets the error flag. Blocks without limit for a connection, and without limit for a client that
+    /// connects and sends nothing.
     bool serverListen();
 
-    /// Connects, sends `request` and waits up to the time-out for `reply`, which is left as it was on
-    /// failure. True when a JSON text came back.
+    /// Client: connect, send `request` and receive `reply`.
+    ///
+    /// Returns true when the reply was a JSON text; otherwise false, with `reply` unchanged. Blocks up to the
+    /// time-out for the reply, and without limit while the server's backlog is full.
     bool clientSend(const Json::Value& request, Json::Value& reply);
 
-    /// Answers `request` in `reply` (null when called). False sends nothing: the client sees the connection
-    /// closed.
+    /// Server: carry out `request` and store the reply, null when called, in `reply`. Return true to send
+    /// it; after false the connection is closed without a reply.
     virtual bool serverHandle(const Json::Value& request, Json::Value& reply) = 0;
 
  protected:
-    /// Serves the connection `fd`: the second half of serverListen. The caller closes it.
+    /// Serve the request on the connected socket `fd`: the second half of serverListen. Does not close `fd`.
     bool _serverListen(int fd);
 
-    /// Sets the time-out and connects: the first half of clientSend.
+    /// Set the receive time-out and connect: the first half of clientSend.
     bool _clientConnect();
 
  private:

@@ -1,5 +1,5 @@
 /// @file
-/// The health record of a node.
+/// Health record of a node.
 
 #pragma once
 
@@ -13,87 +13,92 @@
 
 #pragma GCC visibility push(default)
 
-/// The library, apart from what the peer protocol needs, which stands at global scope.
+/// The daemon library. The classes of the peer protocol (chkstate.h, env_check.h) stand at global scope.
 namespace TERN::HA::Daemon {
 
-/// What is known of the peer's life cycle. Single bits: several may be set at once.
+/// Life cycle of the peer. Each value is a single bit; several may be set at once.
 enum NodeState : std::uint32_t {
-    NodeAlive = 1,          ///< it answered the last liveness check
-    NodeRebootPending = 2,  ///< it was asked to reboot and has not been seen to go down
-    NodeRebooting = 4,      ///< it is taken to be rebooting, until it answers again
+    NodeAlive = 1,          ///< alive: set and cleared by Status::setRemoteAlive
+    NodeRebootPending = 2,  ///< ordered to reboot, not yet seen to go down
+    NodeRebooting = 4,      ///< rebooting, until it is alive again
 };
 
-/// Both sets of bits.
+/// Return the union of both bit sets.
 constexpr NodeState operator|(NodeState a, NodeState b) {
     return static_cast<NodeState>(static_cast<std::uint32_t>(a) | static_cast<std::uint32_t>(b));
 }
 
-/// The one health record of a node, shared by all threads of its daemon: the node's own findings, what it
-/// learned of its peer, and the peer's life cycle. Nothing in it outlives the process.
+/// Health record of a node: its own findings, what it learned about its peer, and the peer's life cycle. One
+/// object per process, shared by all threads of the daemon; nothing in it outlives the process.
 ///
-/// Thread-safe. No operation reports a failure. The operations that are not const lock one mutex each, never
-/// two; they wait up to 5 seconds for it and then go ahead without it: a stuck holder delays an update but
-/// never stops it. The const operations do not lock and do not block.
+/// Thread-safe. No operation fails. The const operations neither lock nor block. The others lock one mutex
+/// at a time, for which they wait up to 5 seconds, and then proceed without the lock: a stuck holder delays
+/// an update but never blocks it. Only an operation that takes or returns JSON, and setRemoteAlive for its
+/// log line, needs memory; it throws std::bad_alloc, with the record unchanged, when there is none.
 class Status {
  public:
-    /// A record of nothing known: all false, 0 and empty, but for isDRBDConnect.
+    /// Construct a record in which every flag is false but isDRBDConnect, every figure 0, both lists and the
+    /// node state empty.
     Status();
 
     Status(const Status&) = delete;
     Status& operator=(const Status&) = delete;
 
-    // Read and written directly by the daemon and the checks. Each is indivisible by itself; nothing ties
-    // two of them together.
+    // Read and written directly by the daemon and the checks. Each access is atomic and sequentially
+    // consistent; nothing ties two fields together, so a reader may see one updated and the next not yet.
     std::atomic<bool> isRemoteMDResync;          ///< the peer reported an md resync
     std::atomic<bool> isRemoteDiskErrHandling;   ///< the peer reported disk error handling
-    std::atomic<bool> isMDResync;                ///< this node has an md resync
-    std::atomic<bool> isDiskErrHandling;         ///< this node has disk error handling
-    std::atomic<bool> isDRBDConnect;             ///< the DRBD link is up; true until the first check has run
-    std::atomic<float> heartbeatPacketFailRate;  ///< the host decides which packets
-    std::atomic<float> heartbeatLatency;         ///< milliseconds
+    std::atomic<bool> isMDResync;                ///< this node has an md resync in progress
+    std::atomic<bool> isDiskErrHandling;         ///< this node has disk error handling in progress
+    std::atomic<bool> isDRBDConnect;             ///< the DRBD link is connected; true until first checked
+    std::atomic<float> heartbeatPacketFailRate;  ///< packet failure rate; which one is the host's choice
+    std::atomic<float> heartbeatLatency;         ///< average round trip to the peer, milliseconds; 0: unknown
 
-    /// Sets the bits of `state`; bits that are set stay so. Always true.
+    /// Set the bits of `state`, leave the others unchanged. Returns true.
     bool addRemoteNodeState(NodeState state);
 
-    /// Clears the bits of `state`; bits that are clear stay so. Always true.
+    /// Clear the bits of `state`, leave the others unchanged. Returns true.
     bool delRemoteNodeState(NodeState state);
 
-    /// True when any bit of `state` is set.
+    /// Return true when any bit of `state` is set.
     bool isRemoteNodeState(NodeState state) const;
 
-    /// True when the peer answered the last liveness check.
+    /// Return true when the peer is alive (NodeAlive).
     bool isRemoteAlive() const;
 
-    /// True from the request for a reboot until the peer answers again.
+    /// Return true when the peer is being rebooted: NodeRebooting or NodeRebootPending is set.
     bool isRemoteRebooting() const;
 
-    /// All bits.
+    /// Return all bits.
     NodeState getRemoteNodeState() const;
 
-    /// Records the outcome of a liveness check. A change is logged: "Remote server status changed to " and
-    /// "alive" or "dead". A peer that is alive is no longer rebooting (a pending reboot stays pending); one
-    /// that is dead keeps its reboot bits. Always true.
+    /// Record the outcome of a liveness check: set or clear NodeAlive. Returns true.
+    ///
+    /// A change is logged first: "Remote server status changed to " and "alive" or "dead". A peer that is
+    /// alive is no longer NodeRebooting, but stays NodeRebootPending; one that is dead keeps both bits.
+    /// Blocks for the log as DaemonLog::set does, and for up to two locks.
     bool setRemoteAlive(bool alive);
 
-    /// The names of this node's disks under error handling: a JSON array of strings in ascending order, an
-    /// empty array when there are none.
+    /// Return the device names of this node's disks under error handling: a JSON array of strings in
+    /// ascending order, empty when there are none.
     Json::Value getErrHandlingDisk();
 
-    /// The same of the peer's disks.
+    /// Return the device names of the peer's disks under error handling, in the same form.
     Json::Value getErrHandlingDiskRemote();
 
-    /// Replaces the names of this node's disks by the elements of `disks` (array of strings). Duplicates
-    /// collapse; an element that cannot be read as a string is passed over; a null or empty value leaves no
-    /// name. Always true.
+    /// Replace the device names of this node's disks under error handling by the elements of `disks`, an
+    /// array of strings. Duplicates collapse; an element that cannot be read as a string is skipped; null or
+    /// an empty array clears the list. Returns true.
     bool setErrHandlingDisk(const Json::Value& disks);
 
-    /// The same for the peer's disks.
+    /// Replace the device names of the peer's disks under error handling in the same way. Returns true.
     bool setErrHandlingDiskRemote(const Json::Value& disks);
 
-    /// The record as a JSON object: "isRemoteAlive", "isRemoteMDResync", "isRemoteDiskErrHandling",
-    /// "isMDResync", "isDiskErrHandling", "isDRBDConnect" (booleans), "heartbeatPacketFailRate",
-    /// "heartbeatLatency" (reals), "diskErrorHandlingDisk", "diskErrorHandlingDiskRemote" (arrays of
-    /// strings). Waits for the two lists' mutexes one after the other.
+    /// Return the record as a JSON object with ten members: "isRemoteAlive", "isRemoteMDResync",
+    /// "isRemoteDiskErrHandling", "isMDResync", "isDiskErrHandling", "isDRBDConnect" (booleans),
+    /// "heartbeatPacketFailRate", "heartbeatLatency" (reals), "diskErrorHandlingDisk",
+    /// "diskErrorHandlingDiskRemote" (arrays of strings). Blocks for the locks of the two lists, one after
+    /// the other.
     Json::Value toJson();
 
  private:
@@ -101,7 +106,7 @@ class Status {
     std::timed_mutex errHandlingDiskMutex;
     std::set<std::string> errHandlingDiskRemote;
     std::timed_mutex errHandlingDiskRemoteMutex;
-    std::atomic<std::uint32_t> remoteNodeState;  ///< an atomic word: it is read without the mutex
+    std::atomic<std::uint32_t> remoteNodeState;  ///< atomic, because it is read without the mutex
     std::timed_mutex remoteNodeStateMutex;
     std::int32_t lockTimeout;  ///< seconds
 };

@@ -11,15 +11,19 @@
 /// Names that users see.
 namespace TERN::HA::Daemon::Util {
 
-/// The name of the high-availability pair: "ha_hostname" of the package's configuration file, at most 63
-/// characters. Empty, and "Failed to get ha hostname" in the log, when there is none. Any thread.
+/// Return the host name of the HA pair: the value of "ha_hostname" in the package's configuration file, at
+/// most 63 characters. Returns the empty string and logs "Failed to get ha hostname" when the file or the key
+/// is missing. Blocks for the reading of a small file. Thread-safe.
 std::string getHAHostname();
 
-/// The names that a user sees for the peer's disks `devices` (such as sda): "Disk 3" or "disk 3" for slot 3
-/// of the main unit, "disk 3(EXP1)" for slot 3 of the enclosure EXP1. The mapping is read from
-/// /tmp/ha/info_hd.remote on every call. A device that it does not hold is left out, one that it holds twice
-/// appears twice. Without a mapping `devices` is returned as it is; a file that is no JSON object leaves
-/// "Failed to read HD info json: " and its path in the log. Any thread.
+/// Translate device names of the peer's disks (such as "sda") into the names that users see: "Disk 3" or
+/// "disk 3" for slot 3 of the main unit, "disk 3(EXP1)" for slot 3 of the enclosure EXP1.
+///
+/// The table of disks is read from /tmp/ha/info_hd.remote on every call. Returns the names in the order of
+/// `devices`; a device without an entry is left out, one with two entries yields two names. Returns `devices`
+/// unchanged when the table is missing, empty or unusable; one that exists but cannot be opened or parsed
+/// also logs "Failed to read HD info json: " and its path. Blocks for the reading of a small file.
+/// Thread-safe.
 std::vector<std::string> devListToHumanReadable(const std::vector<std::string>& devices);
 
 }  // namespace TERN::HA::Daemon::Util
