@@ -14,7 +14,7 @@ using namespace TERN::HA::Daemon;
 
 static void check(Status& status) {
     status.setRemoteAlive(
-        IsRemoteAlive()());  // one lost datagram counts as death here: a real host asks again
+        IsRemoteAlive()());  // one missed probe declares it dead here: a real host probes again
     status.isRemoteMDResync = status.isRemoteAlive() && IsRemoteMDResync()();
     status.isMDResync = isMDResync();
     status.isDRBDConnect = isDRBDConnect();
