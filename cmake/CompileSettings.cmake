@@ -4,6 +4,9 @@ set(CMAKE_CXX_STANDARD_REQUIRED ON)
 set(CMAKE_CXX_EXTENSIONS OFF)
 set(CMAKE_POSITION_INDEPENDENT_CODE ON)
 
+# A program need not be linked anew when a shared library changes behind its interface.
+set(CMAKE_LINK_DEPENDS_NO_SHARED ON)
+
 add_library(ternha_settings INTERFACE)
 
 # A log may pass 2 GiB and a time stamp 2038 on 32-bit machines too.

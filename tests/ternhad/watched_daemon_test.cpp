@@ -2,9 +2,9 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include "service/manager.h"
 #include "support/udp.h"
 #include "ternhad/daemon.h"
+#include "ternhad/manager.h"
 
 namespace {
 

@@ -4,8 +4,8 @@
 
 #include <cstdlib>
 
-#include "service/manager.h"
 #include "service_notifier.h"
+#include "ternhad/manager.h"
 
 namespace {
 

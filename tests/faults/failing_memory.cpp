@@ -1,4 +1,4 @@
-#include "memory/failing_memory.h"
+#include "faults/failing_memory.h"
 
 #include <cstdlib>
 #include <new>

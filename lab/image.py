@@ -103,7 +103,7 @@ def programs(build: Path) -> bytes:
         "cli/ternhactl": "usr/bin/ternhactl",
         "src/libternhadaemon.so.6": f"{LIBRARIES}/libternhadaemon.so.6",
         "platform/libterncore.so.6": f"{LIBRARIES}/libterncore.so.6",
-        "tests/lab/ternha-lab-tool": "usr/bin/ternha-lab-tool",
+        "lab/ternha-lab-tool": "usr/bin/ternha-lab-tool",
     }.items():
         archive.file(target, (build / source).read_bytes(), 0o755)
     return archive.compressed()

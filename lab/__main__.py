@@ -17,7 +17,7 @@ from failure import CheckFailed, LabError
 from lab import INTERRUPTIONS, Lab
 from node import Channel
 
-ROOT = Path(__file__).resolve().parents[2]
+ROOT = Path(__file__).resolve().parents[1]
 CACHE = ROOT / "build/lab"
 BUILD = CACHE / "arm"
 TARGETS = ["ternhad", "ternhactl", "ternha-lab-tool"]

@@ -2,9 +2,9 @@
 #include <gtest/gtest.h>
 
 #include "checker.h"
+#include "checker/fast_sleep.h"
+#include "checker/obedient_peer.h"
 #include "ha_log.h"
-#include "reboot/fast_sleep.h"
-#include "reboot/obedient_peer.h"
 #include "support/files.h"
 #include "support/programs.h"
 #include "support/sandbox.h"

@@ -38,15 +38,15 @@ TEST_F(ResyncTest, ThePeerIsAskedByName) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-class OtherAnswerTest : public ResyncTest, public ::testing::WithParamInterface<const char*> {};
+class OtherResyncAnswerTest : public ResyncTest, public ::testing::WithParamInterface<const char*> {};
 
-TEST_P(OtherAnswerTest, IsNoResyncAndNotLogged) {
+TEST_P(OtherResyncAnswerTest, IsNoResyncAndNotLogged) {
     const test::FakePeer peer(GetParam());
     EXPECT_FALSE(IsRemoteMDResync()());
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-INSTANTIATE_TEST_SUITE_P(Answers, OtherAnswerTest,
+INSTANTIATE_TEST_SUITE_P(Answers, OtherResyncAnswerTest,
                          ::testing::Values("not_resync", "", "Resync", "resync\n", "resync ", "alive"));
 
 TEST_F(ResyncTest, NoAnswerLeavesALine) {

@@ -1,4 +1,4 @@
-#include "reboot/fast_sleep.h"
+#include "checker/fast_sleep.h"
 
 #include <unistd.h>
 

@@ -4,7 +4,7 @@
 #include <thread>
 
 #include "checker.h"
-#include "reboot/obedient_peer.h"
+#include "checker/obedient_peer.h"
 #include "support/sandbox.h"
 #include "support/wait.h"
 
