@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdarg>
+#include <cstdio>
 #include <cstring>
 #include <exception>
 #include <map>
@@ -300,9 +301,9 @@ int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size
     return FAILURE;
 }
 
-int PLATFileExist(const char* path) {
+bool PLATFileExist(const char* path) {
     struct stat info = {};
-    return path != nullptr && stat(path, &info) == 0 ? 1 : 0;
+    return path != nullptr && stat(path, &info) == 0;
 }
 
 int TERNDiskGetDevnamebyAtaPort(char* name, int size, const char* port) try {

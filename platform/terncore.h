@@ -1,6 +1,7 @@
 #pragma once
 
-#include <cstdio>
+#include <stdbool.h>
+#include <stdio.h>
 
 // The appliance's core platform library, as far as this project calls it. libterncore.so.6 implements it:
 // on the appliance the maker's own, elsewhere the stand-in beside this file.
@@ -13,7 +14,9 @@
 // ignore SIGCHLD nor reap processes that it did not start, otherwise the status of a program is lost and
 // waiting for it fails.
 
+#ifdef __cplusplus
 extern "C" {
+#endif
 
 // Runs the program at `path` with the null-terminated argument vector `argv` (argv[0] included); no shell.
 // With `wait` other than 0 it returns after the program has ended: 0 when that exited with status 0, non-zero
@@ -42,12 +45,15 @@ int PLATPclose(FILE* stream);
 // or an argument is invalid.
 int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size, int flags);
 
-// Non-zero when something exists at `path` (links are followed).
-int PLATFileExist(const char* path);
+// True when something exists at `path` (links are followed).
+bool PLATFileExist(const char* path);
 
 // Writes the block device name (such as sda) of the disk on the ATA port `port` (such as ata3) into `name`,
 // `size` bytes, terminated. Optical drives are no disks; of several disks on a port the first by name counts.
 // Returns 0 on success, -1 when the port has no disk, the name does not fit or an argument is invalid; `name`
 // is unchanged then.
 int TERNDiskGetDevnamebyAtaPort(char* name, int size, const char* port);
+
+#ifdef __cplusplus
 }
+#endif

@@ -18,15 +18,14 @@ constexpr char DISK_TABLE[] = "/tmp/ha/info_hd.remote";
 // The peer's disks, a JSON object by position; null when there is none.
 Json::Value readDiskTable() {
     Json::Value table;
-    if (PLATFileExist(DISK_TABLE) == 0) {
+    if (!PLATFileExist(DISK_TABLE)) {
         return table;
     }
     std::string text;
-    if (!readFile(DISK_TABLE, text) || !parseJson(text, table) || !(table.isObject() || table.isNull())) {
+    if (!readFile(DISK_TABLE, text) || !parseJson(text, table)) {
         HA_LOG(std::string("Failed to read HD info json: ") + DISK_TABLE);
-        return {};
     }
-    return table;
+    return table.isObject() ? table : Json::Value();
 }
 
 // What a user calls the disk at `position`: a slot of the main unit (M or 0-M) or of an enclosure (N-M).

@@ -151,18 +151,18 @@ class FileExistTest : public test::SandboxTest {};
 TEST_F(FileExistTest, IsTrueForAnythingThatExists) {
     test::writeFile("/tmp/file", "");
     std::filesystem::create_symlink("/tmp/file", "/tmp/link");
-    EXPECT_NE(PLATFileExist("/tmp/file"), 0);
-    EXPECT_NE(PLATFileExist("/tmp/link"), 0);
-    EXPECT_NE(PLATFileExist("/tmp"), 0);
-    EXPECT_NE(PLATFileExist("/dev/null"), 0);
+    EXPECT_TRUE(PLATFileExist("/tmp/file"));
+    EXPECT_TRUE(PLATFileExist("/tmp/link"));
+    EXPECT_TRUE(PLATFileExist("/tmp"));
+    EXPECT_TRUE(PLATFileExist("/dev/null"));
 }
 
 TEST_F(FileExistTest, IsFalseForAMissingFileAndADanglingLink) {
     std::filesystem::create_symlink("/tmp/no-such-file", "/tmp/link");
-    EXPECT_EQ(PLATFileExist("/tmp/no-such-file"), 0);
-    EXPECT_EQ(PLATFileExist("/tmp/link"), 0);
-    EXPECT_EQ(PLATFileExist(""), 0);
-    EXPECT_EQ(PLATFileExist(nullptr), 0);
+    EXPECT_FALSE(PLATFileExist("/tmp/no-such-file"));
+    EXPECT_FALSE(PLATFileExist("/tmp/link"));
+    EXPECT_FALSE(PLATFileExist(""));
+    EXPECT_FALSE(PLATFileExist(nullptr));
 }
 
 // Block devices as libata shows them in sysfs.

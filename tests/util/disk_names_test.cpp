@@ -42,8 +42,10 @@ TEST_F(DiskNamesTest, WithoutATableDevicesStayAsTheyAre) {
 }
 
 TEST_F(DiskNamesTest, AnEmptyTableLeavesDevicesAsTheyAre) {
-    EXPECT_THAT(names("{}", {"sda", "sdb"}), ElementsAre("sda", "sdb"));
-    EXPECT_THAT(names("null", {"sda"}), ElementsAre("sda"));
+    // What is no object has no members.
+    for (const char* table : {"{}", "null", "[]", R"([{"HD_DEVNAME":"sda"}])", "7", R"("sda")", "true"}) {
+        EXPECT_THAT(names(table, {"sda", "sdb"}), ElementsAre("sda", "sdb")) << table;
+    }
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
@@ -57,8 +59,7 @@ TEST_P(UselessTableTest, LeavesDevicesAsTheyAreAndALine) {
 }
 
 INSTANTIATE_TEST_SUITE_P(Tables, UselessTableTest,
-                         ::testing::Values("", "hello", "{\"1\":", "[]", "[{\"HD_DEVNAME\":\"sda\"}]", "7",
-                                           "\"sda\"", "true", std::string(100000, '['),
+                         ::testing::Values("", "hello", "{\"1\":", std::string(100000, '['),
                                            "{\"1\":" + std::string(100000, '[')));
 
 TEST_F(DiskNamesTest, ATableThatCannotBeReadLeavesALine) {
