@@ -192,10 +192,12 @@ bool IsRemoteDiskErrHandling::operator()(Json::Value& disks) {
         return false;
     }
     Json::Value report;
+    const bool isJson = parseJson(reply, report);
+    if (!report.isObject()) {
+        report = Json::Value(Json::objectValue);  // other values have no members
+    }
     bool isHandling = false;
-    const bool isReadable = parseJson(reply, report) && (report.isObject() || report.isNull()) &&
-                            readBool(report[DISK_ERR_FLAG], isHandling);
-    if (!isReadable) {
+    if (!isJson || !readBool(report[DISK_ERR_FLAG], isHandling)) {
         HA_LOG("Failed to parse remote disk error info");
         return false;
     }

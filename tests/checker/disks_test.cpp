@@ -86,7 +86,9 @@ INSTANTIATE_TEST_SUITE_P(
                              R"(["sda","sdb"])"},
                       Answer{R"({"isDiskErrHandling":false,"errHandlingDisk":["sda"]})", false, R"(["sda"])"},
                       Answer{R"({"isDiskErrHandling":true,"errHandlingDisk":[]})", true, "[]"},
-                      Answer{"{}", false, "null"}, Answer{"null", false, "null"},
+                      Answer{"{}", false, "null"}, Answer{"null", false, "null"}, Answer{"[]", false, "null"},
+                      Answer{"[true]", false, "null"}, Answer{"7", false, "null"},
+                      Answer{"true", false, "null"}, Answer{R"("text")", false, "null"},
                       Answer{R"({"isDiskErrHandling":true})", true, "null"},
                       Answer{R"({"errHandlingDisk":{"a":1}})", false, R"({"a":1})"},
                       Answer{R"({"isDiskErrHandling":1,"errHandlingDisk":"sda"})", true, R"("sda")"},
@@ -105,9 +107,8 @@ TEST_P(UnreadableAnswerTest, LeavesTheDisksAloneAndALine) {
 
 INSTANTIATE_TEST_SUITE_P(Answers, UnreadableAnswerTest,
                          ::testing::Values("", "alive",
-                                           R"({"errHandlingDisk":["sda","sdb","sdc"],"isDiskErr)", "[]",
-                                           "[true]", "7", "true", R"("text")", "[[[[[[[[[[[[[[[[[[[[",
-                                           R"({"isDiskErrHandling":"true"})",
+                                           R"({"errHandlingDisk":["sda","sdb","sdc"],"isDiskErr)",
+                                           "[[[[[[[[[[[[[[[[[[[[", R"({"isDiskErrHandling":"true"})",
                                            R"({"isDiskErrHandling":[true]})",
                                            R"({"isDiskErrHandling":{},"errHandlingDisk":["sda"]})"));
 
