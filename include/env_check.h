@@ -97,7 +97,7 @@ class SocketServer {
     /// @return true, whether or not a request arrived; false when the server socket could not be opened or
     ///         bound. Every later call then fails at once, too, and logs "Failed to start socket server"
     ///         directly followed by the system's error text. A reply that cannot be sent is logged as
-    ///         "Failed to sendto".
+    ///         "Failed to sendto". A request for which there is no memory gets no reply.
     ///
     /// A request that is not a registered type name ends the process with SIGABRT and gets no reply: only the
     /// peer speaks on this port, and a peer that speaks anything else must not be taken for a working one.

@@ -3,6 +3,7 @@
 
 #pragma once
 
+#include <new>
 #include <string>
 
 #include "daemon_log.h"
@@ -33,5 +34,12 @@ constexpr char DAEMON_RECORD_FILE[] = "/ha.daemon.record";  ///< file name of re
 }  // namespace TERN::HA::Daemon
 
 /// Log "file.cpp:LINE message" with file and line of the call site. `message` is a std::string or a literal.
-/// Blocks and fails as DaemonLog::set does.
-#define HA_LOG(message) ::TERN::HA::Daemon::logAt(__FILE_NAME__, __LINE__, (message))
+/// Blocks as DaemonLog::set does. Never throws std::bad_alloc: a line for which there is no memory is
+/// dropped, so that it does not change what the caller does.
+#define HA_LOG(message)                                                    \
+    do {                                                                   \
+        try {                                                              \
+            ::TERN::HA::Daemon::logAt(__FILE_NAME__, __LINE__, (message)); \
+        } catch (const std::bad_alloc&) {                                  \
+        }                                                                  \
+    } while (false)

@@ -33,8 +33,8 @@ constexpr NodeState operator|(NodeState a, NodeState b) {
 ///
 /// Thread-safe. No operation fails. The const operations neither lock nor block. The others lock one mutex
 /// at a time, for which they wait up to 5 seconds, and then proceed without the lock: a stuck holder delays
-/// an update but never blocks it. Only an operation that takes or returns JSON, and setRemoteAlive for its
-/// log line, needs memory; it throws std::bad_alloc, with the record unchanged, when there is none.
+/// an update but never blocks it. Only an operation that takes or returns JSON needs memory; when there is
+/// none it throws, with the record unchanged.
 class Status {
  public:
     /// Construct a record in which every flag is false but isDRBDConnect, every figure 0, both lists and the

@@ -12,7 +12,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <exception>
 #include <mutex>
 #include <new>
 #include <string_view>
@@ -126,11 +125,9 @@ std::string IsRemoteAlive::handle(Status&) {
     return ALIVE;
 }
 
-bool IsRemoteAlive::operator()() try {
+bool IsRemoteAlive::operator()() {
     std::string reply;
     return _sendToRemote(reply) && reply == ALIVE;
-} catch (const std::exception&) {
-    return false;  // no memory
 }
 
 // ---- Host name of the peer ----
@@ -139,18 +136,18 @@ std::string GetRemoteHostname::getType() {
     return "remote_hostname";
 }
 
-std::string GetRemoteHostname::handle(Status&) {
+std::string GetRemoteHostname::handle(Status&) try {
     return getLocalHostname();
+} catch (const std::bad_alloc&) {
+    return "";
 }
 
-bool GetRemoteHostname::operator()(std::string& hostname) try {
+bool GetRemoteHostname::operator()(std::string& hostname) {
     if (!_sendToRemote(hostname)) {
         HA_LOG("Failed to get remote hostname");
         return false;
     }
     return true;
-} catch (const std::exception&) {
-    return false;  // no memory
 }
 
 // ---- The peer's md resync ----
@@ -178,14 +175,18 @@ std::string IsRemoteDiskErrHandling::getType() {
     return "is_disk_err_handling";
 }
 
-std::string IsRemoteDiskErrHandling::handle(Status& status) {
+std::string IsRemoteDiskErrHandling::handle(Status& status) try {
     Json::Value report(Json::objectValue);
     report[DISK_ERR_FLAG] = status.isDiskErrHandling.load();
     report[DISK_ERR_LIST] = status.getErrHandlingDisk();
     return jsonText(report);
+} catch (const std::bad_alloc&) {
+    return "";
+} catch (const JsonOutOfMemory&) {
+    return "";
 }
 
-bool IsRemoteDiskErrHandling::operator()(Json::Value& disks) {
+bool IsRemoteDiskErrHandling::operator()(Json::Value& disks) try {
     std::string reply;
     if (!_sendToRemote(reply)) {
         HA_LOG("Failed to recv remote disk error handling responce");
@@ -203,6 +204,10 @@ bool IsRemoteDiskErrHandling::operator()(Json::Value& disks) {
     }
     disks = report[DISK_ERR_LIST];
     return isHandling;
+} catch (const std::bad_alloc&) {
+    return false;
+} catch (const JsonOutOfMemory&) {
+    return false;
 }
 
 // ---- Reboot of the peer ----
@@ -246,7 +251,7 @@ bool RebootRemote::operator()(Status& status) {
 
 // ---- DRBD ----
 
-bool isDRBDConnect() {
+bool isDRBDConnect() try {
     // The connection states in which both nodes are linked. Other states contain none of these words.
     static constexpr std::array<std::string_view, 13> LINKED = {
         "WFReportParams", "Connected",  "StartingSyncS", "StartingSyncT", "WFBitMapS",
@@ -262,6 +267,8 @@ bool isDRBDConnect() {
     return std::any_of(LINKED.begin(), LINKED.end(), [&text](std::string_view word) {
         return memmem(text.data(), text.size(), word.data(), word.size()) != nullptr;
     });
+} catch (const std::bad_alloc&) {
+    return false;
 }
 
 // ---- md resync and ATA error handling ----
@@ -285,8 +292,8 @@ bool isSysfsValue(const std::string& path, const std::string& expected) try {
         }
     }
     return line == expected;
-} catch (const std::exception&) {
-    return false;  // no memory
+} catch (const std::bad_alloc&) {
+    return false;
 }
 
 bool isMDResync() try {
@@ -298,8 +305,8 @@ bool isMDResync() try {
     return std::any_of(arrays.begin(), arrays.end(), [](const char* array) {
         return isSysfsValue(std::string(array) + "/md/sync_action", RESYNC);
     });
-} catch (const std::exception&) {
-    return false;  // no memory
+} catch (const std::bad_alloc&) {
+    return false;
 }
 
 bool isDiskErrHandling(Json::Value& disks) try {
@@ -321,8 +328,10 @@ bool isDiskErrHandling(Json::Value& disks) try {
         }
     }
     return !disks.empty();
-} catch (const std::exception&) {
-    return false;  // no memory
+} catch (const std::bad_alloc&) {
+    return false;
+} catch (const JsonOutOfMemory&) {
+    return false;
 }
 
 bool devNameByAtaPath(char* path, std::string& name) {
@@ -357,11 +366,7 @@ CommandPipe::~CommandPipe() {
         _fp = nullptr;
         return;
     }
-    try {
-        HA_LOG("Failed to exec " + _command + " return code: " + std::to_string(status));
-    } catch (const std::bad_alloc&) {
-        return;  // a destructor that throws would end the process
-    }
+    HA_LOG("Failed to exec " + _command + " return code: " + std::to_string(status));
 }
 
 float heartbeatLatency() {
@@ -506,7 +511,9 @@ std::string getLocalHostname() {
     static std::string cache;
     const std::lock_guard<std::mutex> lock(mutex);
     if (cache.empty()) {
-        readFile("/tmp/.ha.hostname.original", cache);
+        std::string content;
+        readFile("/tmp/.ha.hostname.original", content);
+        cache.swap(content);  // the whole name or none, also when memory runs out
     }
     return cache;
 }

@@ -1,5 +1,6 @@
 #include "control.h"
 
+#include <new>
 #include <utility>
 
 #include "checker.h"
@@ -13,10 +14,15 @@ namespace {
 constexpr char ACTION[] = "act";
 constexpr char IS_REBOOTING[] = "is_froce_reboot_remote";
 
-Json::Value requestFor(const char* action) {
+// One exchange with the daemon; false when there is no reply.
+bool exchange(DaemonLocalSocket& client, const char* action, Json::Value& reply) try {
     Json::Value request(Json::objectValue);
     request[ACTION] = action;
-    return request;
+    return client.clientSend(request, reply);
+} catch (const std::bad_alloc&) {
+    return false;
+} catch (const JsonOutOfMemory&) {
+    return false;
 }
 
 }  // namespace
@@ -28,7 +34,7 @@ void MonitordSocket::setStatus(Status* status) {
     _status = status;
 }
 
-bool MonitordSocket::serverHandle(const Json::Value& request, Json::Value& reply) {
+bool MonitordSocket::serverHandle(const Json::Value& request, Json::Value& reply) try {
     if (!request.isObject() || !request.isMember(ACTION)) {
         HA_LOG("Failed get action from content: " + jsonText(request));
         return false;
@@ -52,22 +58,26 @@ bool MonitordSocket::serverHandle(const Json::Value& request, Json::Value& reply
             HA_LOG("Unknown action " + action);
             return false;
     }
+} catch (const std::bad_alloc&) {
+    return false;
+} catch (const JsonOutOfMemory&) {
+    return false;
 }
 
 bool MonitordSocket::getServerData(Json::Value& out) {
-    return clientSend(requestFor("I"), out);
+    return exchange(*this, "I", out);
 }
 
 bool MonitordSocket::rebootRemote() {
     Json::Value reply;
-    return clientSend(requestFor("R"), reply);
+    return exchange(*this, "R", reply);
 }
 
 bool MonitordSocket::isRebootRemote() {
     Json::Value reply;
     bool rebooting = false;
-    if (clientSend(requestFor("r"), reply) && reply.isObject()) {
-        readBool(reply[IS_REBOOTING], rebooting);
+    if (exchange(*this, "r", reply) && reply.isObject()) {
+        readBool(std::as_const(reply)[IS_REBOOTING], rebooting);  // adds no member, which takes memory
     }
     return rebooting;
 }

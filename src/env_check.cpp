@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <new>
 
 #include "chkstate.h"
 #include "ha_log.h"
@@ -60,7 +61,7 @@ std::string EnvCheck::getType() {
     return "Undefine";
 }
 
-bool EnvCheck::_sendToRemote(std::string& reply) {
+bool EnvCheck::_sendToRemote(std::string& reply) try {
     HASocketCommClient client(remoteIP(""), CLIENT_TIMEOUT);
     if (client.HasError()) {
         HA_LOG("Failed to start socket client");
@@ -68,9 +69,11 @@ bool EnvCheck::_sendToRemote(std::string& reply) {
     }
     client.Send(getType());  // a failure shows as a missing answer
     return client.Recv(reply) >= 0;
+} catch (const std::bad_alloc&) {
+    return false;
 }
 
-bool SocketServer::operator()(TERN::HA::Daemon::Status& status) {
+bool SocketServer::operator()(TERN::HA::Daemon::Status& status) try {
     static PeerServer server;
     if (server.socket.HasError()) {
         HA_LOG(std::string("Failed to start socket server") + std::strerror(server.error));
@@ -92,6 +95,8 @@ bool SocketServer::operator()(TERN::HA::Daemon::Status& status) {
         HA_LOG("Failed to sendto");
     }
     return true;
+} catch (const std::bad_alloc&) {
+    return true;  // the request gets no reply
 }
 
 std::string drbdIF(const std::string& value) {

@@ -9,6 +9,9 @@
 
 namespace TERN::HA::Daemon {
 
+// What jsoncpp throws beside std::bad_alloc when memory runs out: it takes the memory of strings from malloc.
+using JsonOutOfMemory = Json::RuntimeError;
+
 // Parses `text`, comments allowed. False, with `value` as it was, when that is no JSON or nests too deep.
 bool parseJson(const std::string& text, Json::Value& value);
 

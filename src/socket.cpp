@@ -11,7 +11,7 @@
 #include <csignal>
 #include <cstddef>
 #include <cstring>
-#include <exception>
+#include <new>
 #include <utility>
 
 #include "ha_log.h"
@@ -74,6 +74,16 @@ ssize_t sendText(int fd, const std::string& text) {
     return sent;
 }
 
+bool refuse() {
+    syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
+    return false;
+}
+
+bool failToHandle(const char* text) {
+    syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__, text);
+    return false;
+}
+
 }  // namespace
 
 DaemonLocalSocket::DaemonLocalSocket(std::string path, unsigned int timeout)
@@ -118,8 +128,7 @@ bool DaemonLocalSocket::serverBind() {
 
 bool DaemonLocalSocket::serverListen() {
     if (_hasError) {
-        syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
-        return false;
+        return refuse();
     }
     const int fd = accept4(_fd, nullptr, nullptr, SOCK_CLOEXEC);
     if (fd == -1) {
@@ -144,8 +153,7 @@ bool DaemonLocalSocket::_serverListen(int fd) try {
     }
     Json::Value reply;
     if (!serverHandle(request, reply)) {
-        syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__, text);
-        return false;
+        return failToHandle(text);
     }
     const std::string replyText = jsonText(reply);
     if (sendText(fd, replyText) == -1) {
@@ -154,10 +162,10 @@ bool DaemonLocalSocket::_serverListen(int fd) try {
         return false;
     }
     return true;
-} catch (const std::exception&) {  // no memory
-    syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__,
-           static_cast<const char*>(_buffer));
-    return false;
+} catch (const std::bad_alloc&) {
+    return failToHandle(static_cast<const char*>(_buffer));
+} catch (const JsonOutOfMemory&) {
+    return failToHandle(static_cast<const char*>(_buffer));
 }
 
 bool DaemonLocalSocket::_clientConnect() {
@@ -185,8 +193,7 @@ bool DaemonLocalSocket::_clientConnect() {
 
 bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& reply) try {
     if (_hasError) {
-        syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
-        return false;
+        return refuse();
     }
     if (!_clientConnect()) {
         syslog(LOG_ERR, "%s:%d Failed to connect socket server: %m", __FILE_NAME__, __LINE__);
@@ -212,10 +219,12 @@ bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& repl
         return false;
     }
     return true;
-} catch (const std::exception&) {  // no memory
-    syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
+} catch (const std::bad_alloc&) {
     _hasError = true;
-    return false;
+    return refuse();
+} catch (const JsonOutOfMemory&) {
+    _hasError = true;
+    return refuse();
 }
 
 }  // namespace TERN::HA::Daemon

@@ -5,6 +5,7 @@
 #include <chrono>
 #include <filesystem>
 #include <functional>
+#include <initializer_list>
 #include <memory>
 #include <new>
 #include <optional>
@@ -27,8 +28,9 @@
 #include "support/udp.h"
 #include "util.h"
 
-// Memory runs out once in each operation, at each place where it asks for some: it ends with std::bad_alloc
-// or with the result of a failure, nothing stays open, locked or half done, and the next time all is well.
+// Memory runs out once in each operation, at each place where it asks for some: it ends with the result of a
+// failure or, where that is allowed, with std::bad_alloc; nothing stays open, locked or half done, and the
+// next time all is well.
 
 namespace {
 
@@ -49,7 +51,7 @@ struct Operation {
     std::function<std::string()> look = [] { return std::string(); };  // what it leaves behind
     std::string left = "";                                             // with enough memory
     std::set<std::string> leavings = {};                               // the others
-    bool throws = true;                                                // when there is none
+    bool throws = false;                                               // when there is none
 };
 
 std::string yesNo(bool value) {
@@ -103,6 +105,11 @@ class MemoryTest : public test::SandboxTest {
         }
     }
 
+    static void expectWholeOrThrow(Operation operation) {
+        operation.throws = true;
+        expectWhole(operation);
+    }
+
     std::unique_ptr<test::SystemLog> systemLog;
 };
 
@@ -116,12 +123,14 @@ TEST_F(MemoryTest, LocalChecks) {
     test::writeFile("/sys/class/ata_port/ata1/error_handling", "1\n");
     test::writeFile("/tmp/ha/info_hd.remote", R"({"3":{"HD_DEVNAME":"sda"}})");
 
-    expectWhole({"isDRBDConnect", [] { test::writeFile("/proc/drbd", " 0: cs:Connected\n"); },
-                 [] { return yesNo(isDRBDConnect()); }, "yes"});
+    expectWhole({"isDRBDConnect",
+                 [] { test::writeFile("/proc/drbd", " 0: cs:Connected\n"); },
+                 [] { return yesNo(isDRBDConnect()); },
+                 "yes",
+                 {"no"}});
     expectWhole({"isDRBDConnect without DRBD", [] { test::removeTree("/proc/drbd"); },
                  [] { return yesNo(isDRBDConnect()); }, "no"});
     Operation md{"isMDResync", [] {}, [] { return yesNo(isMDResync()); }, "yes", {"no"}};
-    md.throws = false;
     expectWhole(md);
     md.name = "isMDResync without arrays";
     md.prepare = [] { test::removeTree("/sys/block/md0"); };
@@ -140,10 +149,9 @@ TEST_F(MemoryTest, LocalChecks) {
                      },
                      "yes 1",
                      {"no 0"}};
-    errors.throws = false;
     expectWhole(errors);
-    expectWhole({"devListToHumanReadable", [] {}, [] { return Util::devListToHumanReadable({"sda"}).at(0); },
-                 "Disk 3"});
+    expectWholeOrThrow({"devListToHumanReadable", [] {},
+                        [] { return Util::devListToHumanReadable({"sda"}).at(0); }, "Disk 3"});
 }
 
 // ---- Programs ----
@@ -158,35 +166,35 @@ TEST_F(MemoryTest, Programs) {
                          "echo 'eth1 1500 60 40'");
     test::replaceProgram("/bin/df", "echo disks");
 
-    expectWhole({"heartbeatLatency",
-                 [] {},
-                 [] { return std::to_string(heartbeatLatency()); },
-                 "2.500000",
-                 {"0.000000"}});
-    expectWhole({"networkNonOkRate",
-                 [] {},
-                 [] {
-                     InterfaceChecker interface;
-                     float rate = -1;
-                     const bool isKnown = interface.networkNonOkRate(rate);
-                     return yesNo(isKnown) + " " + std::to_string(rate);
-                 },
-                 "yes 0.400000",
-                 {"no -1.000000"}});
-    expectWhole({"recordDF",
-                 [] { test::removeTree("/tmp/ha/ha.daemon.record"); },
-                 [] {
-                     recordDF();
-                     return "";
-                 },
-                 "",
-                 {},
-                 [] {
-                     const bool isThere = test::exists("/tmp/ha/ha.daemon.record");
-                     return isThere ? test::recordEntries().at(0) : std::string("none");
-                 },
-                 "\ndisks\n",
-                 {"none"}});
+    expectWholeOrThrow({"heartbeatLatency",
+                        [] {},
+                        [] { return std::to_string(heartbeatLatency()); },
+                        "2.500000",
+                        {"0.000000"}});
+    expectWholeOrThrow({"networkNonOkRate",
+                        [] {},
+                        [] {
+                            InterfaceChecker interface;
+                            float rate = -1;
+                            const bool isKnown = interface.networkNonOkRate(rate);
+                            return yesNo(isKnown) + " " + std::to_string(rate);
+                        },
+                        "yes 0.400000",
+                        {"no -1.000000"}});
+    expectWholeOrThrow({"recordDF",
+                        [] { test::removeTree("/tmp/ha/ha.daemon.record"); },
+                        [] {
+                            recordDF();
+                            return "";
+                        },
+                        "",
+                        {},
+                        [] {
+                            const bool isThere = test::exists("/tmp/ha/ha.daemon.record");
+                            return isThere ? test::recordEntries().at(0) : std::string("none");
+                        },
+                        "\ndisks\n",
+                        {"none"}});
 }
 
 // ---- Logs ----
@@ -195,58 +203,58 @@ TEST_F(MemoryTest, Logs) {
     const auto both = [] {
         return (test::exists(LOG) ? test::readFile(LOG) : "") + "|" + test::bufferText();
     };
-    expectWhole({"set",
-                 [] { test::removeTree(BUFFER); },
-                 [] {
-                     daemonLog->set("a line that is longer than a string holds by itself");
-                     return "";
-                 },
-                 "",
-                 {},
-                 [] { return test::exists(BUFFER) ? test::daemonLogMessages().at(0) : "none"; },
-                 "a line that is longer than a string holds by itself",
-                 {"none"}});
-    expectWhole({"writeLogToDisk",
-                 [] {
-                     test::removeTree(LOG);
-                     test::writeFile(BUFFER, "one\ntwo\n");
-                 },
-                 [] {
-                     daemonLog->writeLogToDisk();
-                     return "";
-                 },
-                 "",
-                 {},
-                 both,
-                 "one\ntwo\n|",
-                 {"|one\ntwo\n"}});
-    expectWhole({"rotate",
-                 [] {
-                     for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
-                         std::filesystem::remove(entry);
-                     }
-                     test::writeFile(LOG, "lines\n");
-                 },
-                 [] {
-                     daemonLog->rotate();
-                     return "";
-                 },
-                 "",
-                 {},
-                 // What is compressed but not moved on yet is taken up by the next rotation.
-                 [] {
-                     std::string all;
-                     for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
-                         const std::string path = entry.path();
-                         all += entry.path().filename().string() + ": " +
-                                (entry.path().extension() == ".xz"
-                                     ? test::run({"/bin/xz", "--decompress", "--stdout", path}).output
-                                     : test::readFile(path));
-                     }
-                     return all;
-                 },
-                 "ha.daemon.log.0.xz: lines\n",
-                 {"ha.daemon.log: lines\n", "ha.daemon.log.xz: lines\n"}});
+    expectWholeOrThrow({"set",
+                        [] { test::removeTree(BUFFER); },
+                        [] {
+                            daemonLog->set("a line that is longer than a string holds by itself");
+                            return "";
+                        },
+                        "",
+                        {},
+                        [] { return test::exists(BUFFER) ? test::daemonLogMessages().at(0) : "none"; },
+                        "a line that is longer than a string holds by itself",
+                        {"none"}});
+    expectWholeOrThrow({"writeLogToDisk",
+                        [] {
+                            test::removeTree(LOG);
+                            test::writeFile(BUFFER, "one\ntwo\n");
+                        },
+                        [] {
+                            daemonLog->writeLogToDisk();
+                            return "";
+                        },
+                        "",
+                        {},
+                        both,
+                        "one\ntwo\n|",
+                        {"|one\ntwo\n"}});
+    expectWholeOrThrow({"rotate",
+                        [] {
+                            for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
+                                std::filesystem::remove(entry);
+                            }
+                            test::writeFile(LOG, "lines\n");
+                        },
+                        [] {
+                            daemonLog->rotate();
+                            return "";
+                        },
+                        "",
+                        {},
+                        // What is compressed but not moved on yet is taken up by the next rotation.
+                        [] {
+                            std::string all;
+                            for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
+                                const std::string path = entry.path();
+                                all += entry.path().filename().string() + ": " +
+                                       (entry.path().extension() == ".xz"
+                                            ? test::run({"/bin/xz", "--decompress", "--stdout", path}).output
+                                            : test::readFile(path));
+                            }
+                            return all;
+                        },
+                        "ha.daemon.log.0.xz: lines\n",
+                        {"ha.daemon.log: lines\n", "ha.daemon.log.xz: lines\n"}});
 }
 
 // ---- The record ----
@@ -263,19 +271,19 @@ TEST_F(MemoryTest, TheRecord) {
         }
         return all;
     };
-    expectWhole({"setErrHandlingDisk",
-                 [] { status.setErrHandlingDisk(Json::Value()); },
-                 [disks] {
-                     status.setErrHandlingDisk(disks);
-                     return "";
-                 },
-                 "",
-                 {},
-                 names,
-                 "a disk with quite a long name,another disk with a long name,",
-                 {""}});
-    expectWhole({"toJson", [] {},
-                 [] { return std::to_string(status.toJson()["diskErrorHandlingDisk"].size()); }, "2"});
+    expectWholeOrThrow({"setErrHandlingDisk",
+                        [] { status.setErrHandlingDisk(Json::Value()); },
+                        [disks] {
+                            status.setErrHandlingDisk(disks);
+                            return "";
+                        },
+                        "",
+                        {},
+                        names,
+                        "a disk with quite a long name,another disk with a long name,",
+                        {""}});
+    expectWholeOrThrow({"toJson", [] {},
+                        [] { return std::to_string(status.toJson()["diskErrorHandlingDisk"].size()); }, "2"});
     expectWhole({"setRemoteAlive", [] { status.setRemoteAlive(false); },
                  [] { return yesNo(status.setRemoteAlive(true) && status.isRemoteAlive()); }, "yes"});
 }
@@ -294,7 +302,6 @@ TEST_F(MemoryTest, AskingThePeerForItsName) {
                    [&hostname] { return hostname; },
                    "a-host-with-quite-a-long-name",
                    {""}};
-    name.throws = false;
     expectWhole(name);
 }
 
@@ -312,23 +319,42 @@ TEST_F(MemoryTest, AskingWhetherThePeerIsAlive) {
 // With an address so long that it needs some, lack of it is a missing answer.
 TEST_F(MemoryTest, AskingAPeerWithoutAnAddress) {
     remoteIP("no address, and longer than a string holds by itself");
-    const test::FailingMemory memory(1);
-    const bool isAlive = IsRemoteAlive()();
-    const bool hasFailed = memory.hasFailed();
-    EXPECT_FALSE(isAlive);
-    EXPECT_TRUE(hasFailed);
+    IsRemoteAlive alive;
+    IsRemoteMDResync resync;
+    for (EnvCheck* const check : std::initializer_list<EnvCheck*>{&alive, &resync}) {
+        const test::FailingMemory memory(1);
+        const bool isTrue = (*check)();
+        const bool hasFailed = memory.hasFailed();
+        EXPECT_FALSE(isTrue);
+        EXPECT_TRUE(hasFailed);
+    }
 }
 
-TEST_F(MemoryTest, AskingThePeer) {
+TEST_F(MemoryTest, AskingThePeerForItsDisks) {
     remoteIP(test::kPeerAddress);
     test::FakePeer peer(R"({"errHandlingDisk":["sda","sdb"],"isDiskErrHandling":true})");
-    expectWhole({"IsRemoteDiskErrHandling", [] {},
-                 [] {
-                     Json::Value disks("as it was");
-                     const bool isHandling = IsRemoteDiskErrHandling()(disks);
-                     return yesNo(isHandling) + " " + std::to_string(disks.size());
-                 },
-                 "yes 2"});
+    Json::Value disks;
+    expectWhole({"IsRemoteDiskErrHandling",
+                 [&disks] { disks = Json::Value(Json::arrayValue); },
+                 [&disks] { return yesNo(IsRemoteDiskErrHandling()(disks)); },
+                 "yes",
+                 {"no"},
+                 [&disks] { return std::to_string(disks.size()); },
+                 "2",
+                 {"0"}});
+}
+
+TEST_F(MemoryTest, OrderingAReboot) {
+    remoteIP(test::kPeerAddress);
+    test::FakePeer peer("");
+    static Status status;
+    expectWhole({"RebootRemote",
+                 [] { status.delRemoteNodeState(NodeRebooting); },
+                 [] { return yesNo(RebootRemote()(status)); },
+                 "yes",
+                 {},
+                 [] { return std::to_string(status.getRemoteNodeState()); },
+                 std::to_string(NodeRebooting)});
 }
 
 // The server's socket stays open for good, so that it is made before the test begins.
@@ -375,6 +401,40 @@ TEST_F(AnswersWithoutMemoryTest, AnsweringThePeer) {
                  {""}});
 }
 
+TEST_F(MemoryTest, RepliesOfTheChecks) {
+    test::writeFile("/tmp/.ha.hostname.original", "a-host-with-quite-a-long-name\n");
+    Status status;
+    expectWhole({"IsRemoteDiskErrHandling",
+                 [] {},
+                 [&status] { return IsRemoteDiskErrHandling().handle(status); },
+                 R"({"errHandlingDisk":[],"isDiskErrHandling":false})",
+                 {""}});
+    expectWhole({"GetRemoteHostname",
+                 [] {},
+                 [&status] { return GetRemoteHostname().handle(status); },
+                 "a-host-with-quite-a-long-name\n",
+                 {""}});
+}
+
+TEST_F(MemoryTest, HandlingAControlRequest) {
+    Status status;
+    MonitordSocket server(test::LOCAL_SOCKET, 0);
+    server.setStatus(&status);
+    for (const std::string action : {"I", "r", "an unknown one, longer than a string holds by itself"}) {
+        Json::Value request;
+        request["act"] = action;
+        const bool isKnown = action.size() == 1;
+        expectWhole({action,
+                     [] {},
+                     [&] {
+                         Json::Value reply;
+                         return yesNo(server.serverHandle(request, reply));
+                     },
+                     yesNo(isKnown),
+                     {"no"}});
+    }
+}
+
 TEST_F(MemoryTest, ServingTheControlSocket) {
     Status status;
     MonitordSocket server(test::LOCAL_SOCKET, 0);
@@ -396,7 +456,6 @@ TEST_F(MemoryTest, ServingTheControlSocket) {
                     },
                     "whole",
                     {"closed"}};
-    query.throws = false;
     expectWhole(query);
 }
 
@@ -420,8 +479,22 @@ TEST_F(MemoryTest, AskingOverTheControlSocket) {
                        [&client, &reply] { return yesNo(client->hasError()) + " " + reply.asString(); },
                        "no an answer that is longer than a string holds by itself",
                        {"yes as it was"}};
-    exchange.throws = false;
     expectWhole(exchange);
+}
+
+TEST_F(MemoryTest, AskingOverTheControlSocketWhetherThePeerReboots) {
+    test::HandlerSocket server([](const Json::Value&, Json::Value& reply) {
+        reply["is_froce_reboot_remote"] = true;
+        return true;
+    });
+    ASSERT_TRUE(server.serverBind());
+    const test::ServingThread serving(server);
+    std::optional<MonitordSocket> client;
+    expectWhole({"isRebootRemote",
+                 [&client] { client.emplace(test::LOCAL_SOCKET, 5); },
+                 [&client] { return yesNo(client->isRebootRemote()); },
+                 "yes",
+                 {"no"}});
 }
 
 // ---- The reboot ----
