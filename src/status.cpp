@@ -1,7 +1,6 @@
 #include "status.h"
 
 #include <chrono>
-#include <ctime>
 #include <utility>
 
 #include "ha_log.h"
@@ -13,28 +12,10 @@ namespace {
 
 using Lock = std::unique_lock<std::timed_mutex>;
 
-// Now by the wall clock. Asked of the kernel here because the standard library's own clock fails after 2038
-// on 32-bit machines.
-std::chrono::system_clock::time_point wallClock() {
-    timespec now = {};
-    clock_gettime(CLOCK_REALTIME, &now);
-    return std::chrono::system_clock::time_point(std::chrono::seconds(now.tv_sec) +
-                                                 std::chrono::nanoseconds(now.tv_nsec));
-}
-
-// Waits up to `timeout` seconds for `mutex`. The lock may come back without it: whoever asked goes ahead all
-// the same.
+// The lock may not be owned; callers proceed anyway. The wait is on the monotonic clock: a deadline on the
+// wall clock would move when that is set, by any amount when it is set back during the wait.
 Lock lockFor(std::timed_mutex& mutex, std::int32_t timeout) {
-    Lock lock(mutex, std::try_to_lock);
-    if (!lock.owns_lock()) {
-        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(timeout);
-        auto rest = deadline - std::chrono::steady_clock::now();
-        // Again when the wall clock was set forward, which ends a wait before its time.
-        while (rest.count() > 0 && !lock.try_lock_until(wallClock() + rest)) {
-            rest = deadline - std::chrono::steady_clock::now();
-        }
-    }
-    return lock;
+    return Lock(mutex, std::chrono::steady_clock::now() + std::chrono::seconds(timeout));
 }
 
 Json::Value toArray(const std::set<std::string>& names) {

@@ -1,8 +1,11 @@
 #pragma once
 
+#include <chrono>
+
 namespace test {
 
-// The wall clock is set forward by an hour right after the process has looked at it for the next time.
-void stepClockAfterNextLook();
+// The wall clock is set forward by `step`, back when that is negative, right after the process has looked at
+// it for the next time.
+void stepClockAfterNextLook(std::chrono::seconds step);
 
 }  // namespace test
