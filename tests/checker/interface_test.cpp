@@ -169,6 +169,51 @@ TEST_F(InterfaceTest, WordsAreWhatAnyBlanksPart) {
     EXPECT_FLOAT_EQ(sample(), 0.4F);
 }
 
+TEST_F(InterfaceTest, TheRateIsTheShareOfWhatIsNotOk) {
+    EXPECT_FLOAT_EQ(checker._rateCaculate(5, 1995), 0.0025F);
+    EXPECT_EQ(checker._rateCaculate(0, 7), 0.0F);
+    EXPECT_EQ(checker._rateCaculate(7, 0), 1.0F);
+    EXPECT_EQ(checker._rateCaculate(0, 0), 0.0F);
+    EXPECT_EQ(checker._rateCaculate(7, -7), 0.0F);
+    EXPECT_EQ(checker._rateCaculate(-5, 15), -0.5F);
+}
+
+TEST_F(InterfaceTest, ARateIsTakenFromTheTotalsOfTheSampleBefore) {
+    EXPECT_FLOAT_EQ(checker._rateGet({{"RX-ERR", 10}, {"RX-OK", 20}, {"an OK amid", 30}, {"x", 40}}), 0.5F);
+    EXPECT_EQ(checker._lastOkTotal, 50);
+    EXPECT_EQ(checker._lastNonOkTotal, 50);
+    EXPECT_FLOAT_EQ(checker._rateGet({{"RX-ERR", 51}, {"RX-OK", 53}}), 0.25F);
+    EXPECT_EQ(checker._lastOkTotal, 53);
+    EXPECT_EQ(checker._lastNonOkTotal, 51);
+    EXPECT_EQ(checker._rateGet({}), 51.0F / 104.0F);
+}
+
+TEST_F(InterfaceTest, CountersAreReplacedOnSuccessOnly) {
+    const std::map<std::string, long long> before = {{"RX-OK", 1}, {"before", 2}};
+    std::map<std::string, long long> counters = before;
+    for (const char* rest : {"1500 99999999999999999999 5", "1500 60"}) {
+        print(std::string("Iface MTU RX-OK RX-ERR\neth1 ") + rest);
+        EXPECT_FALSE(checker._interfaceDetail("eth1", counters));
+        EXPECT_EQ(counters, before) << rest;
+    }
+    test::replaceProgram("/sbin/ifconfig", "exit 0");
+    EXPECT_FALSE(checker._interfaceDetail("eth1", counters));
+    EXPECT_EQ(counters, before);
+    test::hideProgram("/sbin/ifconfig");
+    EXPECT_FALSE(checker._interfaceDetail("eth1", counters));
+    EXPECT_EQ(counters, before);
+    test::restoreProgram("/sbin/ifconfig");
+
+    print("Iface MTU RX-OK RX-ERR\neth1 1500 60 40");
+    EXPECT_TRUE(checker._interfaceDetail("eth1", counters));
+    EXPECT_THAT(counters, ElementsAre(std::pair("RX-ERR", 40), std::pair("RX-OK", 60)));
+    EXPECT_TRUE(checker._interfaceDetail("eth2", counters));
+    EXPECT_THAT(counters, ElementsAre(std::pair("RX-ERR", 3), std::pair("RX-OK", 2)));
+    print("no title\neth1 1500 60 40");
+    EXPECT_TRUE(checker._interfaceDetail("eth1", counters));
+    EXPECT_THAT(counters, IsEmpty());
+}
+
 TEST_F(InterfaceTest, LongLinesAreReadInPiecesOf511Bytes) {
     // The last column begins where the second piece of the title does; a piece of a line counts as a line.
     const std::string title = "Iface RX-OK" + std::string(500, ' ');

@@ -1,6 +1,10 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <future>
+#include <mutex>
+#include <vector>
+
 #include "checker.h"
 #include "checker/fast_sleep.h"
 #include "checker/obedient_peer.h"
@@ -67,6 +71,65 @@ TEST_F(RebootTest, APeerThatDoesNotAnswerIsFollowedAllTheSame) {
                 ElementsAre(test::LogLine("checker.cpp", "Failed to reboot remote, but keep checking"),
                             test::LogLine("checker.cpp", "Remote offline")));
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+TEST_F(RebootTest, TheStateChangesAfterTheRequest) {
+    status.setRemoteAlive(true);
+    const test::ObedientPeer peer([this] {
+        EXPECT_EQ(status.getRemoteNodeState(), NodeAlive);
+        return true;
+    });
+    const test::FastSleep noSleep([](int) {});
+    RebootRemote()(status);
+}
+
+TEST_F(RebootTest, APeerDeclaredDeadWhileTheRequestGoesUnansweredIsOfflineAtOnce) {
+    status.setRemoteAlive(true);
+    const test::ObedientPeer peer([this] {
+        status.setRemoteAlive(false);
+        return false;
+    });
+    const test::FastSleep noSleep([](int) {});
+    EXPECT_TRUE(RebootRemote()(status));
+    EXPECT_THAT(test::FastSleep::sleeps(), IsEmpty());
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("status.cpp", "Remote server status changed to alive"),
+                            test::LogLine("status.cpp", "Remote server status changed to dead"),
+                            test::LogLine("checker.cpp", "Failed to reboot remote, but keep checking"),
+                            test::LogLine("checker.cpp", "Remote offline")));
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+TEST_F(RebootTest, APeerThatDoesNotAnswerIsFollowedUntilItIsDeclaredDead) {
+    status.setRemoteAlive(true);
+    const test::FastSleep sleep([this](int number) {
+        if (number == 2) {
+            status.setRemoteAlive(false);
+        }
+    });
+    EXPECT_TRUE(RebootRemote()(status));
+    EXPECT_THAT(test::FastSleep::sleeps(), SizeIs(2));
+    EXPECT_THAT(test::daemonLogMessages().back(), test::LogLine("checker.cpp", "Remote offline"));
+    EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
+}
+
+// Each change waits for the lock that another thread holds, so that every state lasts a second.
+TEST_F(RebootTest, ThePeerCountsAsRebootingInEachTransition) {
+    status.lockTimeout = 1;
+    const std::lock_guard<std::timed_mutex> stuck(status.remoteNodeStateMutex);
+    const test::ObedientPeer peer;
+    auto reboot = std::async(std::launch::async, [this] { return RebootRemote()(status); });
+    std::vector<unsigned int> states = {0};
+    bool isOver = false;
+    while (!isOver) {
+        isOver = reboot.wait_for(1ms) == std::future_status::ready;
+        const unsigned int state = status.getRemoteNodeState();
+        if (state != states.back()) {
+            states.push_back(state);
+        }
+    }
+    EXPECT_TRUE(reboot.get());
+    EXPECT_THAT(states, ElementsAre(0U, NodeRebootPending, NodeRebootPending | NodeRebooting, NodeRebooting));
 }
 
 TEST_F(RebootTest, APeerIsFollowedUntilItIsDeclaredDead) {

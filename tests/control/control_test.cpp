@@ -11,6 +11,7 @@
 #include "support/case_name.h"
 #include "support/json.h"
 #include "support/sandbox.h"
+#include "support/system_log.h"
 #include "support/udp.h"
 #include "support/wait.h"
 
@@ -235,7 +236,8 @@ void PrintTo(const OddReply& reply, std::ostream* stream) {
 
 class OddReplyTest : public test::SandboxTest, public ::testing::WithParamInterface<OddReply> {};
 
-TEST_P(OddReplyTest, IsNoReboot) {
+TEST_P(OddReplyTest, IsNoRebootAndNoFailure) {
+    test::SystemLog systemLog;
     test::HandlerSocket server([](const Json::Value& request, Json::Value& reply) {
         EXPECT_EQ(request, parsed(R"({"act":"r"})"));
         reply = parsed(GetParam().text);
@@ -243,7 +245,11 @@ TEST_P(OddReplyTest, IsNoReboot) {
     });
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
-    EXPECT_FALSE(MonitordSocket(test::LOCAL_SOCKET, 5).isRebootRemote());
+    MonitordSocket client(test::LOCAL_SOCKET, 5);
+    EXPECT_FALSE(client.isRebootRemote());
+    EXPECT_FALSE(client.hasError());
+    EXPECT_THAT(systemLog.texts(), IsEmpty());
+    EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
 INSTANTIATE_TEST_SUITE_P(Replies, OddReplyTest,

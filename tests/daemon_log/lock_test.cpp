@@ -54,6 +54,10 @@ class StuckLogTest : public test::SandboxTest {
     std::thread _holder;
 };
 
+TEST(LogLockTest, TheWaitIsSixtySeconds) {
+    EXPECT_EQ(DaemonLog("/var/log/ha", "/ha.daemon.log")._lockTimeout, 60);
+}
+
 TEST_F(StuckLogTest, ALineIsWrittenAfterAMinute) {
     expectToGoAheadAfterAMinute([this] { log.set("late"); });
     EXPECT_THAT(test::daemonLogMessages(), ElementsAre("late"));

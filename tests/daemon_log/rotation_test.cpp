@@ -42,6 +42,15 @@ TEST_F(RotationTest, TheLogBecomesArchive0) {
     EXPECT_EQ(uncompressed(archive(0) + ".xz"), "lines\n");
 }
 
+TEST_F(RotationTest, ItsStepsAreTrueWhenTheyFailed) {
+    test::writeFile("/tmp/a", "lines\n");
+    EXPECT_FALSE(log._xz("/tmp/a"));
+    EXPECT_TRUE(log._xz("/tmp/a"));
+    EXPECT_FALSE(log._rename("/tmp/a.xz", "/tmp/b.xz"));
+    EXPECT_TRUE(log._rename("/tmp/a.xz", "/tmp/b.xz"));
+    EXPECT_EQ(uncompressed("/tmp/b.xz"), "lines\n");
+}
+
 TEST_F(RotationTest, WithAllArchivesTheLastIsLostAndTheOthersMoveUp) {
     for (int number = 0; number < 40; ++number) {
         compress(archive(number), std::to_string(number));

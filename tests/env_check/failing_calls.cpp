@@ -1,6 +1,7 @@
 #include "env_check/failing_calls.h"
 
 #include <sys/socket.h>
+#include <sys/time.h>
 
 #include <atomic>
 #include <cerrno>
@@ -11,6 +12,7 @@ namespace {
 
 std::atomic<int> socketError{0};
 std::atomic<int> optionError{0};
+std::atomic<std::chrono::seconds> timeout{std::chrono::seconds(-1)};
 
 std::atomic<int>& errorOf(test::SystemCall call) {
     return call == test::SystemCall::Socket ? socketError : optionError;
@@ -46,10 +48,17 @@ int setsockopt(int descriptor, int level, int name, const void* value, socklen_t
     if (optionError != 0 && isIpv4(descriptor)) {
         return failWith(optionError);
     }
+    if (isIpv4(descriptor) && level == SOL_SOCKET && name == SO_RCVTIMEO) {
+        timeout = std::chrono::seconds(static_cast<const timeval*>(value)->tv_sec);
+    }
     return realSetsockopt(descriptor, level, name, value, size);
 }
 
 namespace test {
+
+std::chrono::seconds receiveTimeout() {
+    return timeout;
+}
 
 FailingCall::FailingCall(SystemCall call, int error) : call_(call) {
     errorOf(call_) = error;

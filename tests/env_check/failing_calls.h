@@ -1,5 +1,7 @@
 #pragma once
 
+#include <chrono>
+
 namespace test {
 
 /// System calls of this process that a test can make fail.
@@ -18,5 +20,8 @@ class FailingCall {
  private:
     SystemCall call_;
 };
+
+/// The receive time-out that an IPv4 socket of this process was given last; -1 s when none was.
+std::chrono::seconds receiveTimeout();
 
 }  // namespace test

@@ -1,3 +1,4 @@
+#include "checker.h"
 #include "support/files.h"
 #include "support/sandbox.h"
 #include "util.h"
@@ -17,6 +18,10 @@ TEST_F(PlainCTest, MissingFileIsMissing) {
 TEST_F(PlainCTest, ExistingFileExists) {
     test::writeFile("/tmp/ha/info_hd.remote", R"({"3":{"HD_DEVNAME":"sda"}})");
     EXPECT_THAT(devListToHumanReadable({"sda"}), ElementsAre("Disk 3"));
+}
+
+TEST_F(PlainCTest, ArgumentsEndWithTwoNulls) {
+    EXPECT_TRUE(TERN::HA::Daemon::isHadConstraints());
 }
 
 }  // namespace

@@ -1,6 +1,7 @@
 #include "socket/failing_calls.h"
 
 #include <sys/socket.h>
+#include <sys/time.h>
 
 #include <atomic>
 #include <cerrno>
@@ -11,6 +12,8 @@
 namespace {
 
 std::atomic<int> failure{0};
+std::atomic<int> lastBacklog{-1};
+std::atomic<std::chrono::seconds> lastTimeout{std::chrono::seconds(-1)};
 std::function<void()> afterConnect;
 
 int failWith(int error) {
@@ -41,16 +44,28 @@ int connect(int fd, const sockaddr* address, socklen_t size) {
 
 int listen(int fd, int backlog) noexcept {
     static auto* const realListen = test::realFunction<int(int, int)>("listen");
+    lastBacklog = backlog;
     return failure != 0 ? failWith(failure) : realListen(fd, backlog);
 }
 
 int setsockopt(int fd, int level, int name, const void* value, socklen_t size) noexcept {
     static auto* const realSetsockopt =
         test::realFunction<int(int, int, int, const void*, socklen_t)>("setsockopt", "__setsockopt64");
+    if (level == SOL_SOCKET && name == SO_RCVTIMEO) {
+        lastTimeout = std::chrono::seconds(static_cast<const timeval*>(value)->tv_sec);
+    }
     return failure != 0 ? failWith(failure) : realSetsockopt(fd, level, name, value, size);
 }
 
 namespace test {
+
+int backlog() {
+    return lastBacklog;
+}
+
+std::chrono::seconds receiveTimeout() {
+    return lastTimeout;
+}
 
 FailingSocketCalls::FailingSocketCalls(int error) {
     failure = error;

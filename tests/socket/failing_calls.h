@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <functional>
 
 namespace test {
@@ -14,6 +15,10 @@ class FailingSocketCalls {
     FailingSocketCalls(const FailingSocketCalls&) = delete;
     FailingSocketCalls& operator=(const FailingSocketCalls&) = delete;
 };
+
+// What local sockets of this process were given last.
+int backlog();
+std::chrono::seconds receiveTimeout();
 
 // While the object lives, `onConnect` is called after each connection of a socket, before connect returns.
 class ConnectHook {

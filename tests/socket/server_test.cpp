@@ -45,6 +45,7 @@ TEST_F(ServerSocketTest, AnswersARequestWithOneCompactTextAndCloses) {
     ASSERT_TRUE(server.serverBind());
     const test::RawClient client;
     client.send("{ \"b\" : [1, 2],\n\"a\": null /* comments may be there */ }");
+    EXPECT_EQ(test::backlog(), 100);
     EXPECT_TRUE(server.serverListen());
     EXPECT_EQ(client.receiveAll(), R"({"got":{"a":null,"b":[1,2]}})");
     EXPECT_FALSE(server.hasError());

@@ -106,6 +106,11 @@ TEST_F(DiskNamesTest, MembersOfAnotherShapeArePassedOver) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
+TEST_F(DiskNamesTest, ValuesAreReadAsStrings) {
+    EXPECT_THAT(names(R"({"1":{"HD_DEVNAME":7},"2-3":{"HD_DEVNAME":true,"HD_CONTAINER":5}})", {"7", "true"}),
+                ElementsAre("Disk 1", "disk 3(5)"));
+}
+
 TEST_F(DiskNamesTest, ATableMayHaveComments) {
     EXPECT_THAT(names("// disks\n{\"1\": /* first */ {\"HD_DEVNAME\": \"sda\"}}", {"sda"}),
                 ElementsAre("Disk 1"));
