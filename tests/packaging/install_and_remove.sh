@@ -17,15 +17,20 @@ eventually() { # LIMIT_IN_SECONDS COMMAND...
     done
 }
 
-# The machine's programs are read-only here: changes go into a layer above them.
+# The machine's programs are read-only here: changes go into a layer above them. Libraries of the other
+# architecture that the machine lacks lie in one below.
 layers=/run/layers
+sysroot=
+[ "$architecture" = "$(dpkg --print-architecture)" ] || sysroot=$("${0%/*}/../../script/sysroot")
 for directory in /usr/*; do
     if [ ! -d "$directory" ] || [ -L "$directory" ]; then
         continue
     fi
     layer=$layers/${directory#/usr/}
     mkdir -p "$layer/upper" "$layer/work"
-    mount -t overlay overlay -o "lowerdir=$directory,upperdir=$layer/upper,workdir=$layer/work" "$directory"
+    lower=$directory
+    [ ! -d "$sysroot$directory" ] || lower=$directory:$sysroot$directory
+    mount -t overlay overlay -o "lowerdir=$lower,upperdir=$layer/upper,workdir=$layer/work" "$directory"
 done
 
 # All that is not the machine's own. Directories that dpkg has only opened are in the layers too. The build tree,
