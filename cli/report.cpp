@@ -1,34 +1,30 @@
 #include "report.h"
 
-#include <array>
-#include <iomanip>
-#include <sstream>
-#include <string_view>
-#include <utility>
-
-#include "util.h"
+#include "client.h"
 
 namespace ternhactl {
 
 namespace {
 
-constexpr char GREEN[] = "\033[32m";
-constexpr char RED[] = "\033[31m";
-constexpr char PLAIN[] = "\033[0m";
-
-bool flag(const Json::Value& record, const char* key) {
-    const Json::Value& value = record[key];
-    return value.isBool() && value.asBool();
+// jsoncpp throws when a member of something other than an object is asked for.
+const Json::Value& member(const Json::Value& object, const char* key) {
+    return object.isObject() ? object[key] : Json::Value::nullSingleton();
 }
 
-double number(const Json::Value& record, const char* key) {
-    const Json::Value& value = record[key];
-    return value.isNumeric() ? value.asDouble() : 0.0;
+std::optional<double> number(const Json::Value& value) {
+    return value.isNumeric() ? std::optional(value.asDouble()) : std::nullopt;
 }
 
-std::vector<std::string> names(const Json::Value& record, const char* key) {
+std::string text(const Json::Value& value) {
+    return value.isString() ? value.asString() : std::string();
+}
+
+std::optional<std::vector<std::string>> names(const Json::Value& value) {
+    if (!value.isArray()) {
+        return std::nullopt;
+    }
     std::vector<std::string> result;
-    for (const Json::Value& element : record[key]) {
+    for (const Json::Value& element : value) {
         if (element.isString()) {
             result.push_back(element.asString());
         }
@@ -36,197 +32,113 @@ std::vector<std::string> names(const Json::Value& record, const char* key) {
     return result;
 }
 
-std::string joined(const std::vector<std::string>& items) {
-    std::string text;
-    for (const std::string& item : items) {
-        text += (text.empty() ? "" : ", ") + item;
-    }
-    return text;
+Report::Flag flag(const Json::Value& json) {
+    const Json::Value& value = member(json, "value");
+    const Json::Value& changes = member(json, "changes");
+    return {value.isBool() ? std::optional(value.asBool()) : std::nullopt, number(member(json, "since")),
+            changes.isUInt64() ? std::optional<std::uint64_t>(changes.asUInt64()) : std::nullopt};
 }
 
-// What users call the peer's disks. A disk that the table does not know keeps its device name.
-std::vector<std::string> readable(const std::vector<std::string>& devices) {
-    std::vector<std::string> result;
-    for (const std::string& device : devices) {
-        const auto found = TERN::HA::Daemon::Util::devListToHumanReadable({device});
-        result.insert(result.end(), found.begin(), found.end());
-        if (found.empty()) {
-            result.push_back(device);
+Report::Figure figure(const Json::Value& json) {
+    return {number(member(json, "value")), number(member(json, "time"))};
+}
+
+// How people call a node: its name, else its address.
+std::string label(const Json::Value& node, const char* otherwise) {
+    for (const char* key : {"name", "address"}) {
+        std::string found = text(member(node, key));
+        if (!found.empty()) {
+            return found;
         }
     }
-    return result;
+    return otherwise;
 }
 
-std::string fixedPoint(double value, int decimals) {
-    std::ostringstream text;
-    text << std::fixed << std::setprecision(decimals) << value;
-    return text.str();
+Json::Value valueOnly(const Json::Value& value) {
+    Json::Value json(Json::objectValue);
+    json["value"] = value;
+    return json;
 }
 
-class Table {
- public:
-    explicit Table(bool useColour) : _useColour(useColour) {}
-
-    void title(const std::string& text) { _text << text << '\n'; }
-
-    void row(const std::string& label, bool isGood, const std::string& value) {
-        _text << "  " << label << std::string(LABEL_WIDTH - label.size(), ' ');
-        if (_useColour) {
-            _text << (isGood ? GREEN : RED) << value << PLAIN << '\n';
-        } else {
-            _text << value << '\n';
-        }
-    }
-
-    void figure(const std::string& label, const std::string& value) {
-        _text << "  " << label << std::string(LABEL_WIDTH - label.size(), ' ') << value << '\n';
-    }
-
-    std::string text() const { return _text.str(); }
-
- private:
-    static constexpr std::size_t LABEL_WIDTH = 18;
-
-    std::ostringstream _text;
-    bool _useColour;
-};
-
-std::string diskErrors(bool isHandling, const std::vector<std::string>& disks) {
-    if (disks.empty()) {
-        return isHandling ? "yes" : "no";
-    }
-    return (isHandling ? "yes: " : "no: ") + joined(disks);
-}
-
-const char* yesNo(bool value) {
-    return value ? "yes" : "no";
-}
-
-void addMetric(std::ostringstream& text, const char* name, const char* help, double value) {
-    text << "# HELP " << name << ' ' << help << "\n# TYPE " << name << " gauge\n"
-         << name << ' ' << std::setprecision(9) << value << '\n';
-}
-
-// Device names are the kernel's or the peer's word: they must not break the line that quotes them.
-std::string labelValue(const std::string& text) {
-    std::string escaped;
-    for (const char c : text) {
-        if (c == '\\' || c == '"') {
-            escaped += '\\';
-        }
-        if (c == '\n') {
-            escaped += "\\n";
-        } else {
-            escaped += c;
-        }
-    }
-    return escaped;
+// An older daemon knows neither names nor times. Its latency is 0 when it was not measured.
+Json::Value reportOf(const Json::Value& record, bool isRebooting) {
+    Json::Value report(Json::objectValue);
+    report["version"] = 1;
+    report["record"] = record;
+    Json::Value& peer = report["peer"];
+    peer["alive"] = valueOnly(record["isRemoteAlive"]);
+    peer["rebooting"] = valueOnly(isRebooting);
+    peer["resync"] = valueOnly(record["isRemoteMDResync"]);
+    peer["diskErrors"] = valueOnly(record["isRemoteDiskErrHandling"]);
+    peer["disks"] = record["diskErrorHandlingDiskRemote"];
+    Json::Value& node = report["node"];
+    node["resync"] = valueOnly(record["isMDResync"]);
+    node["diskErrors"] = valueOnly(record["isDiskErrHandling"]);
+    node["disks"] = record["diskErrorHandlingDisk"];
+    Json::Value& link = report["link"];
+    link["connected"] = valueOnly(record["isDRBDConnect"]);
+    const double latency = number(record["heartbeatLatency"]).value_or(0);
+    const double rate = number(record["heartbeatPacketFailRate"]).value_or(-1);
+    link["latency"] = valueOnly(latency > 0 ? Json::Value(latency) : Json::Value());
+    link["nonOkRate"] = valueOnly(rate >= 0 && rate <= 1 ? Json::Value(rate) : Json::Value());
+    return report;
 }
 
 }  // namespace
 
-Report::Report(const Json::Value& record)
-    : isPeerAlive(flag(record, "isRemoteAlive")),
-      isPeerResync(flag(record, "isRemoteMDResync")),
-      isPeerDiskErrHandling(flag(record, "isRemoteDiskErrHandling")),
-      peerDisks(names(record, "diskErrorHandlingDiskRemote")),
-      isDrbdConnected(flag(record, "isDRBDConnect")),
-      isResync(flag(record, "isMDResync")),
-      isDiskErrHandling(flag(record, "isDiskErrHandling")),
-      disks(names(record, "diskErrorHandlingDisk")),
-      latency(number(record, "heartbeatLatency")),
-      nonOkRate(number(record, "heartbeatPacketFailRate")) {}
+Report::Report(const Json::Value& json)
+    : time(number(member(json, "time"))),
+      version(text(member(member(json, "daemon"), "version"))),
+      started(number(member(member(json, "daemon"), "started"))),
+      node(label(member(json, "node"), "this node")),
+      peer(label(member(json, "peer"), "peer")),
+      lastReply(number(member(member(json, "peer"), "lastReply"))),
+      peerAlive(flag(member(member(json, "peer"), "alive"))),
+      peerRebooting(flag(member(member(json, "peer"), "rebooting"))),
+      peerResync(flag(member(member(json, "peer"), "resync"))),
+      peerDiskErrors(flag(member(member(json, "peer"), "diskErrors"))),
+      peerDisks(names(member(member(json, "peer"), "disks"))),
+      connected(flag(member(member(json, "link"), "connected"))),
+      resync(flag(member(member(json, "node"), "resync"))),
+      diskErrors(flag(member(member(json, "node"), "diskErrors"))),
+      disks(names(member(member(json, "node"), "disks")).value_or(std::vector<std::string>())),
+      latency(figure(member(member(json, "link"), "latency"))),
+      nonOkRate(figure(member(member(json, "link"), "nonOkRate"))) {}
 
-std::string statusTable(const Report& report, bool useColour) {
-    Table table(useColour);
-    table.title("Peer");
-    table.row("state", report.isPeerAlive, report.isPeerAlive ? "alive" : "dead");
-    table.row("being rebooted", !report.isPeerRebooting, yesNo(report.isPeerRebooting));
-    table.row("RAID resync", !report.isPeerResync, yesNo(report.isPeerResync));
-    table.row("disk errors", !report.isPeerDiskErrHandling,
-              diskErrors(report.isPeerDiskErrHandling, readable(report.peerDisks)));
-    table.title("This node");
-    table.row("RAID resync", !report.isResync, yesNo(report.isResync));
-    table.row("disk errors", !report.isDiskErrHandling, diskErrors(report.isDiskErrHandling, report.disks));
-    table.title("Link");
-    table.row("DRBD", report.isDrbdConnected, report.isDrbdConnected ? "connected" : "not connected");
-    table.figure("latency", fixedPoint(report.latency, 3) + " ms");
-    table.figure("non-OK packets", fixedPoint(report.nonOkRate * 100, 2) + " %");
-    return table.text();
+const std::vector<FlagName>& flagNames() {
+    static const std::vector<FlagName> names = {
+        {"peer", "peer-alive", "peer-dead", &Report::peerAlive},
+        {"peer-reboot", "peer-rebooting", "peer-not-rebooting", &Report::peerRebooting},
+        {"peer-resync", "peer-resync", "peer-no-resync", &Report::peerResync},
+        {"peer-disk-errors", "peer-disk-errors", "peer-no-disk-errors", &Report::peerDiskErrors},
+        {"drbd", "connected", "not-connected", &Report::connected},
+        {"resync", "resync", "no-resync", &Report::resync},
+        {"disk-errors", "disk-errors", "no-disk-errors", &Report::diskErrors},
+    };
+    return names;
 }
 
-std::string diskList(const Report& report) {
-    std::string text;
-    for (const std::string& name : readable(report.peerDisks)) {
-        text += "peer: " + name + '\n';
+Json::Value fetchRecord(const Settings& settings) {
+    Json::Value record = ask(settings, "I", settings.timeout);
+    if (!record.isObject()) {
+        throw NoAnswer("the reply is not ternhad's");
     }
-    for (const std::string& name : report.disks) {
-        text += "this node: " + name + '\n';
-    }
-    return text;
+    return record;
 }
 
-std::string metrics(const Report& report) {
-    std::ostringstream text;
-    addMetric(text, "ternha_up", "Whether the daemon answers.", 1);
-    addMetric(text, "ternha_peer_alive", "Whether the peer answers.", report.isPeerAlive ? 1 : 0);
-    addMetric(text, "ternha_peer_rebooting", "Whether the peer is being rebooted.",
-              report.isPeerRebooting ? 1 : 0);
-    addMetric(text, "ternha_peer_md_resync", "Whether the peer resynchronises a RAID array.",
-              report.isPeerResync ? 1 : 0);
-    addMetric(text, "ternha_peer_disk_error_handling", "Whether the peer handles disk errors.",
-              report.isPeerDiskErrHandling ? 1 : 0);
-    addMetric(text, "ternha_md_resync", "Whether this node resynchronises a RAID array.",
-              report.isResync ? 1 : 0);
-    addMetric(text, "ternha_disk_error_handling", "Whether this node handles disk errors.",
-              report.isDiskErrHandling ? 1 : 0);
-    addMetric(text, "ternha_drbd_connected", "Whether the DRBD link is up.", report.isDrbdConnected ? 1 : 0);
-    addMetric(text, "ternha_heartbeat_latency_seconds", "Average round trip to the peer, 0 if unknown.",
-              report.latency / 1000);
-    addMetric(text, "ternha_interface_non_ok_ratio",
-              "Share of packets of the replication interface that were not OK.", report.nonOkRate);
-    text << "# HELP ternha_disk_error Disks under error handling.\n# TYPE ternha_disk_error gauge\n";
-    for (const std::string& device : report.disks) {
-        text << R"(ternha_disk_error{node="local",device=")" << labelValue(device) << "\"} 1\n";
-    }
-    for (const std::string& device : report.peerDisks) {
-        text << R"(ternha_disk_error{node="peer",device=")" << labelValue(device) << "\"} 1\n";
-    }
-    return text.str();
-}
-
-Verdict verdict(const Report& report) {
-    std::vector<std::string> critical;
-    std::vector<std::string> warnings;
-    if (!report.isPeerAlive) {
-        critical.emplace_back("peer dead");
-    }
-    if (!report.isDrbdConnected) {
-        critical.emplace_back("DRBD not connected");
-    }
-    const std::array<std::pair<bool, const char*>, 5> unwise = {{
-        {report.isPeerRebooting, "peer being rebooted"},
-        {report.isPeerResync, "peer resynchronises RAID"},
-        {report.isPeerDiskErrHandling, "peer handles disk errors"},
-        {report.isResync, "RAID resync"},
-        {report.isDiskErrHandling, "disk errors"},
-    }};
-    for (const auto& [isSo, text] : unwise) {
-        if (isSo) {
-            warnings.emplace_back(text);
+Json::Value fetchReport(const Settings& settings) {
+    try {
+        Json::Value report = ask(settings, "S", settings.timeout);
+        if (!report.isObject()) {
+            throw NoAnswer("the reply is not ternhad's");
         }
+        return report;
+    } catch (const Refused&) {
+        const Json::Value record = fetchRecord(settings);
+        const Json::Value rebooting = ask(settings, "r", settings.timeout);
+        const Json::Value& value = member(rebooting, "is_froce_reboot_remote");
+        return reportOf(record, value.isBool() && value.asBool());
     }
-
-    Verdict result = {Verdict::Level::Ok, "TERNHA OK - peer alive, DRBD connected"};
-    if (!critical.empty()) {
-        critical.insert(critical.end(), warnings.begin(), warnings.end());
-        result = {Verdict::Level::Critical, "TERNHA CRITICAL - " + joined(critical)};
-    } else if (!warnings.empty()) {
-        result = {Verdict::Level::Warning, "TERNHA WARNING - " + joined(warnings)};
-    }
-    result.line += " | latency=" + fixedPoint(report.latency, 3) +
-                   "ms;;;0 nonok=" + fixedPoint(report.nonOkRate * 100, 4) + "%;;;0;100";
-    return result;
 }
 
 }  // namespace ternhactl

@@ -2,43 +2,68 @@
 
 #include <json/value.h>
 
+#include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "settings.h"
+
 namespace ternhactl {
 
-// The daemon's status record, read defensively: what is missing or of a wrong type has its neutral value.
+// What the daemon knows, read from its report (version 1). What is missing, null or of a wrong type is
+// unknown. Times are seconds since 1970.
 struct Report {
-    explicit Report(const Json::Value& record);
+    struct Flag {
+        std::optional<bool> value;
+        std::optional<double> since;
+        std::optional<std::uint64_t> changes;
 
-    bool isPeerAlive;
-    bool isPeerResync;
-    bool isPeerDiskErrHandling;
-    std::vector<std::string> peerDisks;  // device names
-    bool isDrbdConnected;
-    bool isResync;
-    bool isDiskErrHandling;
+        bool is(bool expected) const { return value == expected; }
+    };
+    struct Figure {
+        std::optional<double> value;
+        std::optional<double> time;  // of the measurement
+    };
+
+    explicit Report(const Json::Value& json);
+
+    // What it says of the peer is what was last heard of it.
+    bool isStale() const { return !peerAlive.is(true); }
+
+    std::optional<double> time;     // of the report
+    std::string version;            // of the daemon; empty for one that does not tell
+    std::optional<double> started;  // the daemon
+    std::string node;               // name, else address, else "this node"
+    std::string peer;               // the same of the peer
+    std::optional<double> lastReply;
+
+    Flag peerAlive;
+    Flag peerRebooting;
+    Flag peerResync;
+    Flag peerDiskErrors;
+    std::optional<std::vector<std::string>> peerDisks;  // device names
+    Flag connected;
+    Flag resync;
+    Flag diskErrors;
     std::vector<std::string> disks;  // device names
-    double latency;                  // milliseconds
-    double nonOkRate;                // 0 to 1
-
-    bool isPeerRebooting = false;  // not part of the record: asked for by itself
+    Figure latency;                  // milliseconds
+    Figure nonOkRate;                // 0 to 1
 };
 
-// The table that `status` prints; with terminal colours if `useColour`.
-std::string statusTable(const Report& report, bool useColour);
-
-// The names that users see for the disks under error handling on both nodes, a line each.
-std::string diskList(const Report& report);
-
-// Prometheus' text format.
-std::string metrics(const Report& report);
-
-struct Verdict {
-    enum class Level { Ok, Warning, Critical } level;
-    std::string line;  // in the form that monitoring plugins print
+// A flag of the report, and what it is called: in events and metrics, and when it is set or clear.
+struct FlagName {
+    const char* name;
+    const char* set;
+    const char* clear;
+    Report::Flag Report::*flag;
 };
+const std::vector<FlagName>& flagNames();
 
-Verdict verdict(const Report& report);
+// The daemon's status record as it is. Throws NoAnswer.
+Json::Value fetchRecord(const Settings& settings);
+
+// The daemon's report, version 1. For an older daemon one that is made of its record. Throws NoAnswer.
+Json::Value fetchReport(const Settings& settings);
 
 }  // namespace ternhactl

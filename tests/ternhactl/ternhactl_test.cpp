@@ -30,10 +30,11 @@ using ::testing::StartsWith;
 
 constexpr char SOCKET[] = "/run/ternha/control.sock";
 
-// A daemon's end of the control socket, answering from a record that the test sets.
+// A daemon's end of the control socket, answering from a record that the test sets. With a report it is a
+// daemon of this version, without one an older daemon.
 class ControlServer {
  public:
-    explicit ControlServer(Status& status) : _socket(SOCKET, 0) {
+    explicit ControlServer(Status& status, const Json::Value* report = nullptr) : _socket(report) {
         _socket.setStatus(&status);
         EXPECT_TRUE(_socket.serverBind());
         _thread = std::thread([this] {
@@ -50,7 +51,23 @@ class ControlServer {
     }
 
  private:
-    MonitordSocket _socket;
+    class Socket : public MonitordSocket {
+     public:
+        explicit Socket(const Json::Value* report) : MonitordSocket(SOCKET, 0), _report(report) {}
+
+        bool serverHandle(const Json::Value& request, Json::Value& reply) override {
+            if (request["act"] == "S" && _report != nullptr && !_report->isNull()) {
+                reply = *_report;
+                return true;
+            }
+            return MonitordSocket::serverHandle(request, reply);
+        }
+
+     private:
+        const Json::Value* _report;
+    };
+
+    Socket _socket;
     std::atomic<bool> _isStopping{false};
     std::thread _thread;
 };
@@ -68,11 +85,21 @@ class RawServer {
 
     ~RawServer() { close(_fd); }
 
-    void answerOnce(const std::string& text) const {
+    // Takes the next client's request.
+    int accept() const {
         const int connection = accept4(_fd, nullptr, nullptr, SOCK_CLOEXEC);
         char request[64] = {};
         EXPECT_GT(recv(connection, request, sizeof request, 0), 0);
-        EXPECT_EQ(send(connection, text.data(), text.size(), 0), static_cast<ssize_t>(text.size()));
+        return connection;
+    }
+
+    static void send(int connection, const std::string& text) {
+        EXPECT_EQ(::send(connection, text.data(), text.size(), 0), static_cast<ssize_t>(text.size()));
+    }
+
+    void answerOnce(const std::string& text) const {
+        const int connection = accept();
+        send(connection, text);
         close(connection);
     }
 
@@ -81,7 +108,8 @@ class RawServer {
 };
 
 test::CommandResult shell(const std::string& command) {
-    return test::run({"/bin/bash", "-c", "PATH=" TERNHACTL_DIR ":$PATH; exec 2>&1; " + command});
+    return test::run(
+        {"/bin/bash", "-c", "PATH=" TERNHACTL_DIR ":$PATH; export TZ=UTC; exec 2>&1; " + command});
 }
 
 class TernhactlTest : public test::SandboxTest {
@@ -108,13 +136,14 @@ void setState(Status& status, const Json::Value& state) {
     }
 }
 
-// A transcript sets the daemon's record ("state JSON"), the table of the peer's disks ("disks JSON"), and
-// then holds commands ("$ COMMAND"), each with what it prints and "exit CODE".
+// A transcript sets the daemon's record ("state JSON") or its report ("report JSON"), the table of the peer's
+// disks ("disks JSON"), and then holds commands ("$ COMMAND"), each with what it prints and "exit CODE".
 class Transcript : public TernhactlTest, public ::testing::WithParamInterface<std::string> {};
 
 TEST_P(Transcript, PrintsWhatItSays) {
     Status status;
-    ControlServer server(status);
+    Json::Value report;
+    ControlServer server(status, &report);
     std::istringstream script(test::readFile(TRANSCRIPTS_DIR "/" + GetParam() + ".txt"));
     std::string command;
     std::string expected;
@@ -125,6 +154,9 @@ TEST_P(Transcript, PrintsWhatItSays) {
         if (command.empty() && line.rfind("state ", 0) == 0) {
             std::istringstream(line.substr(6)) >> json;
             setState(status, json);
+            report = Json::Value();
+        } else if (command.empty() && line.rfind("report ", 0) == 0) {
+            std::istringstream(line.substr(7)) >> report;
         } else if (command.empty() && line.rfind("disks ", 0) == 0) {
             test::writeFile("/tmp/ha/info_hd.remote", line.substr(6));
         } else if (line.rfind("$ ", 0) == 0) {
@@ -145,7 +177,9 @@ TEST_P(Transcript, PrintsWhatItSays) {
 }
 
 INSTANTIATE_TEST_SUITE_P(Ternhactl, Transcript,
-                         ::testing::Values("all_is_well", "trouble", "rebooting", "usage", "disk_names"),
+                         ::testing::Values("all_is_well", "disk_names", "never_measured", "no_kernel_files",
+                                           "older_daemon", "peer_dead", "rebooting", "trouble",
+                                           "unsafe_failover", "usage"),
                          [](const auto& transcript) { return transcript.param; });
 
 TEST_F(TernhactlTest, SaysThatThereIsNoDaemonAndExitsWithThree) {
@@ -159,7 +193,9 @@ TEST_F(TernhactlTest, SaysThatThereIsNoDaemonAndExitsWithThree) {
     }
     const auto check = shell("ternhactl check");
     EXPECT_EQ(check.exitCode, 3);
-    EXPECT_EQ(check.output, "TERNHA UNKNOWN - ternhad does not answer on /run/ternha/control.sock\n");
+    EXPECT_EQ(check.output,
+              "TERNHA UNKNOWN - ternhad does not answer on /run/ternha/control.sock: No such "
+              "file or directory\n");
 
     const auto metrics = shell("ternhactl metrics");
     EXPECT_EQ(metrics.exitCode, 3);
@@ -172,46 +208,123 @@ TEST_F(TernhactlTest, GivesUpOnASilentDaemonAfterItsTimeout) {
     const auto result = shell("ternhactl --timeout 1 status");
     EXPECT_GE(stopwatch.elapsed(), 1s);
     EXPECT_EQ(result.exitCode, 3);
-    EXPECT_EQ(result.output, "ternhactl: ternhad does not answer on /run/ternha/control.sock\n");
+    EXPECT_EQ(result.output,
+              "ternhactl: ternhad does not answer on /run/ternha/control.sock: no reply within 1 s\n");
 }
 
-TEST_F(TernhactlTest, TakesAnAnswerThatIsNoRecordForNone) {
+TEST_F(TernhactlTest, TellsWhyTheDaemonDoesNotAnswer) {
+    const auto reason = [](const std::string& command) {
+        const std::string output = shell(command).output;
+        return output.substr(output.rfind(": ") + 2);
+    };
+    EXPECT_EQ(reason("ternhactl --socket /tmp disks"), "Connection refused\n");
+    EXPECT_EQ(reason("ternhactl --socket /etc/hosts/x disks"), "Not a directory\n");
+    EXPECT_EQ(reason("ternhactl --socket /" + std::string(107, 'x') + " disks"),
+              "longer than 107 characters\n");
+    { const RawServer gone; }
+    EXPECT_EQ(reason("ternhactl disks"), "Connection refused\n");
+    test::makeDirectories("/run/private");
+    ASSERT_EQ(chmod("/run/private", 0), 0);
+    EXPECT_EQ(reason("setpriv --reuid 65534 --clear-groups ternhactl --socket /run/private/x disks"),
+              "Permission denied\n");
+}
+
+TEST_F(TernhactlTest, SaysThatTheOutputCannotBeWritten) {
+    Status status;
+    const ControlServer server(status);
+    Json::Value disks(Json::arrayValue);
+    disks.append("sda");
+    status.setErrHandlingDisk(disks);
+    for (const std::string command : {"status", "status --json", "rebooting", "disks", "metrics", "--help"}) {
+        const auto result = shell("ternhactl " + command + " >/dev/full");
+        EXPECT_EQ(result.exitCode, 74) << command;
+        EXPECT_EQ(result.output, "ternhactl: cannot write to standard output: No space left on device\n")
+            << command;
+    }
+    EXPECT_EQ(shell("ternhactl check >/dev/full").exitCode, 3);
+    EXPECT_EQ(shell("ternhactl status --watch 0.1 >/dev/full").exitCode, 74);
+    const auto file = shell("ternhactl metrics --output /nowhere/ternha.prom");
+    EXPECT_EQ(file.exitCode, 74);
+    EXPECT_EQ(file.output, "ternhactl: cannot write /nowhere/ternha.prom.new: No such file or directory\n");
+}
+
+TEST_F(TernhactlTest, ReplacesAFileOfMetricsInOneStep) {
+    Status status;
+    const ControlServer server(status);
+    test::writeFile("/tmp/ternha.prom", "old\n");
+    test::Process collector(
+        {"/bin/bash", "-c",
+         "for ((i = 0; i < 2000; i++)); do read -r line </tmp/ternha.prom || echo empty; done"});
+    for (int i = 0; i < 20; ++i) {
+        EXPECT_EQ(shell("umask 077; ternhactl metrics --output /tmp/ternha.prom").exitCode, 0);
+    }
+    EXPECT_EQ(test::resultOf(std::move(collector)).output, "");
+    EXPECT_EQ(test::readFile("/tmp/ternha.prom"), shell("ternhactl metrics").output);
+    EXPECT_EQ(shell("stat -c %a /tmp/ternha.prom; ls /tmp/*.prom*").output, "644\n/tmp/ternha.prom\n");
+}
+
+TEST_F(TernhactlTest, RejectsAReplyThatIsNotTheDaemons) {
     const RawServer server;
-    std::thread answer([&server] { server.answerOnce("[1,2]"); });
-    const auto result = shell("ternhactl status --json");
-    answer.join();
-    EXPECT_EQ(result.exitCode, 3);
+    for (const std::string reply : {"[1,2]", "{", "nonsense"}) {
+        std::thread answer([&] { server.answerOnce(reply); });
+        const auto result = shell("ternhactl status");
+        answer.join();
+        EXPECT_EQ(result.exitCode, 3);
+        EXPECT_THAT(result.output, EndsWith(": the reply is not ternhad's\n"));
+    }
 }
 
-TEST_F(TernhactlTest, ShowsNeutralValuesForFieldsOfWrongTypes) {
+TEST_F(TernhactlTest, ShowsUnknownForFieldsThatAreMissingOrOfWrongTypes) {
     const RawServer server;
     std::thread answer([&server] {
-        server.answerOnce(R"({"isRemoteAlive":"yes","heartbeatLatency":[],"diskErrorHandlingDisk":[1,{}]})");
-        server.answerOnce("{}");
+        server.answerOnce(R"({"version":1,"peer":{"alive":{"value":"yes"},"disks":7},"node":[],)"
+                          R"("link":{"latency":{"value":[]},"connected":1}})");
     });
     const auto result = shell("ternhactl check");
     answer.join();
-    EXPECT_EQ(
-        result.output,
-        "TERNHA CRITICAL - peer dead, DRBD not connected | latency=0.000ms;;;0 nonok=0.0000%;;;0;100\n");
-    EXPECT_EQ(result.exitCode, 2);
+    EXPECT_EQ(result.output,
+              "TERNHA UNKNOWN - peer not probed yet, DRBD not checked yet | latency=U;;;0 nonok=U;;;0;100\n");
+    EXPECT_EQ(result.exitCode, 3);
 }
 
 TEST_F(TernhactlTest, ColoursOnlyATerminal) {
     Status status;
     const ControlServer server(status);
     EXPECT_THAT(shell("ternhactl status").output, Not(HasSubstr("\033")));
-    EXPECT_THAT(shell("script -qec 'ternhactl status' /dev/null").output, HasSubstr("\033[31mdead\033[0m"));
+    const std::string coloured = shell("script -qec 'ternhactl status' /dev/null").output;
+    EXPECT_THAT(coloured, HasSubstr("\033[31mdead\033[0m"));
+    EXPECT_THAT(coloured, HasSubstr("RAID resync       \033[2mno (last known)\033[0m"));
+    EXPECT_THAT(coloured, HasSubstr("being rebooted    no\r\n"));
     EXPECT_THAT(shell("NO_COLOR=1 script -qec 'ternhactl status' /dev/null").output, Not(HasSubstr("\033")));
 }
 
-TEST_F(TernhactlTest, WatchShowsChangesAsTheyCome) {
+TEST_F(TernhactlTest, WatchShowsChangesAsTheyComeAndKeepsTheLastStatusWhenTheDaemonStops) {
     Status status;
-    const ControlServer server(status);
+    auto server = std::make_unique<ControlServer>(status);
     test::Process watch({TERNHACTL_DIR "/ternhactl", "status", "--watch", "0.1"});
-    EXPECT_TRUE(test::eventually(10s, [&] { return watch.output().find("dead") != std::string::npos; }));
+    const auto shows = [&watch](const std::string& text) {
+        return test::eventually(10s, [&] { return watch.output().find(text) != std::string::npos; });
+    };
+    EXPECT_TRUE(shows("dead"));
     status.setRemoteAlive(true);
-    EXPECT_TRUE(test::eventually(10s, [&] { return watch.output().find("alive") != std::string::npos; }));
+    EXPECT_TRUE(shows("alive"));
+    EXPECT_TRUE(shows("  latency           ·"));
+    status.heartbeatLatency = 1.0;
+    EXPECT_TRUE(shows("·█"));
+    status.heartbeatLatency = 0.5;
+    EXPECT_TRUE(shows("█▄"));
+    server.reset();
+    EXPECT_TRUE(
+        shows("ternhad does not answer on /run/ternha/control.sock: Connection refused\nLast status, "));
+    const std::string output = watch.output();
+    EXPECT_THAT(output.substr(output.rfind("Last status, ")), HasSubstr("  state             alive\n"));
+    server = std::make_unique<ControlServer>(status);
+    EXPECT_TRUE(test::eventually(10s, [&] {
+        const std::string text = watch.output();
+        return text.rfind("this node <-> peer: ") > text.rfind("Last status, ") + 100;
+    }));
+    EXPECT_THAT(watch.output(),
+                ::testing::ContainsRegex("(^|\n)[0-2][0-9]:[0-5][0-9]:[0-6][0-9]\nthis node"));
     watch.signal(SIGINT);
     EXPECT_TRUE(watch.waitFor(5s).has_value());
 }
@@ -227,16 +340,98 @@ TEST_F(TernhactlTest, AsksBeforeAReboot) {
     EXPECT_FALSE(status.isRemoteRebooting());
 }
 
-TEST_F(TernhactlTest, WaitsUntilThePeerIsDown) {
+TEST_F(TernhactlTest, TellsWhatBecameOfAnOrderToReboot) {
     remoteIP("127.0.0.2");
     Status status;
     const ControlServer server(status);
-    const test::Stopwatch stopwatch;
-    const auto result = shell("ternhactl reboot-peer --yes");
+    const auto dead = shell("ternhactl reboot-peer --yes");
+    EXPECT_EQ(dead.exitCode, 1);
+    EXPECT_THAT(dead.output,
+                EndsWith("The peer was already dead: nobody knows whether it heard the order.\n"));
+
+    status.setRemoteAlive(true);
+    test::Process obeyed({"/bin/bash", "-c", TERNHACTL_DIR "/ternhactl reboot-peer --yes"});
+    EXPECT_TRUE(test::eventually(10s, [&] { return status.isRemoteRebooting(); }));
+    status.setRemoteAlive(false);
+    const auto result = test::resultOf(std::move(obeyed));
     EXPECT_EQ(result.exitCode, 0);
-    EXPECT_GE(stopwatch.elapsed(), 3s);
-    EXPECT_THAT(result.output, EndsWith("The peer counts as rebooting until it answers again.\n"));
+    EXPECT_THAT(result.output,
+                EndsWith("The peer went down. It counts as rebooting until it answers again.\n"));
     EXPECT_EQ(status.getRemoteNodeState(), TERN::HA::Daemon::NodeRebooting);
+}
+
+TEST_F(TernhactlTest, SaysThatThePeerWasNotRebooted) {
+    const RawServer server;
+    const std::string report = R"({"version":1,"peer":{"alive":{"value":true}}})";
+    std::thread answer([&] {
+        server.answerOnce(report);
+        server.answerOnce("null");
+        server.answerOnce(report);
+    });
+    const auto result = shell("ternhactl reboot-peer --yes");
+    answer.join();
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_THAT(result.output, EndsWith("The peer still answers: it was not rebooted.\n"));
+}
+
+TEST_F(TernhactlTest, OrdersNoSecondRebootMeanwhile) {
+    Status status;
+    status.setRemoteAlive(true);
+    status.addRemoteNodeState(TERN::HA::Daemon::NodeRebootPending);
+    const ControlServer server(status);
+    const auto result = shell("ternhactl reboot-peer --yes");
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_EQ(result.output, "The peer is being rebooted already. Nothing done.\n");
+}
+
+constexpr char EVENTS[] =
+    "{\"version\":1,\"peer\":{\"alive\":{\"value\":true}}}\n"
+    "{\"event\":\"resync\",\"new\":\"resync\",\"old\":\"no-resync\",\"time\":0}\n"
+    "{\"event\":\"peer\",\"new\":\"peer-dead\",\"old\":\"peer-alive\",\"time\":60}\n";
+
+TEST_F(TernhactlTest, PrintsEventsAsTheyComeUntilTheDaemonEnds) {
+    const RawServer server;
+    for (const std::string option : {"", " --json"}) {
+        std::thread answer([&server] { server.answerOnce(EVENTS); });
+        const auto result = shell("ternhactl events" + option);
+        answer.join();
+        EXPECT_EQ(result.exitCode, 3);
+        EXPECT_EQ(result.output,
+                  (option.empty() ? "1970-01-01T00:00:00+0000 resync (was no-resync)\n"
+                                    "1970-01-01T00:01:00+0000 peer-dead (was peer-alive)\n"
+                                  : std::string(EVENTS).substr(std::string(EVENTS).find('\n') + 1)) +
+                      "ternhactl: ternhad does not answer on /run/ternha/control.sock: the connection was "
+                      "closed\n");
+    }
+}
+
+TEST_F(TernhactlTest, WaitsUntilAConditionHolds) {
+    const RawServer server;
+    const auto waitFor = [&server](const std::string& arguments) {
+        std::thread answer([&server] { server.answerOnce(EVENTS); });
+        const auto result = shell("ternhactl wait " + arguments);
+        answer.join();
+        return result.exitCode;
+    };
+    EXPECT_EQ(waitFor("peer-alive"), 0);  // holds already
+    EXPECT_EQ(waitFor("peer-dead"), 0);   // a change
+    EXPECT_EQ(waitFor("connected"), 3);   // the daemon ended first
+    EXPECT_EQ(waitFor("resync --timeout 600"), 0);
+}
+
+TEST_F(TernhactlTest, StopsWaitingForAConditionInTime) {
+    const RawServer server;
+    std::thread answer([&server] {
+        const int connection = server.accept();
+        server.send(connection, "{\"version\":1}\n");
+        char end = 0;
+        EXPECT_EQ(recv(connection, &end, 1, 0), 0);  // until the client has gone
+        close(connection);
+    });
+    const auto result = shell("ternhactl wait peer-alive --timeout 0.3");
+    answer.join();
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_EQ(result.output, "ternhactl: not in time: peer-alive\n");
 }
 
 std::string completionOf(const std::string& words) {

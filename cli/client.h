@@ -1,0 +1,52 @@
+#pragma once
+
+#include <json/value.h>
+
+#include <chrono>
+#include <optional>
+#include <stdexcept>
+#include <string>
+
+#include "settings.h"
+
+namespace ternhactl {
+
+// The daemon does not answer; what() tells why.
+struct NoAnswer : std::runtime_error {
+    using std::runtime_error::runtime_error;
+};
+
+// The daemon closed the connection without a reply: it does not know the request, or serves no more clients.
+struct Refused : NoAnswer {
+    using NoAnswer::NoAnswer;
+};
+
+// A connection to the daemon that carries one request.
+class Connection {
+ public:
+    using Clock = std::chrono::steady_clock;
+
+    // Connects and sends {"act": `action`}. Throws NoAnswer.
+    Connection(const Settings& settings, const std::string& action);
+    ~Connection();
+
+    Connection(const Connection&) = delete;
+    Connection& operator=(const Connection&) = delete;
+
+    // The reply up to the end of the connection, or of its next line for replies of several. Nothing when
+    // `deadline` has passed first; throws Refused at the end of the connection.
+    std::optional<Json::Value> reply(Clock::time_point deadline);
+    std::optional<Json::Value> line(Clock::time_point deadline);
+
+ private:
+    enum class Input { Data, End, Timeout };
+    Input receive(Clock::time_point deadline);
+
+    int _fd;
+    std::string _buffer;
+};
+
+// The reply to {"act": `action`}, which must come within `timeout` seconds. Throws NoAnswer.
+Json::Value ask(const Settings& settings, const std::string& action, unsigned int timeout);
+
+}  // namespace ternhactl

@@ -1,0 +1,87 @@
+#include <json/writer.h>
+
+#include <algorithm>
+#include <iostream>
+
+#include "client.h"
+#include "commands.h"
+#include "report.h"
+#include "text.h"
+
+namespace ternhactl {
+
+namespace {
+
+using Clock = Connection::Clock;
+
+constexpr auto NO_LIMIT = std::chrono::hours(24 * 365);
+
+// Asks for the changes. The first line of the reply is the report, which tells what holds already; a line for
+// each change follows as it comes.
+Json::Value firstLine(Connection& connection, const Settings& settings) {
+    auto line = connection.line(Clock::now() + std::chrono::seconds(settings.timeout));
+    if (!line) {
+        throw NoAnswer("no reply within " + std::to_string(settings.timeout) + " s");
+    }
+    return *line;
+}
+
+std::string text(const Json::Value& event, const char* key) {
+    const Json::Value& value = event.isObject() ? event[key] : Json::Value::nullSingleton();
+    return value.isString() ? value.asString() : "unknown";
+}
+
+std::string when(const Json::Value& event) {
+    const Json::Value& time = event.isObject() ? event["time"] : Json::Value::nullSingleton();
+    return time.isNumeric() ? timeStamp(time.asDouble()) : "unknown";
+}
+
+bool holds(const Report& report, const std::string& condition) {
+    return std::any_of(flagNames().begin(), flagNames().end(), [&](const FlagName& name) {
+        const Report::Flag& flag = report.*name.flag;
+        return (condition == name.set && flag.is(true)) || (condition == name.clear && flag.is(false));
+    });
+}
+
+}  // namespace
+
+ExitCode wait(const Settings& settings) {
+    const auto deadline =
+        Clock::now() +
+        (settings.waitLimit
+             ? std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(*settings.waitLimit))
+             : NO_LIMIT);
+    Connection connection(settings, "E");
+    bool isSo = holds(Report(firstLine(connection, settings)), settings.condition);
+    while (!isSo) {
+        const auto line = connection.line(deadline);
+        if (!line) {
+            std::cerr << "ternhactl: not in time: " << settings.condition << '\n';
+            return ExitCode::No;
+        }
+        isSo = text(*line, "new") == settings.condition;
+    }
+    return ExitCode::Success;
+}
+
+ExitCode events(const Settings& settings) {
+    Connection connection(settings, "E");
+    firstLine(connection, settings);
+    Json::StreamWriterBuilder compact;
+    compact["indentation"] = "";
+    while (std::cout) {
+        const auto event = connection.line(Clock::now() + NO_LIMIT);
+        if (!event) {
+            continue;
+        }
+        if (settings.json != Settings::Json::None) {
+            std::cout << Json::writeString(compact, *event) << std::endl;
+        } else {
+            std::cout << when(*event) << ' ' << text(*event, "new") << " (was " << text(*event, "old") << ')'
+                      << std::endl;
+        }
+    }
+    return ExitCode::Success;
+}
+
+}  // namespace ternhactl

@@ -1,0 +1,48 @@
+#include <iostream>
+#include <system_error>
+
+#include "client.h"
+#include "commands.h"
+#include "metrics.h"
+#include "status_view.h"
+#include "verdict.h"
+
+namespace ternhactl {
+
+ExitCode check(const Settings& settings) {
+    const Report report(fetchReport(settings));
+    const Verdict result = verdict(report, readLocalState());
+    std::cout << pluginLine(report, result) << '\n';
+    return static_cast<ExitCode>(result.level);  // the levels are the convention's exit codes
+}
+
+ExitCode printMetrics(const Settings& settings) {
+    ExitCode code = ExitCode::Success;
+    std::string text;
+    try {
+        const Report report(fetchReport(settings));
+        text = metrics(report, verdict(report, readLocalState()));
+    } catch (const NoAnswer& error) {
+        complain(settings, error.what());
+        text = metricsOfNoDaemon();
+        code = ExitCode::NoAnswer;
+    }
+    if (settings.output.empty()) {
+        std::cout << text;
+        return code;
+    }
+    try {
+        writeAtomically(settings.output, text);
+    } catch (const std::system_error& error) {
+        std::cerr << "ternhactl: cannot write " << error.what() << '\n';
+        return ExitCode::OutputError;
+    }
+    return code;
+}
+
+ExitCode disks(const Settings& settings) {
+    std::cout << diskList(Report(fetchReport(settings)));
+    return ExitCode::Success;
+}
+
+}  // namespace ternhactl

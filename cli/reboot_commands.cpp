@@ -1,0 +1,53 @@
+#include <iostream>
+
+#include "client.h"
+#include "commands.h"
+#include "report.h"
+
+namespace ternhactl {
+
+namespace {
+
+constexpr unsigned int REBOOT_TIMEOUT = 40;  // seconds; the daemon follows the peer down for up to 33
+
+// Asks on the terminal; anything but "y" or "yes" is no.
+bool confirm() {
+    std::cout << "Reboot the peer at once, without a shutdown? [y/N] " << std::flush;
+    std::string answer;
+    std::getline(std::cin, answer);
+    return answer == "y" || answer == "Y" || answer == "yes";
+}
+
+}  // namespace
+
+ExitCode rebooting(const Settings& settings) {
+    const bool isRebooting = Report(fetchReport(settings)).peerRebooting.is(true);
+    std::cout << (isRebooting ? "yes\n" : "no\n");
+    return isRebooting ? ExitCode::Success : ExitCode::No;
+}
+
+ExitCode rebootPeer(const Settings& settings) {
+    if (!settings.isConfirmed && !confirm()) {
+        std::cout << "Nothing done.\n";
+        return ExitCode::No;
+    }
+    const Report before(fetchReport(settings));
+    if (before.peerRebooting.is(true) && before.peerAlive.is(true)) {
+        std::cout << "The peer is being rebooted already. Nothing done.\n";
+        return ExitCode::No;
+    }
+    std::cout << "Ordering the reboot and following the peer down, up to 33 seconds...\n" << std::flush;
+    ask(settings, "R", REBOOT_TIMEOUT);
+    if (before.peerAlive.is(false)) {
+        std::cout << "The peer was already dead: nobody knows whether it heard the order.\n";
+        return ExitCode::No;
+    }
+    if (!Report(fetchReport(settings)).peerAlive.is(false)) {
+        std::cout << "The peer still answers: it was not rebooted.\n";
+        return ExitCode::No;
+    }
+    std::cout << "The peer went down. It counts as rebooting until it answers again.\n";
+    return ExitCode::Success;
+}
+
+}  // namespace ternhactl

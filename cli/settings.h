@@ -1,0 +1,33 @@
+#pragma once
+
+#include <optional>
+#include <string>
+
+namespace ternhactl {
+
+// The command line.
+struct Settings {
+    enum class Json { None, Record, Version1 };
+
+    std::string socket = "/run/ternha/control.sock";
+    unsigned int timeout = 5;  // seconds
+    Json json = Json::None;
+    double watchInterval = 0;  // seconds, 0: once
+    bool isConfirmed = false;
+    std::string output;                    // a file; empty: standard output
+    std::string condition;                 // that `wait` waits for
+    std::optional<double> waitLimit = {};  // seconds; none: for ever
+};
+
+// The process's exit codes. `check` uses the first four as monitoring plugins do: OK, warning, critical and
+// unknown.
+enum class ExitCode {
+    Success = 0,       // done; rebooting: yes; check: all is well
+    No = 1,            // rebooting: no; reboot-peer: not rebooted; wait: not in time; check: warning
+    Critical = 2,      // check: the peer or the DRBD link is down
+    NoAnswer = 3,      // the daemon does not answer or cannot be reached; check: unknown
+    WrongUsage = 64,   // the command line is wrong
+    OutputError = 74,  // the output cannot be written
+};
+
+}  // namespace ternhactl

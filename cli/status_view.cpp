@@ -1,0 +1,216 @@
+#include "status_view.h"
+
+#include <algorithm>
+#include <array>
+#include <sstream>
+
+#include "text.h"
+#include "util.h"
+#include "verdict.h"
+
+namespace ternhactl {
+
+namespace {
+
+constexpr char RED[] = "\033[31m";
+constexpr char DIM[] = "\033[2m";
+constexpr char PLAIN[] = "\033[0m";
+constexpr char TOO_MANY_DISKS[] = "more disks than a report holds";
+
+enum class Look { Normal, Trouble, Stale };
+
+class View {
+ public:
+    explicit View(bool useColour) : _useColour(useColour) {}
+
+    void line(const std::string& text) { _text << text << '\n'; }
+
+    void row(const std::string& label, Look look, const std::string& value) {
+        _text << "  " << label << std::string(LABEL_WIDTH - label.size(), ' ') << painted(look, value)
+              << '\n';
+    }
+
+    std::string painted(Look look, const std::string& text) const {
+        return _useColour && look != Look::Normal ? (look == Look::Trouble ? RED : DIM) + text + PLAIN : text;
+    }
+
+    std::string text() const { return _text.str(); }
+
+ private:
+    static constexpr std::size_t LABEL_WIDTH = 18;
+
+    std::ostringstream _text;
+    bool _useColour;
+};
+
+Look troubleIf(bool isTrouble) {
+    return isTrouble ? Look::Trouble : Look::Normal;
+}
+
+// What users call the peer's disks. A disk that the table does not know keeps its device name.
+std::vector<std::string> readable(const std::vector<std::string>& devices) {
+    std::vector<std::string> result;
+    for (const std::string& device : devices) {
+        const auto found = TERN::HA::Daemon::Util::devListToHumanReadable({device});
+        result.insert(result.end(), found.begin(), found.end());
+        if (found.empty()) {
+            result.push_back(device);
+        }
+    }
+    return result;
+}
+
+std::string yesNo(const Report::Flag& flag, double now) {
+    if (!flag.value) {
+        return "unknown";
+    }
+    return *flag.value ? "yes" + sinceOf(flag.since, now) : "no";
+}
+
+bool isWithoutNames(const Report& report) {
+    return report.peerDiskErrors.is(true) && (!report.peerDisks || report.peerDisks->empty());
+}
+
+std::string headline(const Report& report, const LocalState& local, double now) {
+    const Verdict result = verdict(report, local);
+    const bool isOk = result.level == Verdict::Level::Ok;
+    return report.node + " <-> " + report.peer + ": " + result.word() + ", " +
+           (isOk ? "alive" + sinceOf(report.peerAlive.since, now) : joined(result.reasons));
+}
+
+void addPeer(View& view, const Report& report, double now) {
+    view.line("Peer");
+    if (!report.peerAlive.value) {
+        view.row("state", Look::Normal, "unknown");
+    } else {
+        std::string state =
+            (report.peerAlive.is(true) ? "alive" : "dead") + sinceOf(report.peerAlive.since, now);
+        if (report.isStale() && report.lastReply) {
+            state += ", last reply " + duration(now - *report.lastReply) + " ago";
+        }
+        view.row("state", troubleIf(report.isStale()), state);
+    }
+    view.row("being rebooted", troubleIf(report.peerRebooting.is(true)), yesNo(report.peerRebooting, now));
+
+    const std::string age = report.lastReply ? ", " + duration(now - *report.lastReply) + " ago" : "";
+    const auto reported = [&](const char* label, const Report::Flag& flag, const std::string& value) {
+        const bool isOld = report.isStale() && flag.value;
+        view.row(label, isOld ? Look::Stale : troubleIf(flag.is(true)),
+                 value + (isOld ? " (last known" + age + ')' : ""));
+    };
+    reported("RAID resync", report.peerResync, yesNo(report.peerResync, now));
+    std::string disks = yesNo(report.peerDiskErrors, now);
+    if (isWithoutNames(report)) {
+        disks += std::string(", ") + TOO_MANY_DISKS;
+    } else if (report.peerDisks && !report.peerDisks->empty()) {
+        disks += ": " + joined(readable(*report.peerDisks));
+    }
+    reported("disk errors", report.peerDiskErrors, disks);
+}
+
+void addNode(View& view, const Report& report, const LocalState& local, double now) {
+    view.line("This node");
+    view.row("RAID resync", troubleIf(report.resync.is(true)),
+             local.hasArrays || !report.resync.is(false) ? yesNo(report.resync, now) : "no arrays");
+    if (!local.arrayProblems.empty()) {
+        view.row("RAID arrays", Look::Trouble, joined(local.arrayProblems));
+    }
+    std::string disks = yesNo(report.diskErrors, now);
+    if (!local.hasAtaPorts && report.diskErrors.is(false)) {
+        disks = "no ATA ports";
+    } else if (!report.disks.empty()) {
+        disks += ": " + joined(report.disks);
+    }
+    view.row("disk errors", troubleIf(report.diskErrors.is(true)), disks);
+}
+
+void addDrbd(View& view, const Report& report, const LocalState& local, double now) {
+    if (!local.unsupportedDrbd.empty()) {
+        view.row("DRBD", Look::Trouble, local.unsupportedDrbd + " is not supported, 8.4 is");
+    } else if (!report.connected.value) {
+        view.row("DRBD", Look::Normal, "unknown");
+    } else if (*report.connected.value) {
+        view.row("DRBD", Look::Normal, "connected" + sinceOf(report.connected.since, now));
+    } else {
+        view.row("DRBD", Look::Trouble,
+                 "not connected" + (local.hasDrbd ? sinceOf(report.connected.since, now)
+                                                  : std::string(" (no /proc/drbd)")));
+    }
+    std::vector<std::string> problems = local.drbdProblems;
+    if (report.connected.is(true)) {
+        problems.insert(problems.begin(), local.unlinked.begin(), local.unlinked.end());
+    }
+    for (const std::string& problem : problems) {
+        view.row("", Look::Trouble, problem);
+    }
+}
+
+void addLink(View& view, const Report& report, const LocalState& local, double now) {
+    view.line("Link");
+    addDrbd(view, report, local, now);
+    const bool isOld = report.isStale() && report.latency.value;
+    std::string latency = "unknown";
+    if (report.latency.value) {
+        latency = fixedPoint(*report.latency.value, 3) + " ms";
+    }
+    if (isOld) {
+        latency += " (last known" +
+                   (report.latency.time ? ", " + duration(now - *report.latency.time) + " ago" : "") + ')';
+    }
+    view.row("latency", isOld ? Look::Stale : Look::Normal, latency);
+    view.row("non-OK packets", Look::Normal,
+             report.nonOkRate.value ? fixedPoint(*report.nonOkRate.value * 100, 2) + " %" : "unknown");
+}
+
+}  // namespace
+
+std::string statusView(const Report& report, const LocalState& local, bool useColour) {
+    const double now = report.time.value_or(currentTime());
+    View view(useColour);
+    view.line(view.painted(troubleIf(verdict(report, local).level != Verdict::Level::Ok),
+                           headline(report, local, now)));
+    addPeer(view, report, now);
+    addNode(view, report, local, now);
+    addLink(view, report, local, now);
+    return view.text();
+}
+
+std::string dimmed(const std::string& text, bool useColour) {
+    return View(useColour).painted(Look::Stale, text);
+}
+
+std::string diskList(const Report& report) {
+    const std::string peer = report.isStale() ? "peer, last known: " : "peer: ";
+    std::string text;
+    if (isWithoutNames(report)) {
+        text += peer + TOO_MANY_DISKS + '\n';
+    } else if (report.peerDisks) {
+        for (const std::string& name : readable(*report.peerDisks)) {
+            text += peer + name + '\n';
+        }
+    }
+    for (const std::string& name : report.disks) {
+        text += "this node: " + name + '\n';
+    }
+    return text;
+}
+
+std::string blocks(const std::vector<std::optional<double>>& values) {
+    static constexpr std::array<const char*, 8> HEIGHTS = {"▁", "▂", "▃", "▄", "▅", "▆", "▇", "█"};
+    double largest = 0;
+    for (const auto& value : values) {
+        largest = std::max(largest, value.value_or(0));
+    }
+    std::string text;
+    for (const auto& value : values) {
+        if (value) {
+            const double share = largest > 0 ? *value / largest : 0;
+            text += HEIGHTS.at(static_cast<std::size_t>(share * (HEIGHTS.size() - 1)));
+        } else {
+            text += "·";
+        }
+    }
+    return text;
+}
+
+}  // namespace ternhactl

@@ -1,0 +1,108 @@
+#include "verdict.h"
+
+#include <array>
+#include <utility>
+
+#include "text.h"
+
+namespace ternhactl {
+
+namespace {
+
+using Reasons = std::vector<std::string>;
+
+void append(Reasons& to, const Reasons& from) {
+    to.insert(to.end(), from.begin(), from.end());
+}
+
+// What was wrong with a peer that can no longer be asked.
+Reasons lastKnown(const Report& report, double now) {
+    Reasons found;
+    if (report.peerResync.is(true)) {
+        found.emplace_back("RAID resync");
+    }
+    if (report.peerDiskErrors.is(true)) {
+        found.emplace_back("disk errors");
+    }
+    if (found.empty()) {
+        return {};
+    }
+    const std::string age = report.lastReply ? ' ' + duration(now - *report.lastReply) + " ago" : "";
+    return {"peer's last known state" + age + ": " + joined(found)};
+}
+
+// One figure of the performance data.
+std::string figure(const char* name, const std::string& value, const char* limits) {
+    return std::string(name) + '=' + value + limits;
+}
+
+}  // namespace
+
+const char* Verdict::word() const {
+    static constexpr std::array<const char*, 4> WORDS = {"OK", "WARNING", "CRITICAL", "UNKNOWN"};
+    return WORDS.at(static_cast<std::size_t>(level));
+}
+
+Verdict verdict(const Report& report, const LocalState& local) {
+    const double now = report.time.value_or(currentTime());
+    Reasons critical;
+    Reasons unknown;
+    Reasons warnings;
+    if (report.peerAlive.is(false)) {
+        critical.push_back("peer dead" + sinceOf(report.peerAlive.since, now));
+    } else if (!report.peerAlive.value) {
+        unknown.emplace_back("peer not probed yet");
+    }
+    if (!local.unsupportedDrbd.empty()) {
+        critical.push_back("DRBD " + local.unsupportedDrbd + " is not supported, 8.4 is");
+    } else if (report.connected.is(false)) {
+        critical.push_back("DRBD not connected" + std::string(local.hasDrbd ? "" : " (no /proc/drbd)"));
+    } else {
+        if (!report.connected.value) {
+            unknown.emplace_back("DRBD not checked yet");
+        }
+        append(warnings, local.unlinked);
+    }
+    const std::array<std::pair<bool, const char*>, 5> unwise = {{
+        {report.peerRebooting.is(true), "peer being rebooted"},
+        {report.peerResync.is(true) && !report.isStale(), "peer resynchronises RAID"},
+        {report.peerDiskErrors.is(true) && !report.isStale(), "peer handles disk errors"},
+        {report.resync.is(true), "RAID resync"},
+        {report.diskErrors.is(true), "disk errors"},
+    }};
+    for (const auto& [isSo, text] : unwise) {
+        if (isSo) {
+            warnings.emplace_back(text);
+        }
+    }
+    append(warnings, local.drbdProblems);
+    append(warnings, local.arrayProblems);
+    if (report.isStale()) {
+        append(warnings, lastKnown(report, now));
+    }
+
+    Verdict result;
+    if (!critical.empty()) {
+        result.level = Verdict::Level::Critical;
+    } else if (!unknown.empty()) {
+        result.level = Verdict::Level::Unknown;
+    } else if (!warnings.empty()) {
+        result.level = Verdict::Level::Warning;
+    } else {
+        result.reasons = {"peer alive" + sinceOf(report.peerAlive.since, now), "DRBD connected"};
+    }
+    append(result.reasons, critical);
+    append(result.reasons, unknown);
+    append(result.reasons, warnings);
+    return result;
+}
+
+std::string pluginLine(const Report& report, const Verdict& verdict) {
+    const bool isLatencyKnown = report.latency.value && !report.isStale();
+    return "TERNHA " + std::string(verdict.word()) + " - " + joined(verdict.reasons) + " | " +
+           figure("latency", isLatencyKnown ? fixedPoint(*report.latency.value, 3) + "ms" : "U", ";;;0 ") +
+           figure("nonok", report.nonOkRate.value ? fixedPoint(*report.nonOkRate.value * 100, 4) + '%' : "U",
+                  ";;;0;100");
+}
+
+}  // namespace ternhactl
