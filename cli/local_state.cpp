@@ -48,11 +48,11 @@ void readResource(const std::vector<std::string>& words, LocalState& state) {
         return;
     }
     if (const std::string own = replicas.substr(0, slash); own != "UpToDate") {
-        state.drbdProblems.push_back(name + " replica " + own);
+        state.replicaProblems.push_back(name + " replica " + own);
     }
     // Without a connection the peer's replica is not known to be any better.
     if (const std::string peer = replicas.substr(slash + 1); isConnected && peer != "UpToDate") {
-        state.drbdProblems.push_back(name + " peer's replica " + peer);
+        state.peerReplicaProblems.push_back(name + " peer's replica " + peer);
     }
 }
 

@@ -7,12 +7,13 @@ namespace ternhactl {
 
 // What the kernel tells of this node and the daemon's record has no place for.
 struct LocalState {
-    bool hasDrbd = false;                    // there is a /proc/drbd
-    std::string unsupportedDrbd;             // the version of DRBD when it is not 8
-    std::vector<std::string> drbdProblems;   // of its replicas, as "DRBD 0 replica Inconsistent"
-    std::vector<std::string> unlinked;       // its resources that are not connected
-    bool hasArrays = false;                  // md
-    std::vector<std::string> arrayProblems;  // as "md0 degraded"
+    bool hasDrbd = false;                          // there is a /proc/drbd
+    std::string unsupportedDrbd;                   // the version of DRBD when it is not 8
+    std::vector<std::string> replicaProblems;      // as "DRBD 0 replica Inconsistent"
+    std::vector<std::string> peerReplicaProblems;  // the same of the connected peer
+    std::vector<std::string> unlinked;             // its resources that are not connected
+    bool hasArrays = false;                        // md
+    std::vector<std::string> arrayProblems;        // as "md0 degraded"
     bool hasAtaPorts = false;
 };
 

@@ -67,7 +67,9 @@ void addCommands(CLI::App& app, Settings& settings, Command& command) {
         ->add_flag("--yes", settings.isConfirmed, "Do not ask for confirmation");
     add("disks", "List the disks under error handling by the names that users see", disks);
     add(CHECK, "Print one line and exit as a monitoring plugin: 0 OK, 1 warning, 2 critical, 3 unknown",
-        check);
+        check)
+        ->add_flag("--self", settings.isSelfOnly,
+                   "Whether this node could serve alone: neither peer nor link");
     add("metrics", "Print the figures in Prometheus' text format", printMetrics)
         ->add_option("--output", settings.output, "Replace FILE by them in one step instead")
         ->type_name("FILE");

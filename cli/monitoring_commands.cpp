@@ -11,8 +11,9 @@ namespace ternhactl {
 
 ExitCode check(const Settings& settings) {
     const Report report(fetchReport(settings));
-    const Verdict result = verdict(report, readLocalState());
-    std::cout << pluginLine(report, result) << '\n';
+    const LocalState local = readLocalState();
+    const Verdict result = settings.isSelfOnly ? verdictOfNode(report, local) : verdict(report, local);
+    std::cout << (settings.isSelfOnly ? pluginLine(result) : pluginLine(report, result)) << '\n';
     return static_cast<ExitCode>(result.level);  // the levels are the convention's exit codes
 }
 

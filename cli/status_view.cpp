@@ -136,12 +136,12 @@ void addDrbd(View& view, const Report& report, const LocalState& local, double n
                  "not connected" + (local.hasDrbd ? sinceOf(report.connected.since, now)
                                                   : std::string(" (no /proc/drbd)")));
     }
-    std::vector<std::string> problems = local.drbdProblems;
-    if (report.connected.is(true)) {
-        problems.insert(problems.begin(), local.unlinked.begin(), local.unlinked.end());
-    }
-    for (const std::string& problem : problems) {
-        view.row("", Look::Trouble, problem);
+    const std::vector<std::string> none;
+    for (const auto* problems : {report.connected.is(true) ? &local.unlinked : &none, &local.replicaProblems,
+                                 &local.peerReplicaProblems}) {
+        for (const std::string& problem : *problems) {
+            view.row("", Look::Trouble, problem);
+        }
     }
 }
 

@@ -75,7 +75,8 @@ Verdict verdict(const Report& report, const LocalState& local) {
             warnings.emplace_back(text);
         }
     }
-    append(warnings, local.drbdProblems);
+    append(warnings, local.replicaProblems);
+    append(warnings, local.peerReplicaProblems);
     append(warnings, local.arrayProblems);
     if (report.isStale()) {
         append(warnings, lastKnown(report, now));
@@ -97,9 +98,34 @@ Verdict verdict(const Report& report, const LocalState& local) {
     return result;
 }
 
+Verdict verdictOfNode(const Report& report, const LocalState& local) {
+    Verdict result;
+    if (report.resync.is(true)) {
+        result.reasons.emplace_back("RAID resync");
+    }
+    if (report.diskErrors.is(true)) {
+        result.reasons.emplace_back("disk errors");
+    }
+    append(result.reasons, local.replicaProblems);
+    append(result.reasons, local.arrayProblems);
+    if (!result.reasons.empty()) {
+        result.level = Verdict::Level::Warning;
+    } else if (!report.resync.value || !report.diskErrors.value) {
+        result.level = Verdict::Level::Unknown;
+        result.reasons = {"this node not checked yet"};
+    } else {
+        result.reasons = {"this node could serve alone"};
+    }
+    return result;
+}
+
+std::string pluginLine(const Verdict& verdict) {
+    return "TERNHA " + std::string(verdict.word()) + " - " + joined(verdict.reasons);
+}
+
 std::string pluginLine(const Report& report, const Verdict& verdict) {
     const bool isLatencyKnown = report.latency.value && !report.isStale();
-    return "TERNHA " + std::string(verdict.word()) + " - " + joined(verdict.reasons) + " | " +
+    return pluginLine(verdict) + " | " +
            figure("latency", isLatencyKnown ? fixedPoint(*report.latency.value, 3) + "ms" : "U", ";;;0 ") +
            figure("nonok", report.nonOkRate.value ? fixedPoint(*report.nonOkRate.value * 100, 4) + '%' : "U",
                   ";;;0;100");

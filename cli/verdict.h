@@ -20,7 +20,11 @@ struct Verdict {
 
 Verdict verdict(const Report& report, const LocalState& local);
 
-// The one line that monitoring plugins print, with the figures.
+// Whether this node could serve alone: the peer and the link to it do not count.
+Verdict verdictOfNode(const Report& report, const LocalState& local);
+
+// The one line that monitoring plugins print, with the figures where a report is given.
+std::string pluginLine(const Verdict& verdict);
 std::string pluginLine(const Report& report, const Verdict& verdict);
 
 }  // namespace ternhactl

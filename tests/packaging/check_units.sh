@@ -15,11 +15,11 @@ cp -L /bin/kill "$root/bin/"
 cp /lib/systemd/system/{basic,sysinit,network,network-pre,local-fs,local-fs-pre,shutdown,umount,paths,sockets,slices,timers,swap}.target \
     "$root/lib/systemd/system/"
 complaints=$(systemd-analyze verify --root="$root" --man=no --recursive-errors=no \
-    "$root"/lib/systemd/system/ternha*.service 2>&1) || { echo "$complaints" >&2; exit 1; }
+    "$root"/lib/systemd/system/ternha*.{service,timer} 2>&1) || { echo "$complaints" >&2; exit 1; }
 [ -z "$complaints" ] || { echo "$complaints" >&2; exit 1; }
 
 # In tenths; the exit code tells when one is above.
-for unit in ternhad ternha-firewall; do
+for unit in ternhad ternha-firewall ternha-metrics; do
     systemd-analyze security --offline=true --threshold=40 --no-pager "$root/lib/systemd/system/$unit.service" |
         tail -n 1
 done

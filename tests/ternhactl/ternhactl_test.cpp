@@ -445,6 +445,12 @@ TEST_F(TernhactlTest, CompletesCommandsAndTheirOptions) {
     EXPECT_EQ(completionOf("ternhactl status --"), "--json --watch --socket --timeout --help\n");
     EXPECT_EQ(completionOf("ternhactl --timeout 3 reboot-peer --y"), "--yes\n");
     EXPECT_EQ(completionOf("ternhactl metrics --y"), "\n");
+    EXPECT_EQ(completionOf("ternhactl metrics --o"), "--output\n");
+    EXPECT_EQ(completionOf("ternhactl check --s"), "--self --socket\n");
+    std::istringstream offered(completionOf("ternhactl wait ''"));
+    for (std::string condition; offered >> condition;) {
+        EXPECT_THAT(shell("ternhactl wait " + condition).output, HasSubstr("No such file")) << condition;
+    }
 }
 
 }  // namespace
