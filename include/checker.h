@@ -125,7 +125,8 @@ class GetRemoteHostname : public EnvCheck {
 bool isDRBDConnect();
 
 /// Return true when the sync_action of any md array is exactly "resync"; recover, check and the others do not
-/// count. Logs "Failed to set globBuf from /sys/block/md*" and returns false when there is no md array.
+/// count. Logs "Failed to set globBuf from /sys/block/md*" and returns false when there is no md array. An
+/// array without that file logs the line of isSysfsValue and is skipped.
 bool isMDResync();
 
 /// Find the disks on ATA ports under error handling.
@@ -134,7 +135,8 @@ bool isMDResync();
 ///               ata2); unchanged when there are no ATA ports
 /// @return true when there is at least one such disk. Logs "Failed to set globBuf from
 ///         /sys/class/ata_port/ata*" when there are no ATA ports, and "Failed to get dev name by ata path: "
-///         and the path for a port whose disk has no name; such a port does not count.
+///         and the path for a port whose disk has no name, and the line of isSysfsValue for one without
+///         the attribute error_handling; such ports do not count.
 bool isDiskErrHandling(Json::Value& disks);
 
 /// Store the device name (1 to 7 characters) of the disk on the ATA port `path` (a path or a bare port name)
@@ -166,7 +168,8 @@ class CommandPipe {
 };
 
 /// Return the average round trip to remoteIP("") in milliseconds, measured by /bin/ping with three requests.
-/// Returns 0 when ping could not be started or printed no average; the log then has the reason. Blocks for
+/// Returns 0 when ping could not be started or printed no average; the log has the reason unless ping
+/// exited with code 0. Blocks for
 /// about 0.4 seconds and the round trips, for 10 seconds when the peer does not reply. Thread-safe.
 float heartbeatLatency();
 
@@ -196,7 +199,8 @@ class InterfaceChecker {
 };
 
 // Diagnostic recording: each call appends one entry to the record log, whose text begins on the line after
-// the time stamp. A failure goes to the daemon log and leaves no entry. Thread-safe.
+// the time stamp. A program that cannot be started and a file that cannot be opened leave a line in the
+// daemon log and no entry. Thread-safe.
 
 /// Record the status as compact JSON. Blocks for the locks of the record.
 void recordStatus(Status& status);

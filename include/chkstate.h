@@ -33,12 +33,14 @@ class HASocketComm {
     HASocketComm(const HASocketComm&) = delete;
     HASocketComm& operator=(const HASocketComm&) = delete;
 
-    /// Return true when the construction failed; errno has the reason right after it. Send and Recv on such
-    /// an object return -1.
+    /// Return true when the construction failed; errno has the reason right after it. Do not call Send and
+    /// Recv then: without a socket they return -1, with one that could not be set up Recv may block.
     bool HasError();
 
     /// Send `data` as one datagram, without a terminating zero. A client sends to its peer; a server sends to
-    /// the sender of the datagram that it received last, and to its own address before the first one.
+    /// the sender of the datagram that it received last, to its own address before the first Recv, and
+    /// nowhere
+    /// (-1) after a Recv that failed.
     ///
     /// @return the number of bytes sent, -1 on failure. Never waits for the peer.
     int Send(const std::string& data);

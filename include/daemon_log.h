@@ -24,7 +24,8 @@ namespace TERN::HA::Daemon {
 ///
 /// Thread-safe. Operations on one object are serialised by its mutex, for which each waits up to 60 seconds
 /// and then proceeds without the lock: a stuck holder delays logging but never stops it. Several objects and
-/// processes may share the same files, because a line is one append.
+/// processes may call set for the same files, because a line is one append. Call writeLogToDisk and rotate
+/// for the same files from one place at a time: overlapping moves lose or duplicate lines.
 class DaemonLog {
  public:
     /// Construct a log whose persistent file is `directory` + `fileName` and whose buffer file is "/tmp/ha" +
@@ -48,9 +49,9 @@ class DaemonLog {
     void writeLogToDisk();
 
     /// Compress the persistent log and every uncompressed archive with /bin/xz, then move each archive
-    /// (".N.xz") one number up and the log to ".0.xz". Archive 39 is lost; a missing archive leaves a gap
-    /// that moves up as well. The persistent log does not exist until the next writeLogToDisk. Results of
-    /// compression and renaming are ignored. Blocks for up to 41 runs of /bin/xz.
+    /// (".N.xz") one number up and the log to ".0.xz". Archive 38 replaces archive 39; a missing
+    /// archive leaves a gap that moves up as well. The persistent log does not exist until the next
+    /// writeLogToDisk. Results of compression and renaming are ignored. Blocks for up to 41 runs of /bin/xz.
     void rotate();
 
     /// Return the size of the persistent log in bytes, 0 when it is missing or inaccessible. Does not lock.

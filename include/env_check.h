@@ -48,8 +48,8 @@ class EnvCheck {
     ///
     /// @param reply  receives the reply, 0 to 63 bytes; unchanged on failure
     /// @return true when a datagram arrived within 3 seconds, an empty one included; false on time-out and
-    ///         on any error. Logs "Failed to start socket client" when no socket could be opened, and
-    ///         nothing for other failures.
+    ///         on any error. Logs "Failed to start socket client" when no socket could be opened or set up,
+    ///         and nothing for other failures.
     ///
     /// One attempt, no retransmission. Blocks for up to 3 seconds, less when a signal interrupts it.
     bool _sendToRemote(std::string& reply);
@@ -94,9 +94,9 @@ class SocketServer {
     /// Requests that arrive between two calls queue up in the socket.
     ///
     /// @param status  the record that the reply is computed from
-    /// @return true, whether or not a request arrived; false when the server socket could not be opened or
-    ///         bound. Every later call then fails at once, too, and logs "Failed to start socket server"
-    ///         directly followed by the system's error text. A reply that cannot be sent is logged as
+    /// @return true, whether or not a request arrived; false when the server socket could not be opened,
+    ///         set up or bound. Every later call then fails at once, too, and logs "Failed to start socket
+    ///         server" directly followed by the system's error text. A reply that cannot be sent is logged as
     ///         "Failed to sendto". A request for which there is no memory gets no reply.
     ///
     /// A request that is not a registered type name ends the process with SIGABRT and gets no reply: only the

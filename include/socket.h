@@ -20,8 +20,8 @@ namespace TERN::HA::Daemon {
 ///
 /// Operations report failure by their result and log it to the system log at LOG_ERR, under the identity and
 /// facility that the host chose with openlog. None throws; running out of memory is a failure like others.
-/// The error flag is sticky: after a failure to open, bind, listen or exchange, the object refuses every
-/// further call.
+/// The error flag is sticky: after a failure to open, bind or listen, or of clientSend, the object refuses
+/// every further serverListen and clientSend.
 ///
 /// Not thread-safe: use an object from one thread at a time. The destructor is not virtual: destroy an object
 /// through its own type.
@@ -42,7 +42,7 @@ class DaemonLocalSocket {
     /// Return the error flag: true after a failure from which this object does not recover.
     bool hasError();
 
-    /// Server: remove a stale socket file, bind the path and listen with a backlog of 100. The file's mode
+    /// Server: remove whatever file is at the path, bind it and listen with a backlog of 100. The file's mode
     /// follows the process's umask. Returns true on success. Does not block.
     bool serverBind();
 

@@ -74,13 +74,13 @@ ssize_t sendText(int fd, const std::string& text) {
     return sent;
 }
 
-bool refuse() {
-    syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
+bool serverOutOfMemory(const char* request) {
+    syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__, request);
     return false;
 }
 
-bool failToHandle(const char* text) {
-    syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__, text);
+bool clientOutOfMemory() {
+    syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
     return false;
 }
 
@@ -128,7 +128,8 @@ bool DaemonLocalSocket::serverBind() {
 
 bool DaemonLocalSocket::serverListen() {
     if (_hasError) {
-        return refuse();
+        syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
+        return false;
     }
     const int fd = accept4(_fd, nullptr, nullptr, SOCK_CLOEXEC);
     if (fd == -1) {
@@ -153,7 +154,8 @@ bool DaemonLocalSocket::_serverListen(int fd) try {
     }
     Json::Value reply;
     if (!serverHandle(request, reply)) {
-        return failToHandle(text);
+        syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__, text);
+        return false;
     }
     const std::string replyText = jsonText(reply);
     if (sendText(fd, replyText) == -1) {
@@ -163,9 +165,9 @@ bool DaemonLocalSocket::_serverListen(int fd) try {
     }
     return true;
 } catch (const std::bad_alloc&) {
-    return failToHandle(static_cast<const char*>(_buffer));
+    return serverOutOfMemory(static_cast<const char*>(_buffer));
 } catch (const JsonOutOfMemory&) {
-    return failToHandle(static_cast<const char*>(_buffer));
+    return serverOutOfMemory(static_cast<const char*>(_buffer));
 }
 
 bool DaemonLocalSocket::_clientConnect() {
@@ -193,7 +195,8 @@ bool DaemonLocalSocket::_clientConnect() {
 
 bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& reply) try {
     if (_hasError) {
-        return refuse();
+        syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
+        return false;
     }
     if (!_clientConnect()) {
         syslog(LOG_ERR, "%s:%d Failed to connect socket server: %m", __FILE_NAME__, __LINE__);
@@ -221,10 +224,10 @@ bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& repl
     return true;
 } catch (const std::bad_alloc&) {
     _hasError = true;
-    return refuse();
+    return clientOutOfMemory();
 } catch (const JsonOutOfMemory&) {
     _hasError = true;
-    return refuse();
+    return clientOutOfMemory();
 }
 
 }  // namespace TERN::HA::Daemon
