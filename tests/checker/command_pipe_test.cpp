@@ -64,7 +64,7 @@ class EndTest : public CommandPipeTest, public ::testing::WithParamInterface<End
 TEST_P(EndTest, IsReportedAsTheRawWaitStatus) {
     test::createProgram("/opt/program", GetParam().script);
     const char* const argv[] = {"/opt/program", nullptr};
-    { const CommandPipe pipe(argv); }
+    CommandPipe{argv};
     EXPECT_THAT(
         test::daemonLogMessages(),
         ElementsAre(test::LogLine(

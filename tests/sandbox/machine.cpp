@@ -23,7 +23,7 @@ constexpr const char* kWatchedPaths[] = {"/tmp/ha",
 constexpr unsigned long kPeerPort = 7499;
 
 void addFile(const std::string& path, MachineState& state) {
-    struct stat status {};
+    struct stat status = {};
     if (lstat(path.c_str(), &status) != 0) {
         return;
     }

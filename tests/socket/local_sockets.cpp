@@ -43,7 +43,7 @@ ServingThread::ServingThread(TERN::HA::Daemon::DaemonLocalSocket& server, std::s
 
 ServingThread::~ServingThread() {
     _isStopping = true;
-    { const RawClient last(_path); }
+    RawClient{_path};
     _thread.join();
 }
 

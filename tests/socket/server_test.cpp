@@ -197,7 +197,7 @@ TEST_F(ServerSocketTest, AnEarlierRequestLeavesNothingBehind) {
 TEST_F(ServerSocketTest, AnEmptyConnectionFailsToParse) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
-    { const test::RawClient client; }
+    test::RawClient{};
     EXPECT_FALSE(server.serverListen());
     EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to parse , ")));
     EXPECT_FALSE(server.hasError());

@@ -13,14 +13,14 @@ namespace {
 constexpr int kOutsideExit = 99;
 
 bool sharesMountsWithInit() {
-    struct stat own {};
-    struct stat init {};
+    struct stat own = {};
+    struct stat init = {};
     return stat("/proc/self/ns/mnt", &own) == 0 && stat("/proc/1/ns/mnt", &init) == 0 &&
            own.st_dev == init.st_dev && own.st_ino == init.st_ino;
 }
 
 bool isRootTmpfs() {
-    struct statfs root {};
+    struct statfs root = {};
     return statfs("/", &root) == 0 && root.f_type == TMPFS_MAGIC;
 }
 

@@ -16,7 +16,7 @@ namespace {
 class RootTest : public SandboxTest {};
 
 mode_t modeOf(const std::string& path) {
-    struct stat status {};
+    struct stat status = {};
     EXPECT_EQ(stat(path.c_str(), &status), 0) << path;
     return status.st_mode & 07777U;
 }
@@ -54,7 +54,7 @@ TEST_F(RootTest, ProcIsWritable) {
 
 TEST_F(RootTest, TheSystemRequestTriggerIsAPlainFile) {
     EXPECT_EQ(readFile("/proc/sysrq-trigger"), "");
-    struct stat status {};
+    struct stat status = {};
     ASSERT_EQ(lstat("/proc/sysrq-trigger", &status), 0);
     EXPECT_TRUE(S_ISREG(status.st_mode));
     writeFile("/proc/sysrq-trigger", "b");

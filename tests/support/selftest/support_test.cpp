@@ -39,7 +39,7 @@ TEST_F(SupportTest, WritesReadsAndRemovesFiles) {
 
 TEST_F(SupportTest, MakesTheDirectoriesOfTheLog) {
     for (const char* directory : {"/tmp/ha", "/var/log/ha"}) {
-        struct stat status {};
+        struct stat status = {};
         ASSERT_EQ(stat(directory, &status), 0) << directory;
         EXPECT_EQ(status.st_mode & 07777U, 0700U) << directory;
     }
