@@ -75,10 +75,11 @@ ExitCode events(const Settings& settings) {
             continue;
         }
         if (settings.json != Settings::Json::None) {
-            std::cout << Json::writeString(compact, *event) << std::endl;
+            std::cout << Json::writeString(compact, *event) << '\n' << std::flush;
         } else {
             std::cout << when(*event) << ' ' << text(*event, "new") << " (was " << text(*event, "old") << ')'
-                      << std::endl;
+                      << '\n'
+                      << std::flush;
         }
     }
     return ExitCode::Success;

@@ -81,7 +81,7 @@ ExitCode unknown(const std::string& reason) {
     for (char& c : line) {
         c = c == '|' ? '/' : c;  // performance data would begin there
     }
-    std::cout << "TERNHA UNKNOWN - " << line << std::endl;
+    std::cout << "TERNHA UNKNOWN - " << line << '\n' << std::flush;
     return ExitCode::NoAnswer;
 }
 

@@ -129,9 +129,11 @@ std::optional<std::string> textOf(const std::string& path) {
     }
     std::string text;
     std::string block(4096, '\0');
-    while (const std::size_t size = std::fread(block.data(), 1, block.size(), file.get())) {
+    std::size_t size = 0;
+    do {
+        size = std::fread(block.data(), 1, block.size(), file.get());
         text.append(block, 0, size);
-    }
+    } while (size == block.size());
     return std::ferror(file.get()) == 0 ? std::optional(text) : std::nullopt;
 }
 

@@ -130,7 +130,7 @@ std::string DaemonLog::_formatedTime() const {
         std::array<char, 64> zone = {};
         std::array<char, 32> text = {};
     };
-    thread_local Stamp last;
+    static thread_local Stamp last;
 
     const std::time_t now = std::time(nullptr);
     const char* variable = std::getenv("TZ");
@@ -140,7 +140,7 @@ std::string DaemonLog::_formatedTime() const {
     }
     std::tm local = {};
     tzset();  // localtime_r need not notice that the zone was changed
-    localtime_r(&now, &local);
+    (void)localtime_r(&now, &local);
 
     std::array<char, 20> dateTime = {};
     std::array<char, 8> zone = {};

@@ -15,7 +15,7 @@ using Lock = std::unique_lock<std::timed_mutex>;
 // The lock may not be owned; callers proceed anyway. The wait is on the monotonic clock: a deadline on the
 // wall clock would move when that is set, by any amount when it is set back during the wait.
 Lock lockFor(std::timed_mutex& mutex, std::int32_t timeout) {
-    return Lock(mutex, std::chrono::steady_clock::now() + std::chrono::seconds(timeout));
+    return {mutex, std::chrono::steady_clock::now() + std::chrono::seconds(timeout)};
 }
 
 Json::Value toArray(const std::set<std::string>& names) {
