@@ -16,7 +16,7 @@ set(CPACK_SET_DESTDIR ON) # /etc and /lib are outside of the prefix
 set(CPACK_INSTALL_DEFAULT_DIRECTORY_PERMISSIONS
     OWNER_READ OWNER_WRITE OWNER_EXECUTE GROUP_READ GROUP_EXECUTE WORLD_READ WORLD_EXECUTE)
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
-set(CPACK_DEBIAN_PACKAGE_RELEASE 1)
+set(CPACK_DEBIAN_PACKAGE_RELEASE 1${TERNHA_RELEASE_SUFFIX})
 set(CPACK_DEBIAN_PACKAGE_SECTION libs)
 set(CPACK_DEBIAN_PACKAGE_CONTROL_STRICT_PERMISSION ON)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
@@ -70,6 +70,12 @@ set(CPACK_DEBIAN_DAEMON_PACKAGE_CONTROL_EXTRA
     ${CMAKE_CURRENT_BINARY_DIR}/conffiles ${CMAKE_CURRENT_SOURCE_DIR}/debian/postinst
     ${CMAKE_CURRENT_SOURCE_DIR}/debian/prerm ${CMAKE_CURRENT_SOURCE_DIR}/debian/postrm)
 
+# Its latest entry is of this version and for this release.
+file(READ debian/changelog changelog)
+string(REGEX REPLACE "^([a-z]+) [(]([^)]*)[)] unstable;" "\\1 (\\2${TERNHA_RELEASE_SUFFIX}) ${TERNHA_RELEASE_NAME};"
+                     changelog "${changelog}")
+file(CONFIGURE OUTPUT changelog CONTENT "${changelog}" @ONLY)
+
 foreach(component ${CPACK_COMPONENTS_ALL})
   set(package ${${component}_package})
   string(TOUPPER ${component} upper)
@@ -80,7 +86,7 @@ foreach(component ${CPACK_COMPONENTS_ALL})
       FILES debian/copyright
       DESTINATION ${documentation}
       COMPONENT ${component})
-    ternha_install_compressed(${CMAKE_CURRENT_SOURCE_DIR}/debian/changelog changelog.Debian ${documentation}
+    ternha_install_compressed(${CMAKE_CURRENT_BINARY_DIR}/changelog changelog.Debian ${documentation}
                               ${component})
     install(
       FILES debian/${package}.lintian-overrides

@@ -16,13 +16,13 @@ depends() { # PACKAGE DEPENDENCY...: whatever the version
 
 directory=$1 architecture=$2
 depends libterncore6 libc6
-depends libternhadaemon6 libterncore6 libc6 'libstdc\+\+6' libjsoncpp25 iputils-ping net-tools procps xz-utils
+depends libternhadaemon6 libterncore6 libc6 'libstdc\+\+6' 'libjsoncpp[0-9]+' iputils-ping net-tools procps xz-utils
 # The service manager's library: readiness and watchdog on every architecture.
-depends ternhad libternhadaemon6 libc6 'libstdc\+\+6' libjsoncpp25 libsystemd0
+depends ternhad libternhadaemon6 libc6 'libstdc\+\+6' 'libjsoncpp[0-9]+' libsystemd0
 depends libternhadaemon-dev libternhadaemon6 libjsoncpp-dev
 
 unit=$(dpkg-deb --fsys-tarfile "$directory"/ternhad_*_"$architecture".deb |
-    tar --extract --to-stdout ./lib/systemd/system/ternhad.service)
+    tar --extract --to-stdout --wildcards '*/systemd/system/ternhad.service')
 for line in Type=notify WatchdogSec=; do
     grep -q "^$line" <<<"$unit" || fail "ternhad.service has no $line"
 done

@@ -4,13 +4,15 @@
 set -euo pipefail
 [ -e /.ternha-sandbox ] || { echo "check_units.sh: not in a sandbox" >&2; exit 99; }
 
+# With /bin and /lib in /usr, as on every system: units may be under either name.
 root=/tmp/root
+mkdir -p "$root"/usr/{bin,lib}
+ln -s usr/bin usr/lib "$root"
 for package in "$1"/*_"$2".deb; do
     dpkg -x "$package" "$root"
 done
 
 # Only what the units name of the rest of the system has to be there.
-mkdir -p "$root/bin" "$root/lib/systemd/system"
 cp -L /bin/kill "$root/bin/"
 cp /lib/systemd/system/{basic,sysinit,network,network-pre,local-fs,local-fs-pre,shutdown,umount,paths,sockets,slices,timers,swap}.target \
     "$root/lib/systemd/system/"
