@@ -51,12 +51,14 @@ struct Report {
     Figure nonOkRate;                // 0 to 1
 };
 
+using FlagMember = Report::Flag Report::*;
+
 // A flag of the report, and what it is called: in events and metrics, and when it is set or clear.
 struct FlagName {
     const char* name;
     const char* set;
     const char* clear;
-    Report::Flag Report::*flag;
+    FlagMember flag;
 };
 const std::vector<FlagName>& flagNames();
 

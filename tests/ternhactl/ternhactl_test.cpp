@@ -221,7 +221,7 @@ TEST_F(TernhactlTest, TellsWhyTheDaemonDoesNotAnswer) {
     EXPECT_EQ(reason("ternhactl --socket /etc/hosts/x disks"), "Not a directory\n");
     EXPECT_EQ(reason("ternhactl --socket /" + std::string(107, 'x') + " disks"),
               "longer than 107 characters\n");
-    { const RawServer gone; }
+    RawServer{};
     EXPECT_EQ(reason("ternhactl disks"), "Connection refused\n");
     test::makeDirectories("/run/private");
     ASSERT_EQ(chmod("/run/private", 0), 0);
