@@ -1,70 +1,211 @@
 #include "control_server.h"
 
+#include <json/json.h>
 #include <poll.h>
 #include <sys/socket.h>
-#include <sys/time.h>
+#include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
-#include <cstring>
+#include <memory>
+#include <utility>
 
-#include "ha_log.h"
+#include "passes.h"
 
 namespace ternhad {
 
 namespace {
 
 constexpr unsigned int CLIENT_TIMEOUT = 0;  // a client's; this end does not use it
-constexpr timeval SILENCE_LIMIT = {5, 0};
+constexpr auto SILENCE_LIMIT = std::chrono::seconds(5);
+constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the socket file
+constexpr std::size_t MOST_CLIENTS = 16;
 constexpr int BACKLOG = 100;
-constexpr int PAUSE = 1000;  // milliseconds
+constexpr std::size_t REQUEST_SIZE = 2096;
+constexpr char RESTORING[] = "make the vanished control socket again";
+constexpr char ACCEPTING[] = "accept control clients";
+// No JSON: a client that only looks for a reply takes it for a failure.
+constexpr char REFUSAL[] = "refused: an earlier order to reboot the peer is still being carried out";
 
-// Closes a client's connection, whatever serving it ended by.
-class Connection {
- public:
-    explicit Connection(int fd) : _fd(fd) {}
-    ~Connection() { close(_fd); }
+sockaddr_un addressOf(const std::string& path) {
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    path.copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
+    return address;
+}
 
-    Connection(const Connection&) = delete;
-    Connection& operator=(const Connection&) = delete;
-
- private:
-    int _fd;
-};
+// True when the request that has come to `fd`, which stays there to be served, orders a reboot.
+bool isOrder(int fd) {
+    std::array<char, REQUEST_SIZE> text;
+    const ssize_t size = recv(fd, text.data(), text.size(), MSG_PEEK);
+    Json::Value request;
+    std::string errors;
+    const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
+    return size > 0 && reader->parse(text.data(), text.data() + size, &request, &errors) &&
+           request.isObject() && request["act"].isString() && request["act"].asString()[0] == 'R';
+}
 
 }  // namespace
 
-ControlServer::ControlServer(const std::string& path) : MonitordSocket(path, CLIENT_TIMEOUT), _path(path) {}
+ControlServer::ControlServer(const std::string& path, Health& health, Events& events,
+                             const Shutdown& shutdown, Progress& progress)
+    : _path(path),
+      _events(events),
+      _shutdown(shutdown),
+      _progress(progress),
+      _requests(path, CLIENT_TIMEOUT),
+      _orders(path, CLIENT_TIMEOUT) {
+    _requests.setStatus(&health.status());
+    _orders.setStatus(&health.status());
+    _clients.reserve(MOST_CLIENTS);
+}
 
 ControlServer::~ControlServer() {
+    close();
+    for (const Client& client : _clients) {
+        ::close(client.fd);
+    }
+}
+
+void ControlServer::close() {
     if (_listener >= 0) {
-        close(_listener);
+        ::close(_listener);
+        _listener = -1;
     }
 }
 
 bool ControlServer::listen() {
-    _listener = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_un address = {};
-    address.sun_family = AF_UNIX;
-    _path.copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
-    unlink(_path.c_str());  // left by a daemon that has gone
-    return _listener >= 0 && bind(_listener, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0 &&
-           ::listen(_listener, BACKLOG) == 0;
+    close();
+    struct stat info = {};
+    if (lstat(_path.c_str(), &info) == 0) {
+        if (!S_ISSOCK(info.st_mode)) {
+            errno = EEXIST;
+            return false;
+        }
+        unlink(_path.c_str());
+    }
+    _listener = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    const sockaddr_un address = addressOf(_path);
+    if (_listener < 0 || bind(_listener, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
+        ::listen(_listener, BACKLOG) != 0 || lstat(_path.c_str(), &info) != 0) {
+        return false;
+    }
+    _device = info.st_dev;
+    _inode = info.st_ino;
+    return true;
 }
 
-void ControlServer::serve() {
-    const int client = accept4(_listener, nullptr, nullptr, SOCK_CLOEXEC);
-    if (client < 0) {
-        if (errno != EINTR) {
-            HA_LOG(std::string("Failed to accept a client: ") + std::strerror(errno));
-            poll(nullptr, 0, PAUSE);  // what is missing now is missing at once again
-        }
+bool ControlServer::hasFile() const {
+    struct stat info = {};
+    return lstat(_path.c_str(), &info) == 0 && info.st_dev == _device && info.st_ino == _inode;
+}
+
+void ControlServer::removeFile() const {
+    if (hasFile()) {
+        unlink(_path.c_str());
+    }
+}
+
+void ControlServer::restoreFile() {
+    if (hasFile()) {
         return;
     }
-    const Connection connection(client);
-    setsockopt(client, SOL_SOCKET, SO_RCVTIMEO, &SILENCE_LIMIT, sizeof SILENCE_LIMIT);
-    _serverListen(client);
+    if (listen()) {
+        TERNHAD_LOG(_events, "The control socket had vanished, it is there again");
+        _isFileLost = false;
+    } else if (!_isFileLost) {
+        _events.troubleBegan(RESTORING, errno);
+        _isFileLost = true;
+    }
+}
+
+void ControlServer::run() {
+    Passes passes;
+    while (!_shutdown.isRequested()) {
+        passes.run([this] {
+            restoreFile();
+            wait();
+            const auto isDone = [this](const Client& client) { return serve(client); };
+            _clients.erase(std::remove_if(_clients.begin(), _clients.end(), isDone), _clients.end());
+            acceptClients();
+        });
+        _progress.made(Progress::controlServer);
+    }
+}
+
+void ControlServer::wait() const {
+    std::array<pollfd, MOST_CLIENTS + 2> waits;
+    std::size_t count = 0;
+    auto end = Clock::now() + ROUND;
+    waits.at(count++) = {_shutdown.event().fd(), POLLIN, 0};
+    for (const Client& client : _clients) {
+        waits.at(count++) = {client.fd, POLLIN, 0};
+        end = std::min(end, client.deadline);
+    }
+    if (_clients.size() < MOST_CLIENTS && !_isFull) {
+        waits.at(count++) = {_listener, POLLIN, 0};
+    }
+    const timespec rest = timeUntil(end);
+    ppoll(waits.data(), count, &rest, nullptr);
+}
+
+void ControlServer::acceptClients() {
+    const bool wasFull = std::exchange(_isFull, false);
+    while (_clients.size() < MOST_CLIENTS) {
+        const int fd = accept4(_listener, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
+        if (fd < 0) {
+            if (errno != EAGAIN && errno != EINTR && errno != ECONNABORTED) {
+                _isFull = true;  // back off for a round: the lack would recur immediately
+                if (!wasFull) {
+                    _events.troubleBegan(ACCEPTING, errno);
+                }
+            } else if (wasFull) {
+                _events.troubleEnded(ACCEPTING);
+            }
+            return;
+        }
+        _clients.push_back({fd, Clock::now() + SILENCE_LIMIT});
+    }
+}
+
+// Serves the client if its request has come. False while it is waited for.
+bool ControlServer::serve(const Client& client) {
+    pollfd state = {client.fd, POLLIN, 0};
+    if (poll(&state, 1, 0) == 0 && Clock::now() < client.deadline) {
+        return false;
+    }
+    if (state.revents != 0) {
+        if (isOrder(client.fd)) {
+            order(client.fd);
+            return true;
+        }
+        _requests.serve(client.fd);
+    }
+    ::close(client.fd);
+    return true;
+}
+
+void ControlServer::order(int fd) {
+    int nobody = -1;
+    if (_orderer.compare_exchange_strong(nobody, fd)) {
+        _ordered.set();
+        return;
+    }
+    send(fd, REFUSAL, sizeof REFUSAL - 1, MSG_NOSIGNAL);
+    ::close(fd);
+}
+
+void ControlServer::runOrders() {
+    Passes passes;
+    while (_shutdown.sleepUntil(Clock::now() + std::chrono::hours(24), {&_ordered})) {
+        if (_ordered.take()) {
+            passes.run([this] { _orders.serve(_orderer); });
+            ::close(_orderer.exchange(-1));
+        }
+    }
 }
 
 }  // namespace ternhad

@@ -1,19 +1,55 @@
 #include <sys/stat.h>
 #include <syslog.h>
 
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <iostream>
+#include <string_view>
+
+#include "daemon.h"
 #include "directories.h"
-#include "host.h"
+#include "instance.h"
+#include "log_keeper.h"
 #include "options.h"
 
-int main(int argc, char** argv) {
+namespace {
+
+constexpr int FAILURE = 1;
+constexpr int ALREADY_RUNNING = 3;
+
+int run(const ternhad::Options& options) {
+    ternhad::InstanceLock lock;
+    switch (lock.take()) {
+        case ternhad::InstanceLock::Result::taken:
+            break;
+        case ternhad::InstanceLock::Result::isRunning:
+            std::cerr << "ternhad: already running as process " << lock.owner() << '\n';
+            return ALREADY_RUNNING;
+        case ternhad::InstanceLock::Result::failed:
+            std::cerr << "ternhad: cannot take the lock in /run/ternha: " << std::strerror(errno) << '\n';
+            return FAILURE;
+    }
+    if (!ternhad::prepareDirectories(options.socket.c_str())) {
+        return FAILURE;
+    }
+    return ternhad::Daemon(options, lock).run();
+}
+
+}  // namespace
+
+int main(int argc, char** argv) try {
+    umask(S_IRWXG | S_IRWXO);  // logs and control socket are for this user alone
+    if (argc == 3 && std::string_view(argv[1]) == ternhad::LOG_KEEPER) {
+        return ternhad::keepLogs(std::strtoll(argv[2], nullptr, 10));
+    }
     ternhad::Options options;
     if (const auto exitCode = ternhad::parseOptions(argc, argv, options)) {
         return *exitCode;
     }
-    umask(S_IRWXG | S_IRWXO);  // logs and control socket are for this user alone
     openlog("ternhad", LOG_PID, LOG_DAEMON);
-    if (!ternhad::prepareDirectories(options.socket.c_str())) {
-        return 1;
-    }
-    return ternhad::Host(options).run();
+    return run(options);
+} catch (const std::exception& error) {
+    std::cerr << "ternhad: " << error.what() << '\n';
+    return FAILURE;
 }

@@ -11,6 +11,7 @@ namespace ternhad {
 namespace {
 
 constexpr int WRONG_USAGE = 2;
+constexpr double DAY = 86400;
 
 // As the library reads it: text that is no address to it, such as 010.0.0.1, would count as 0.0.0.0.
 std::string checkAddress(const std::string& text) {
@@ -36,12 +37,19 @@ std::string checkInterfaceName(const std::string& name) {
     return {};
 }
 
-void addInterval(CLI::App& app, const std::string& name, Seconds& value, const std::string& description) {
+// Not by CLI::Range, to which "nan" is in every range.
+void addInterval(CLI::App& app, const std::string& name, Seconds& value, double least, double most,
+                 const std::string& description) {
+    const std::string range = "from " + CLI::detail::to_string(least) + " to " + CLI::detail::to_string(most);
     app.add_option_function<double>(
-           name, [&value](double seconds) { value = Seconds(seconds); },
-           description + ", seconds from 0.1 to 86400 (default " + CLI::detail::to_string(value.count()) +
-               ")")
-        ->check(CLI::Range(0.1, 86400.0))
+           name,
+           [&value, name, range, least, most](double seconds) {
+               if (!(seconds >= least && seconds <= most)) {
+                   throw CLI::ValidationError(name, "not in the range " + range);
+               }
+               value = Seconds(seconds);
+           },
+           description + ", seconds " + range + " (default " + CLI::detail::to_string(value.count()) + ")")
         ->type_name("SECONDS");
 }
 
@@ -73,12 +81,15 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
     app.add_option("--socket", options.socket, "The control socket (default " + options.socket + ")")
         ->check(checkSocketPath)
         ->type_name("PATH");
-    addInterval(app, "--check-interval", options.checkInterval,
-                "Between two rounds of local and peer checks");
-    addInterval(app, "--heartbeat-interval", options.heartbeatInterval,
+    addInterval(app, "--check-interval", options.checkInterval, 0.05, DAY,
+                "Between two liveness probes, and between two rounds of local and peer checks");
+    addInterval(app, "--dead-after", options.deadAfter, 0.2, 60,
+                "Without proof of life after which the peer is dead");
+    addInterval(app, "--heartbeat-interval", options.heartbeatInterval, 0.1, DAY,
                 "Between two measurements of the link's latency and the interface's packet rate");
-    addInterval(app, "--log-interval", options.logInterval, "Between two moves of the logs to disk");
-    addInterval(app, "--snapshot-interval", options.snapshotInterval,
+    addInterval(app, "--log-interval", options.logInterval, 0.1, DAY,
+                "Between two moves of the logs to disk");
+    addInterval(app, "--snapshot-interval", options.snapshotInterval, 0.1, DAY,
                 "Between two recordings of status, processes, file systems and memory");
     app.add_option(
            "--rotate-size", options.rotateSize,
@@ -90,6 +101,9 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
         app.parse(argc, argv);
         if (options.localIp == options.remoteIp) {
             throw CLI::ValidationError("--remote-ip", "the same address as --local-ip");
+        }
+        if (options.checkInterval * 3 > options.deadAfter) {
+            throw CLI::ValidationError("--check-interval", "above a third of --dead-after");
         }
     } catch (const CLI::ParseError& error) {
         return app.exit(error) == 0 ? 0 : WRONG_USAGE;

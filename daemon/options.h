@@ -14,7 +14,8 @@ struct Options {
     std::string remoteIp;   // the peer's
     std::string interface;  // the network interface of that link
     std::string socket = "/run/ternha/control.sock";
-    Seconds checkInterval = Seconds(1);        // local and peer checks
+    Seconds checkInterval = Seconds(1);        // probes while replies come; local and peer checks
+    Seconds deadAfter = Seconds(3);            // without proof of life the peer is dead
     Seconds heartbeatInterval = Seconds(10);   // latency and the interface's rate
     Seconds logInterval = Seconds(10);         // buffered lines to disk
     Seconds snapshotInterval = Seconds(3600);  // recording of status, processes, file systems and memory

@@ -26,11 +26,11 @@ class ExhaustedMemoryTest : public ::testing::Test {
 
     bool bothSee(bool alive) { return a.sees("isRemoteAlive", alive) && b.sees("isRemoteAlive", alive); }
 
-    // Steps of the first node's daemon that were given up.
-    int givenUp() const {
+    // Failed steps of the first node's daemon.
+    int failedSteps() const {
         int count = 0;
         const std::string said = a.daemon->error();
-        for (std::size_t at = 0; (at = said.find("a step was given up", at)) != std::string::npos; ++at) {
+        for (std::size_t at = 0; (at = said.find("a step failed", at)) != std::string::npos; ++at) {
             ++count;
         }
         return count;
@@ -42,7 +42,7 @@ class ExhaustedMemoryTest : public ::testing::Test {
 
 TEST_F(ExhaustedMemoryTest, ThatComesBackHasEndedNothing) {
     a.write("/tmp/no-memory", "");
-    EXPECT_TRUE(test::eventually(20s, [this] { return givenUp() > 20; })) << a.daemon->error();
+    EXPECT_TRUE(test::eventually(20s, [this] { return failedSteps() > 20; })) << a.daemon->error();
     test::removeTree(a.node.path("/tmp/no-memory"));
 
     a.write("/sys/block/md0/md/sync_action", "resync\n");

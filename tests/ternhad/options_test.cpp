@@ -72,7 +72,12 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{"RelativeSocket", plus({"--socket", "control.sock"}), "--socket: not an absolute path"},
         WrongUsage{"LongSocket", plus({"--socket", "/" + std::string(107, 'x')}),
                    "--socket: longer than 107 characters"},
-        WrongUsage{"NoInterval", plus({"--check-interval", "0"}), "--check-interval: "},
+        WrongUsage{"NoInterval", plus({"--check-interval", "0"}), "--check-interval: not in the range"},
+        WrongUsage{"IntervalThatIsNoNumber", plus({"--check-interval", "nan"}), "--check-interval: not in"},
+        WrongUsage{"InfiniteInterval", plus({"--log-interval", "inf"}), "--log-interval: not in the range"},
+        WrongUsage{"ShortDeadAfter", plus({"--dead-after", "0.1"}), "--dead-after: not in the range"},
+        WrongUsage{"IntervalAboveAThirdOfDeadAfter", plus({"--check-interval", "1.1"}),
+                   "--check-interval: above a third of --dead-after"},
         WrongUsage{"WordForInterval", plus({"--log-interval", "often"}), "--log-interval"},
         WrongUsage{"SmallRotateSize", plus({"--rotate-size", "1"}), "--rotate-size: "},
         WrongUsage{"Unknown", plus({"--frobnicate"}), "--frobnicate"},
@@ -91,9 +96,9 @@ TEST_F(OptionsTest, AnUnknownKeyInTheConfigurationIsAnError) {
 TEST_F(OptionsTest, HelpAndVersionAreNoErrors) {
     const auto help = ternhad({"--help"});
     EXPECT_EQ(help.exitCode, 0);
-    for (const char* option :
-         {"--local-ip", "--remote-ip", "--interface", "--socket", "--check-interval", "--heartbeat-interval",
-          "--log-interval", "--snapshot-interval", "--rotate-size", "--config", "--version"}) {
+    for (const char* option : {"--local-ip", "--remote-ip", "--interface", "--socket", "--check-interval",
+                               "--dead-after", "--heartbeat-interval", "--log-interval",
+                               "--snapshot-interval", "--rotate-size", "--config", "--version"}) {
         EXPECT_THAT(help.output, HasSubstr(option));
     }
     const auto version = ternhad({"--version"});

@@ -68,9 +68,10 @@ TEST(SuspendedDaemonTest, ComesBackToTheTruthWithinTwoIntervals) {
     Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
     test::connect(a.node, "10.0.0.1", b.node, "10.0.0.2");
     for (Machine* machine : {&a, &b}) {
-        machine->daemon.emplace(machine->node.start({TERNHAD, "--local-ip", machine->address, "--remote-ip",
-                                                     machine->peer, "--interface", "eth1", "--check-interval",
-                                                     std::to_string(INTERVAL.count())}));
+        machine->daemon.emplace(
+            machine->node.start({TERNHAD, "--local-ip", machine->address, "--remote-ip", machine->peer,
+                                 "--interface", "eth1", "--check-interval", std::to_string(INTERVAL.count()),
+                                 "--dead-after", std::to_string(3 * INTERVAL.count())}));
     }
     const auto isTrue = [&](bool isResync) {
         return a.sees("isRemoteAlive", true) && b.sees("isRemoteAlive", true) &&

@@ -1,0 +1,183 @@
+#include "daemon.h"
+
+#include <poll.h>
+#include <pthread.h>
+#include <sys/mman.h>
+#include <sys/signalfd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <exception>
+#include <iostream>
+#include <string>
+
+#include "checker.h"
+#include "env_check.h"
+#include "passes.h"
+#include "service_notifier.h"
+
+namespace ternhad {
+
+namespace {
+
+// Of the 2 seconds that the end may take.
+constexpr auto THREADS_LIMIT = std::chrono::milliseconds(1000);
+constexpr auto EVENTS_LIMIT = std::chrono::milliseconds(1200);
+constexpr auto LOGS_LIMIT = std::chrono::milliseconds(1800);
+
+// Blocks the signals, in this thread and all that it starts, and returns a descriptor to read them from.
+int openSignals() {
+    sigset_t signals;
+    sigemptyset(&signals);
+    for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGCHLD}) {
+        sigaddset(&signals, signal);
+    }
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+    return signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK);
+}
+
+bool complain(const std::string& what, int error) {
+    std::cerr << "ternhad: cannot " << what << ": " << std::strerror(error) << '\n';
+    return false;
+}
+
+}  // namespace
+
+Daemon::Daemon(const Options& options, InstanceLock& lock)
+    : _options(options),
+      _lock(lock),
+      _health(_events),
+      _logKeeper(options, _health, _events),
+      _reboot(_events, _shutdown),
+      _peerServer(_health, _events, _reboot, _shutdown, _progress),
+      _prober(options, _health, _events, _shutdown, _progress),
+      _controlServer(options.socket, _health, _events, _shutdown, _progress),
+      _peerWatcher(options, _health, _events, _shutdown),
+      _nodeWatcher(options, _health, _shutdown, _progress),
+      _watchdog(watchdogInterval()),
+      _nextWatchdog(Clock::now()) {
+    drbdIF(options.interface);
+    localIP(options.localIp);
+    remoteIP(options.remoteIp);
+    replacePeerChecks(_reboot, _health);
+}
+
+int Daemon::run() {
+    const int signals = openSignals();
+    // What is in use stays in memory when others thrash it. Not what is not: that would triple the daemon.
+    mlockall(MCL_CURRENT | MCL_FUTURE | MCL_ONFAULT);
+    if (!_logKeeper.start()) {
+        complain("start the log keeper", errno);
+        return 1;
+    }
+    _health.setHostname(TERN::HA::Daemon::getLocalHostname());
+    if (!startThreads()) {
+        _shutdown.request(1);
+        return stop();
+    }
+    TERNHAD_LOG(_events, "Started on " + _options.localIp + ", peer " + _options.remoteIp);
+    notifyReady();
+    waitForStop(signals);
+    notifyStopping();
+    TERNHAD_LOG(_events, "Stopping");
+    const int exitCode = stop();
+    close(signals);
+    return exitCode;
+}
+
+bool Daemon::startThreads() try {
+    _eventThread.start("events", [this] { _events.run(); });
+    if (!startPeerThreads()) {
+        return false;
+    }
+    if (!_controlServer.listen()) {
+        return complain("bind the control socket " + _options.socket, errno);
+    }
+    _threads.start("reboot", [this] { _reboot.flush(); });
+    _threads.start("clients", [this] { _controlServer.run(); });
+    _threads.start("orders", [this] { _controlServer.runOrders(); });
+    _threads.start("peer", [this] { _peerWatcher.run(); });
+    _threads.start("checks", [this] { _nodeWatcher.runChecks(); });
+    _threads.start("link", [this] { _nodeWatcher.runMeasurements(); });
+    return true;
+} catch (const std::exception& error) {
+    std::cerr << "ternhad: cannot start its threads: " << error.what() << '\n';
+    return false;
+}
+
+bool Daemon::startPeerThreads() {
+    _threads.start("replies", [this] { _peerServer.run(); });
+    if (const int error = _peerServer.waitForStart()) {
+        return complain("serve the peer on " + _options.localIp, error);
+    }
+    if (_peerServer.isIsolated()) {
+        _lock.handOver();  // that thread has it, too
+    }
+    _threads.start("probes", [this] { _prober.run(); });
+    if (const int error = _prober.waitForStart()) {
+        return complain("probe the peer", error);
+    }
+    return true;
+}
+
+void Daemon::waitForStop(int signals) {
+    Passes passes;
+    while (!_shutdown.isRequested()) {
+        passes.run([this] {
+            if (_health.snapshotWanted().take()) {
+                _logKeeper.wantSnapshot();
+            }
+            _logKeeper.work();
+        });
+        updateWatchdog();
+        auto end = _logKeeper.workTime();
+        if (_watchdog) {
+            end = std::min(end, _nextWatchdog);
+        }
+        std::array<pollfd, 3> waits = {
+            {{signals, POLLIN, 0}, {_logKeeper.fd(), POLLIN, 0}, {_health.snapshotWanted().fd(), POLLIN, 0}}};
+        const timespec rest = timeUntil(end);
+        ppoll(waits.data(), waits.size(), &rest, nullptr);
+        takeSignals(signals);
+    }
+}
+
+void Daemon::takeSignals(int signals) {
+    signalfd_siginfo signal = {};
+    while (read(signals, &signal, sizeof signal) == sizeof signal) {
+        if (signal.ssi_signo == SIGTERM || signal.ssi_signo == SIGINT) {
+            _shutdown.request(0);
+        } else if (signal.ssi_signo == SIGHUP) {
+            _logKeeper.wantRotation();
+        }
+    }
+}
+
+void Daemon::updateWatchdog() {
+    // A thread may miss a quarter of the interval, because it waits for up to 30 seconds, but not all of it.
+    if (_watchdog && Clock::now() >= _nextWatchdog) {
+        _nextWatchdog = Clock::now() + *_watchdog / 4;
+        if (_progress.isComplete()) {
+            notifyAlive();
+        }
+    }
+}
+
+int Daemon::stop() {
+    const auto now = Clock::now();
+    const bool haveEnded = _threads.join(now + THREADS_LIMIT);
+    _events.end();
+    const bool isWritten = _eventThread.join(now + EVENTS_LIMIT);
+    _logKeeper.finish(now + LOGS_LIMIT);
+    _controlServer.removeFile();
+    if (!haveEnded || !isWritten) {
+        _exit(_shutdown.exitCode());  // without what hangs
+    }
+    return _shutdown.exitCode();
+}
+
+}  // namespace ternhad

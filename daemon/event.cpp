@@ -1,0 +1,73 @@
+#include "event.h"
+
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstdint>
+#include <system_error>
+
+namespace ternhad {
+
+Event::Event() : _fd(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
+    if (_fd < 0) {
+        throw std::system_error(errno, std::generic_category(), "eventfd");
+    }
+}
+
+Event::~Event() {
+    close(_fd);
+}
+
+void Event::set() noexcept {
+    const std::uint64_t one = 1;
+    // Fails only when the flag is set 2^64 - 2 times over.
+    (void)!write(_fd, &one, sizeof one);
+}
+
+bool Event::take() noexcept {
+    std::uint64_t count = 0;
+    return read(_fd, &count, sizeof count) == sizeof count;
+}
+
+void Shutdown::request(int exitCode) noexcept {
+    _exitCode = exitCode;
+    _isRequested = true;
+    _event.set();
+}
+
+bool Shutdown::sleepUntil(Clock::time_point time, std::initializer_list<const Event*> others) const noexcept {
+    std::array<pollfd, 4> waits = {};
+    std::size_t count = 0;
+    waits.at(count++) = {_event.fd(), POLLIN, 0};
+    for (const Event* other : others) {
+        waits.at(count++) = {other->fd(), POLLIN, 0};
+    }
+    while (!isRequested()) {
+        const timespec rest = timeUntil(time);
+        const int ready = ppoll(waits.data(), count, &rest, nullptr);
+        if (ready >= 0) {
+            break;
+        }
+    }
+    return !isRequested();
+}
+
+Clock::time_point nextRound(Clock::time_point round, std::chrono::duration<double> interval) noexcept {
+    return std::max(round + std::chrono::duration_cast<Clock::duration>(interval), Clock::now());
+}
+
+timespec timeUntil(Clock::time_point time) noexcept {
+    const auto rest = std::max(time - Clock::now(), Clock::duration::zero());
+    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(rest);
+    const std::chrono::nanoseconds fraction = rest - seconds;
+    timespec result = {};
+    result.tv_sec = seconds.count();
+    result.tv_nsec = static_cast<int>(fraction.count());
+    return result;
+}
+
+}  // namespace ternhad

@@ -1,0 +1,60 @@
+#include "health.h"
+
+namespace ternhad {
+
+using TERN::HA::Daemon::NodeAlive;
+using TERN::HA::Daemon::NodeRebooting;
+
+void Health::setPeerAlive(bool isAlive) noexcept {
+    if (isAlive == isPeerAlive()) {
+        return;
+    }
+    if (isAlive) {
+        _status.addRemoteNodeState(NodeAlive);
+        _status.delRemoteNodeState(NodeRebooting);
+        _peerAppeared.set();
+    } else {
+        _status.delRemoteNodeState(NodeAlive);
+        _snapshotWanted.set();
+    }
+    _events.changed(Flag::peerAlive, isAlive);
+}
+
+void Health::set(Flag flag, bool value) noexcept {
+    if (flagOf(flag).exchange(value) == value) {
+        return;
+    }
+    if (value && flag != Flag::drbdConnected) {
+        _snapshotWanted.set();  // a bad time for a failover begins
+    }
+    _events.changed(flag, value);
+}
+
+std::atomic<bool>& Health::flagOf(Flag flag) noexcept {
+    switch (flag) {
+        case Flag::peerResync:
+            return _status.isRemoteMDResync;
+        case Flag::peerDiskErrors:
+            return _status.isRemoteDiskErrHandling;
+        case Flag::resync:
+            return _status.isMDResync;
+        case Flag::diskErrors:
+            return _status.isDiskErrHandling;
+        case Flag::drbdConnected:
+        case Flag::peerAlive:
+            break;
+    }
+    return _status.isDRBDConnect;
+}
+
+std::string Health::hostname() const {
+    const std::lock_guard<std::mutex> lock(_mutex);
+    return _hostname;
+}
+
+void Health::setHostname(const std::string& name) {
+    const std::lock_guard<std::mutex> lock(_mutex);
+    _hostname = name;
+}
+
+}  // namespace ternhad

@@ -1,0 +1,99 @@
+#include <malloc.h>
+#include <sys/prctl.h>
+#include <sys/resource.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <climits>
+#include <csignal>
+#include <string>
+
+#include "checker.h"
+#include "ha_log.h"
+#include "log_keeper.h"
+#include "passes.h"
+
+namespace ternhad {
+
+using TERN::HA::Daemon::DaemonLog;
+using TERN::HA::Daemon::daemonLog;
+using TERN::HA::Daemon::recordLog;
+
+namespace {
+
+constexpr rlim_t SNAPSHOT_MEMORY = 64UL << 20;  // bytes
+
+// Moves a log to disk and archives it when it has grown.
+class Mover {
+ public:
+    Mover(DaemonLog& log, std::int64_t rotateSize) : _log(log), _rotateSize(rotateSize) {}
+
+    void move(bool rotateNow) {
+        _log.writeLogToDisk();
+        if (rotateNow || _log.size() >= _nextRotation) {
+            _log.rotate();
+            // A log that could not be compressed is still there: every further attempt costs an archive.
+            _nextRotation = _log.size() + _rotateSize;
+        }
+    }
+
+ private:
+    DaemonLog& _log;
+    std::int64_t _rotateSize;
+    std::int64_t _nextRotation = _rotateSize;
+};
+
+void limitMemory(rlim_t bytes) {
+    rlimit limit = {};
+    getrlimit(RLIMIT_DATA, &limit);
+    limit.rlim_cur = std::min(bytes, limit.rlim_max);
+    setrlimit(RLIMIT_DATA, &limit);
+}
+
+// What does not fit the memory is left out.
+void recordSnapshot(const std::string& status) {
+    limitMemory(SNAPSHOT_MEMORY);
+    attempt([&status] { recordLog->set("\n" + status); });
+    attempt(TERN::HA::Daemon::recordPS);
+    attempt(TERN::HA::Daemon::recordDF);
+    attempt(TERN::HA::Daemon::recordMemoryInfo);
+    limitMemory(RLIM_INFINITY);
+    malloc_trim(0);
+}
+
+}  // namespace
+
+int keepLogs(std::int64_t rotateSize) {
+    prctl(PR_SET_PDEATHSIG, SIGKILL);
+    prctl(PR_SET_NAME, "ternhad-logs");
+    openlog("ternhad", LOG_PID, LOG_DAEMON);
+    Mover daemonMover(*daemonLog, rotateSize);
+    Mover recordMover(*recordLog, rotateSize);
+    const auto moveBoth = [&](bool rotateNow) {
+        attempt([&] { daemonMover.move(rotateNow); });
+        attempt([&] { recordMover.move(rotateNow); });
+    };
+    std::array<char, PIPE_BUF> request;
+    for (;;) {
+        const ssize_t size = read(STDIN_FILENO, request.data(), request.size());
+        if (size < 0 && errno == EINTR) {
+            continue;
+        }
+        if (size <= 0) {
+            return 0;  // the daemon has gone
+        }
+        const auto kind = static_cast<LogRequest>(request[0]);
+        if (kind == LogRequest::snapshot) {
+            recordSnapshot(std::string(&request[1], static_cast<std::size_t>(size - 1)));
+        } else {
+            moveBoth(kind == LogRequest::rotate);
+        }
+        if (write(STDOUT_FILENO, "d", 1) != 1 || kind == LogRequest::finish) {
+            return 0;
+        }
+    }
+}
+
+}  // namespace ternhad

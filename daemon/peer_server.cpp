@@ -1,0 +1,124 @@
+#include "peer_server.h"
+
+#include <fcntl.h>
+#include <poll.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdlib>
+#include <exception>
+#include <memory>
+#include <string>
+
+#include "chkstate.h"
+#include "env_check.h"
+#include "threads.h"
+
+namespace ternhad {
+
+namespace {
+
+constexpr auto LONGEST_WAIT = std::chrono::seconds(30);
+constexpr int MOST_AT_ONCE = 64;  // requests served before the clock is looked at
+constexpr char REPLYING[] = "reply to the peer";
+
+struct CheckDeleter {
+    void operator()(EnvCheck* check) const {
+// Checks have neither members nor destructors, so that this is sound without a virtual one.
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wdelete-non-virtual-dtor"
+        delete check;
+#pragma GCC diagnostic pop
+    }
+};
+
+}  // namespace
+
+class PeerServer::Socket : public HASocketCommServer {
+ public:
+    explicit Socket(const std::string& address) : HASocketCommServer(address) {
+        if (!HasError()) {
+            hasError = fcntl(sockFd, F_SETFL, O_NONBLOCK) != 0;
+        }
+    }
+
+    int fd() const { return sockFd; }
+
+    // Who sent the last request, and whom the next reply goes to.
+    sockaddr_in sender() const { return peerAddr; }
+    void setSender(const sockaddr_in& address) { peerAddr = address; }
+};
+
+void PeerServer::run() noexcept {
+    _isIsolated = isolateDescriptors();
+    Socket socket(localIP(""));
+    if (socket.HasError()) {
+        _started.set_value(errno);
+        return;
+    }
+    _started.set_value(0);
+    raisePriority();
+    while (!_shutdown.isRequested()) {
+        serve(socket);
+        _progress.made(Progress::peerServer);
+        wait(socket);
+    }
+}
+
+void PeerServer::serve(Socket& socket) noexcept {
+    if (_reboot.isOrdered() && !_reboot.complete()) {
+        socket.setSender(_orderer);
+        reply(socket, "");
+    }
+    std::string request;
+    for (int count = 0; count < MOST_AT_ONCE; ++count) {
+        try {
+            if (socket.Recv(request) < 0) {
+                return;
+            }
+            serveOne(socket, request);
+        } catch (const std::exception&) {
+            reportTrouble(ENOMEM);
+        }
+    }
+}
+
+void PeerServer::serveOne(Socket& socket, const std::string& request) {
+    const auto entry = CheckerFactory::opMap->find(request);
+    if (entry == CheckerFactory::opMap->end()) {
+        std::abort();  // a peer that speaks otherwise must not be taken for a working one
+    }
+    const std::unique_ptr<EnvCheck, CheckDeleter> check(entry->second());
+    const std::string text = check->handle(_health.status());
+    if (request == RebootCheck().getType()) {
+        _orderer = socket.sender();  // gets a reply only when the order cannot be carried out
+    } else {
+        reply(socket, text);
+    }
+}
+
+void PeerServer::reply(Socket& socket, const std::string& text) noexcept {
+    reportTrouble(socket.Send(text) == -1 ? errno : 0);
+}
+
+void PeerServer::reportTrouble(int error) noexcept {
+    if ((error != 0) == _isInTrouble) {
+        return;
+    }
+    _isInTrouble = error != 0;
+    if (_isInTrouble) {
+        _events.troubleBegan(REPLYING, error);
+    } else {
+        _events.troubleEnded(REPLYING);
+    }
+}
+
+void PeerServer::wait(const Socket& socket) const noexcept {
+    std::array<pollfd, 3> waits = {
+        {{socket.fd(), POLLIN, 0}, {_shutdown.event().fd(), POLLIN, 0}, {_reboot.flushed().fd(), POLLIN, 0}}};
+    const auto limit = Clock::now() + LONGEST_WAIT;
+    const timespec rest = timeUntil(_reboot.isOrdered() ? _reboot.deadline() : limit);
+    ppoll(waits.data(), waits.size(), &rest, nullptr);
+}
+
+}  // namespace ternhad

@@ -1,0 +1,53 @@
+#pragma once
+
+#include <netinet/in.h>
+
+#include <future>
+#include <string>
+
+#include "event.h"
+#include "events.h"
+#include "health.h"
+#include "progress.h"
+#include "reboot.h"
+
+namespace ternhad {
+
+// Replies to the peer's requests. Its one thread waits for nothing but requests: it opens no file but the
+// kernel's reboot trigger, and logs through Events.
+class PeerServer {
+ public:
+    PeerServer(Health& health, Events& events, Reboot& reboot, const Shutdown& shutdown, Progress& progress)
+        : _health(health), _events(events), _reboot(reboot), _shutdown(shutdown), _progress(progress) {}
+
+    // Body of the thread. Binds localIP(""), port HA_PEER_PORT.
+    void run() noexcept;
+
+    // Waits for the thread to have its port. Returns 0, or the error number when it has none; the thread ends
+    // then. Call once.
+    int waitForStart() { return _started.get_future().get(); }
+
+    // After that: the thread has a descriptor table of its own.
+    bool isIsolated() const noexcept { return _isIsolated; }
+
+ private:
+    class Socket;
+
+    void serve(Socket& socket) noexcept;
+    void serveOne(Socket& socket, const std::string& request);
+    void reply(Socket& socket, const std::string& text) noexcept;
+    void reportTrouble(int error) noexcept;
+    void wait(const Socket& socket) const noexcept;
+
+    Health& _health;
+    Events& _events;
+    Reboot& _reboot;
+    const Shutdown& _shutdown;
+    Progress& _progress;
+    std::promise<int> _started;
+    bool _isIsolated = false;
+    sockaddr_in _orderer = {};  // of a reboot
+    bool _isInTrouble = false;
+};
+
+}  // namespace ternhad

@@ -1,0 +1,182 @@
+#include "prober.h"
+
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/socket.h>
+
+#include <array>
+#include <cerrno>
+#include <exception>
+
+#include "checker.h"
+#include "chkstate.h"
+#include "threads.h"
+
+namespace ternhad {
+
+using TERN::HA::Daemon::IsRemoteAlive;
+
+namespace {
+
+constexpr unsigned int NO_TIMEOUT = 0;
+constexpr int MOST_AT_ONCE = 64;  // datagrams read from one socket before the others have their turn
+constexpr char SENDING[] = "send liveness probes";
+
+// True when a probe did not leave this node because this node lacks something. Everything else that keeps one
+// from arriving, such as an unreachable network, looks the same as a dead peer.
+bool isOwnTrouble(int error) {
+    switch (error) {
+        case EAGAIN:
+        case EMFILE:
+        case ENFILE:
+        case ENOBUFS:
+        case ENOMEM:
+            return true;
+        default:
+            return false;
+    }
+}
+
+// After a failed receive: true unless the queue is empty. An error, such as a refusal, is reported in place
+// of a datagram.
+bool isMoreExpected() {
+    return errno != EAGAIN && errno != EBADF;
+}
+
+}  // namespace
+
+// The socket of one probe after another, each from a port of its own: a reply belongs to its probe by port,
+// and one that comes later than the next probe reaches nobody.
+class Prober::Socket : public HASocketCommClient {
+ public:
+    explicit Socket(const std::string& address) : HASocketCommClient(address, NO_TIMEOUT) {
+        if (!HasError()) {
+            hasError = fcntl(sockFd, F_SETFL, O_NONBLOCK) != 0;
+        }
+    }
+
+    int fd() const { return sockFd; }
+
+    // Takes a new port, connected so that only the peer's datagrams and errors arrive. False with errno.
+    bool renew() const {
+        sockaddr none = {};
+        none.sa_family = AF_UNSPEC;
+        connect(sockFd, &none, sizeof none);
+        discardOldReplies();
+        return connect(sockFd, reinterpret_cast<const sockaddr*>(&peerAddr), sizeof peerAddr) == 0;
+    }
+
+ private:
+    void discardOldReplies() const {
+        std::array<char, 1> byte;
+        while (recv(sockFd, byte.data(), byte.size(), 0) >= 0 || isMoreExpected()) {
+        }
+    }
+};
+
+Prober::Prober(const Options& options, Health& health, Events& events, const Shutdown& shutdown,
+               Progress& progress)
+    : _options(options),
+      _health(health),
+      _events(events),
+      _shutdown(shutdown),
+      _progress(progress),
+      _request(IsRemoteAlive().getType()),
+      _expectedReply(IsRemoteAlive().handle(health.status())) {}
+
+Prober::~Prober() = default;
+
+void Prober::run() noexcept {
+    const auto toDuration = [](Seconds seconds) {
+        return std::chrono::duration_cast<FailureDetector::Duration>(seconds);
+    };
+    isolateDescriptors();
+    FailureDetector detector(toDuration(_options.checkInterval), toDuration(_options.deadAfter),
+                             Clock::now());
+    for (std::size_t i = 0; i < detector.capacity(); ++i) {
+        _sockets.push_back(std::make_unique<Socket>(_options.remoteIp));
+        if (_sockets.back()->HasError()) {
+            const int error = errno;
+            _sockets.clear();
+            _started.set_value(error);
+            return;
+        }
+    }
+    _started.set_value(0);
+    raisePriority();
+    while (!_shutdown.isRequested()) {
+        // First the time, then the replies: what has come by that time is seen before anything is decided.
+        detector.wakeUp(Clock::now());
+        receive(detector);
+        _health.setPeerAlive(detector.isPeerAlive());
+        if (detector.isProbeDue()) {
+            probe(detector);
+        }
+        _progress.made(Progress::prober);
+        wait(detector);
+    }
+    _sockets.clear();  // in this thread's descriptor table
+}
+
+void Prober::probe(FailureDetector& detector) noexcept {
+    const int error = send(detector.nextProbe());
+    const bool isInTrouble = isOwnTrouble(error);
+    if (isInTrouble) {
+        detector.probeNotSent();
+    } else {
+        detector.probeSent();
+    }
+    if (isInTrouble != _isInTrouble) {
+        _isInTrouble = isInTrouble;
+        if (isInTrouble) {
+            _events.troubleBegan(SENDING, error);
+        } else {
+            _events.troubleEnded(SENDING);
+        }
+    }
+}
+
+// Returns 0 or the error number.
+int Prober::send(std::size_t number) noexcept {
+    Socket& socket = *_sockets[number];
+    if (!socket.renew()) {
+        return errno;
+    }
+    return socket.Send(_request) >= 0 ? 0 : errno;
+}
+
+void Prober::receive(FailureDetector& detector) noexcept {
+    std::string reply;
+    for (std::size_t i = 0; i < _sockets.size(); ++i) {
+        try {
+            for (int count = 0; count < MOST_AT_ONCE && detector.isAwaited(i); ++count) {
+                reply.clear();
+                if (_sockets[i]->Recv(reply) < 0 && !isMoreExpected()) {
+                    break;
+                }
+                if (reply == _expectedReply) {
+                    detector.replyReceived(i);
+                }
+            }
+        } catch (const std::exception&) {
+            continue;  // no memory for a reply that is longer than the expected one
+        }
+    }
+}
+
+void Prober::wait(const FailureDetector& detector) const noexcept {
+    static constexpr std::size_t MOST = 256;
+    std::array<pollfd, MOST> waits;
+    std::size_t count = 0;
+    waits[count++] = {_shutdown.event().fd(), POLLIN, 0};
+    for (std::size_t i = 0; i < _sockets.size() && count < MOST; ++i) {
+        if (detector.isAwaited(i)) {
+            waits[count++] = {_sockets[i]->fd(), POLLIN, 0};
+        }
+    }
+    const timespec rest = timeUntil(detector.wakeUpTime());
+    ppoll(waits.data(), count, &rest, nullptr);
+}
+
+}  // namespace ternhad

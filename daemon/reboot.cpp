@@ -1,0 +1,80 @@
+#include "reboot.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "env_check.h"
+#include "ha_log.h"
+#include "health.h"
+#include "passes.h"
+
+namespace ternhad {
+
+namespace {
+
+constexpr auto DEADLINE = std::chrono::seconds(5);
+constexpr auto FOREVER = std::chrono::hours(24);
+
+// A check has no data members.
+Reboot* theReboot = nullptr;
+const Health* theHealth = nullptr;
+
+}  // namespace
+
+void Reboot::flush() {
+    while (_shutdown.sleepUntil(Clock::now() + FOREVER, {&_ordered})) {
+        if (!_ordered.take()) {
+            continue;
+        }
+        attempt([] {
+            TERN::HA::Daemon::daemonLog->writeLogToDisk();
+            TERN::HA::Daemon::recordLog->writeLogToDisk();
+        });
+        sync();  // the kernel restarts without flushing or unmounting anything
+        _flushed.set();
+    }
+}
+
+void Reboot::order() noexcept {
+    if (!isOrdered()) {
+        _flushed.take();
+        _deadline = Clock::now() + DEADLINE;
+        _ordered.set();
+    }
+}
+
+bool Reboot::complete() noexcept {
+    if (!_flushed.take() && Clock::now() < *_deadline) {
+        return true;
+    }
+    _deadline.reset();
+    const int trigger = open("/proc/sysrq-trigger", O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
+    const bool isWritten = trigger >= 0 && write(trigger, "b", 1) == 1;
+    if (!isWritten) {
+        _events.troubleBegan("reboot at the peer's order", errno);
+    }
+    if (trigger >= 0) {
+        close(trigger);
+    }
+    return isWritten;
+}
+
+std::string RebootCheck::handle(TERN::HA::Daemon::Status&) {
+    theReboot->order();
+    return "";
+}
+
+std::string HostnameCheck::handle(TERN::HA::Daemon::Status&) {
+    return theHealth->hostname();
+}
+
+void replacePeerChecks(Reboot& reboot, const Health& health) {
+    theReboot = &reboot;
+    theHealth = &health;
+    (*CheckerFactory::opMap)[RebootCheck().getType()] = &createEnvCheckT<RebootCheck>;
+    (*CheckerFactory::opMap)[HostnameCheck().getType()] = &createEnvCheckT<HostnameCheck>;
+}
+
+}  // namespace ternhad

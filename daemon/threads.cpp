@@ -1,0 +1,86 @@
+#include "threads.h"
+
+#include <pthread.h>
+#include <sched.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <utility>
+
+#include "passes.h"
+
+namespace ternhad {
+
+namespace {
+
+constexpr auto JOIN_STEP = std::chrono::milliseconds(20);
+
+void ignoreSignal(int) {}
+
+// Interrupts what the other threads wait in, and ends the programs that they wait for: ping alone may take 10
+// seconds. The calling thread's own child is not theirs.
+void interruptThreads() {
+    std::error_code error;
+    for (const auto& task : std::filesystem::directory_iterator("/proc/self/task", error)) {
+        const pid_t thread = std::stoi(task.path().filename());
+        if (thread == gettid()) {
+            continue;
+        }
+        tgkill(getpid(), thread, SIGUSR1);
+        std::ifstream children(task.path() / "children");
+        pid_t child = 0;
+        while (children >> child) {
+            kill(child, SIGTERM);
+        }
+    }
+}
+
+}  // namespace
+
+Threads::Threads() {
+    struct sigaction action = {};
+    action.sa_handler = ignoreSignal;
+    sigaction(SIGUSR1, &action, nullptr);
+}
+
+void Threads::start(const char* name, std::function<void()> body) {
+    std::promise<void> promise;
+    std::future<void> end = promise.get_future();
+    // An exception that is left over ends the process: a daemon that lacks a thread would only seem to work.
+    std::thread thread([body = std::move(body), done = std::move(promise)]() mutable noexcept {
+        body();
+        done.set_value();
+    });
+    pthread_setname_np(thread.native_handle(), name);
+    _workers.push_back({std::move(thread), std::move(end)});
+}
+
+bool Threads::join(Clock::time_point deadline) {
+    // A thread may be about to wait when a signal reaches it: repeat until it has ended.
+    for (Worker& worker : _workers) {
+        while (worker.end.wait_for(JOIN_STEP) != std::future_status::ready) {
+            if (Clock::now() > deadline) {
+                return false;
+            }
+            attempt(interruptThreads);
+        }
+        worker.thread.join();
+    }
+    _workers.clear();
+    return true;
+}
+
+bool isolateDescriptors() noexcept {
+    return unshare(CLONE_FILES) == 0;
+}
+
+void raisePriority() noexcept {
+    sched_param parameters = {};
+    parameters.sched_priority = sched_get_priority_max(SCHED_RR);
+    pthread_setschedparam(pthread_self(), SCHED_RR, &parameters);
+}
+
+}  // namespace ternhad
