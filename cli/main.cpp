@@ -6,6 +6,7 @@
 #include <functional>
 #include <iostream>
 #include <optional>
+#include <sstream>
 #include <string>
 
 #include "client.h"
@@ -19,6 +20,16 @@ namespace {
 using Command = std::function<ExitCode(const Settings&)>;
 
 constexpr char CHECK[] = "check";
+
+// Not CLI::Range, whose message differs from one version of CLI11 to the next.
+CLI::Validator between(double min, double max) {
+    std::ostringstream limits;
+    limits << min << " to " << max;
+    const auto check = [range = CLI::Range(min, max), text = limits.str()](const std::string& value) {
+        return range(value).empty() ? "" : "Value " + value + " not in range " + text;
+    };
+    return {check, limits.str()};
+}
 
 void addCommands(CLI::App& app, Settings& settings, Command& command) {
     const auto add = [&](const char* name, const char* description, ExitCode (*function)(const Settings&)) {
@@ -44,7 +55,7 @@ void addCommands(CLI::App& app, Settings& settings, Command& command) {
                      "Show it again every SECONDS, 0.1 to 86400 (every 2 when none are given)")
         ->expected(0, 1)
         ->default_str("2")
-        ->check(CLI::Range(0.1, 86400.0))
+        ->check(between(0.1, 86400))
         ->type_name("SECONDS");
     CLI::App* const waitApp =
         add("wait", "Wait until a condition holds; exit with 1 when it does not in time", wait);
@@ -57,7 +68,7 @@ void addCommands(CLI::App& app, Settings& settings, Command& command) {
         ->check(CLI::IsMember(conditions))
         ->type_name("");
     waitApp->add_option("--timeout", settings.waitLimit, "Seconds to wait (default: for ever)")
-        ->check(CLI::Range(0.0, 1e9))
+        ->check(between(0, 1e9))
         ->type_name("SECONDS");
     add("events", "Print each change of a flag as it comes", events)
         ->add_flag_callback(
@@ -134,7 +145,7 @@ ExitCode run(int argc, char** argv) {
         ->type_name("PATH");
     app.add_option("--timeout", settings.timeout,
                    "Seconds to wait for an answer (default " + std::to_string(settings.timeout) + ")")
-        ->check(CLI::Range(1U, 3600U))
+        ->check(between(1, 3600))
         ->type_name("SECONDS");
     addCommands(app, settings, command);
 

@@ -17,7 +17,7 @@ struct Settings {
     bool isSelfOnly = false;               // check: this node only
     std::string output;                    // a file; empty: standard output
     std::string condition;                 // that `wait` waits for
-    std::optional<double> waitLimit = {};  // seconds; none: for ever
+    std::optional<double> waitLimit;  // seconds; none: for ever
 };
 
 // The process's exit codes. `check` uses the first four as monitoring plugins do: OK, warning, critical and
