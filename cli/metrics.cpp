@@ -166,7 +166,10 @@ void writeAtomically(const std::string& path, const std::string& text) {
     }
     fchmod(fd, READABLE);  // whatever the umask is
     const ssize_t written = write(fd, text.data(), text.size());
-    int error = written == static_cast<ssize_t>(text.size()) ? 0 : written < 0 ? errno : ENOSPC;
+    int error = written < 0 ? errno : 0;
+    if (error == 0 && written != static_cast<ssize_t>(text.size())) {
+        error = ENOSPC;
+    }
     if (close(fd) != 0 && error == 0) {
         error = errno;
     }
