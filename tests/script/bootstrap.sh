@@ -1,0 +1,58 @@
+#!/usr/bin/env bash
+# script/bootstrap on machines that lack packages, rights or an index: bootstrap.sh BOOTSTRAP, in a sandbox. The
+# programs that it calls are stubs.
+set -uo pipefail
+[ -e /.ternha-sandbox ] || { echo "bootstrap.sh: not in a sandbox" >&2; exit 99; }
+bootstrap=$1
+
+fail() { printf 'FAILED: %s\n%s\n' "$1" "$output" >&2; exit 1; }
+stub() { # NAME SCRIPT
+    printf '#!/bin/sh\n%s\n' "$2" >"/tmp/stubs/$1"
+    chmod +x "/tmp/stubs/$1"
+}
+# bootstrap_as ID PURPOSE...: leaves its output, exit code and the calls of apt-get and dpkg.
+bootstrap_as() {
+    stub id "echo $1"
+    : >/tmp/calls
+    output=$(PATH=/tmp/stubs:$PATH "$bootstrap" "${@:2}" 2>&1)
+    code=$?
+    calls=$(cat /tmp/calls)
+}
+says() { grep -qF -- "$1" <<<"$output" || fail "does not say: $1"; }
+calls() { grep -qE -- "$1" <<<"$calls" || fail "does not call: $1"; }
+
+mkdir -p /tmp/stubs
+stub dpkg 'case $1 in --print-architecture) echo amd64 ;; *) echo "dpkg $*" >>/tmp/calls ;; esac'
+stub apt-get 'echo "apt-get $*" >>/tmp/calls; case "$*" in *update) exit 100 ;; esac'
+stub apt-cache 'echo "$2 | 1.0 | here"'
+stub sudo 'exit 1'
+
+stub dpkg-query 'echo installed amd64'
+bootstrap_as 1000 test
+[ "$code$calls" = 0 ] || fail "all is installed, and yet it does something"
+
+stub dpkg-query 'exit 1'
+bootstrap_as 1000 demo
+[ "$code$calls" = 1 ] || fail "without rights: exit code $code"
+says "apt-get install --no-install-recommends cmake g++ "
+
+# One library is there for the other architecture only, one for this one only; the index is fetched with errors.
+stub dpkg-query 'case $3 in
+    libgtest-dev:armhf) exit 1 ;;
+    libjsoncpp-dev | *:armhf) echo installed armhf ;;
+    *) echo installed amd64 ;;
+esac'
+bootstrap_as 0 arm
+[ "$code" = 0 ] || fail "exit code $code"
+calls '^dpkg --add-architecture armhf$'
+calls '^apt-get -q install -y --no-install-recommends libgtest-dev:armhf libjsoncpp-dev$'
+
+stub dpkg-query 'exit 1'
+stub apt-cache '[ "$2" = xz-utils ] || echo "$2 | 1.0 | here"'
+bootstrap_as 0 demo
+[ "$code" = 1 ] || fail "a package that is unknown: exit code $code"
+says "apt knows no package xz-utils. These need it: the demo, the tests and script/soak. All else works without it."
+if grep -q ' install ' <<<"$calls"; then fail "installs without all packages"; fi
+
+bootstrap_as 0 breakfast
+[ "$code" = 2 ] || fail "a purpose that is unknown: exit code $code"
