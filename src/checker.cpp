@@ -14,6 +14,7 @@
 #include <cstring>
 #include <mutex>
 #include <new>
+#include <optional>
 #include <string_view>
 #include <vector>
 
@@ -36,8 +37,6 @@ constexpr int REBOOT_ROUNDS = 30;  // a second each
 
 constexpr std::size_t LINE_SIZE = 512;
 using Line = std::array<char, LINE_SIZE>;
-
-const char* const PS_ARGV[] = {"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args", nullptr};
 
 // The paths that match a pattern, sorted.
 class Glob {
@@ -197,13 +196,13 @@ bool IsRemoteDiskErrHandling::operator()(Json::Value& disks) try {
     if (!report.isObject()) {
         report = Json::Value(Json::objectValue);  // other values have no members
     }
-    bool isHandling = false;
-    if (!isJson || !readBool(report[DISK_ERR_FLAG], isHandling)) {
+    const std::optional<bool> isHandling = readBool(report[DISK_ERR_FLAG]);
+    if (!isJson || !isHandling) {
         HA_LOG("Failed to parse remote disk error info");
         return false;
     }
     disks = report[DISK_ERR_LIST];
-    return isHandling;
+    return *isHandling;
 } catch (const std::bad_alloc&) {
     return false;
 } catch (const JsonOutOfMemory&) {
@@ -274,24 +273,12 @@ bool isDRBDConnect() try {
 // ---- md resync and ATA error handling ----
 
 bool isSysfsValue(const std::string& path, const std::string& expected) try {
-    const File file(path.c_str(), O_RDONLY);
-    if (!file.isOpen()) {
+    std::string text;
+    if (!readFile(path.c_str(), text)) {
         HA_LOG("Failed to open sysfs file " + path);
         return false;
     }
-    std::string line;
-    std::array<char, 64> buffer = {};
-    ssize_t count = 0;
-    // More than expected is no match any more, whatever follows.
-    while (line.size() <= expected.size() && (count = file.read(buffer.data(), buffer.size())) > 0) {
-        line.append(buffer.data(), static_cast<std::size_t>(count));
-        const std::size_t newline = line.find('\n');
-        if (newline != std::string::npos) {
-            line.resize(newline);
-            break;
-        }
-    }
-    return line == expected;
+    return std::string_view(text).substr(0, text.find('\n')) == expected;
 } catch (const std::bad_alloc&) {
     return false;
 }
@@ -371,10 +358,9 @@ CommandPipe::~CommandPipe() {
 
 float heartbeatLatency() {
     const std::string peer = remoteIP("");
-    const std::array<const char*, 10> argv = {"/bin/ping", peer.c_str(), "-c",  "3",  "-w",
-                                              "10",        "-i",         "0.2", "-q", nullptr};
+    const char* const argv[] = {"/bin/ping", peer.c_str(), "-c", "3", "-w", "10", "-i", "0.2", "-q", nullptr};
     Line line = {};
-    const CommandPipe ping(argv.data());
+    const CommandPipe ping(static_cast<const char* const*>(argv));
     if (ping._failed) {
         HA_LOG("Failed to exec ifconfig to get interface status");
         return 0.0F;
@@ -403,8 +389,8 @@ bool InterfaceChecker::networkNonOkRate(float& rate) {
 
 bool InterfaceChecker::_interfaceDetail(const std::string& ifname,
                                         std::map<std::string, long long>& counters) {
-    const std::array<const char*, 3> argv = {"/sbin/ifconfig", "-s", nullptr};
-    const CommandPipe ifconfig(argv.data());
+    const char* const argv[] = {"/sbin/ifconfig", "-s", nullptr};
+    const CommandPipe ifconfig(static_cast<const char* const*>(argv));
     if (ifconfig._failed) {
         HA_LOG("Failed to exec ifconfig to get interface status");
         return false;
@@ -416,17 +402,18 @@ bool InterfaceChecker::_interfaceDetail(const std::string& ifname,
     }
     std::map<std::string, long long> columns;  // index of each counter's column, until its value is known
     if (startsWith(line.data(), "Iface")) {
-        const std::vector<std::string> title = split(line.data());
-        for (std::size_t i = 0; i < title.size(); ++i) {
-            if (startsWith(title[i], "RX") || startsWith(title[i], "TX")) {
-                columns.emplace(title[i], i);
+        long long index = 0;
+        for (const std::string& column : split(line.data())) {
+            if (startsWith(column, "RX") || startsWith(column, "TX")) {
+                columns.emplace(column, index);
             }
+            ++index;
         }
     }
     bool isFound = false;
     while (!readLine(ifconfig, line).empty()) {
         // A prefix suffices (eth1 finds eth10 as well); the first such line counts.
-        if (isFound || columns.empty() || !startsWith(line.data(), ifname)) {
+        if (isFound || !startsWith(line.data(), ifname)) {
             continue;
         }
         isFound = true;
@@ -487,12 +474,13 @@ void recordCMD(const char* const* argv) {
 }
 
 void recordPS() {
-    recordCMD(static_cast<const char* const*>(PS_ARGV));
+    const char* const argv[] = {"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args", nullptr};
+    recordCMD(static_cast<const char* const*>(argv));
 }
 
 void recordDF() {
-    const std::array<const char*, 2> argv = {"/bin/df", nullptr};
-    recordCMD(argv.data());
+    const char* const argv[] = {"/bin/df", nullptr};
+    recordCMD(static_cast<const char* const*>(argv));
 }
 
 void recordMemoryInfo() {

@@ -19,10 +19,9 @@ sockaddr* asSockaddr(sockaddr_in& address) {
     return reinterpret_cast<sockaddr*>(&address);
 }
 
-bool setRecvTimeout(int fd, std::uint32_t seconds, std::int32_t microseconds) {
+bool setRecvTimeout(int fd, std::uint32_t seconds) {
     timeval timeout = {};
     timeout.tv_sec = seconds;
-    timeout.tv_usec = microseconds;
     return setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout) == 0;
 }
 
@@ -37,16 +36,15 @@ int takeMessage(ssize_t received, Message& message, std::string& out) {
 
 }  // namespace
 
-HASocketComm::HASocketComm(const std::string& ip) : sockFd(-1), peerAddr(), recvTimeout(), hasError(false) {
+HASocketComm::HASocketComm(const std::string& ip)
+    : sockFd(socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0)), peerAddr(), recvTimeout(), hasError(sockFd < 0) {
     peerAddr.sin_family = AF_INET;
     peerAddr.sin_port = htons(HA_PEER_PORT);
     inet_pton(AF_INET, ip.c_str(), &peerAddr.sin_addr);
-    sockFd = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
-    if (sockFd < 0) {
+    if (hasError) {
         const int error = errno;
         syslog(LOG_ERR, "%s:%d Failed to set socket", __FILE_NAME__, __LINE__);
         errno = error;
-        hasError = true;
     }
 }
 
@@ -78,7 +76,7 @@ HASocketCommServer::HASocketCommServer(const std::string& ip, unsigned int timeo
     : HASocketComm(ip), peerAddrLen(sizeof peerAddr) {
     recvTimeout.seconds = timeoutSec;
     if (!hasError) {
-        hasError = !setRecvTimeout(sockFd, recvTimeout.seconds, recvTimeout.microseconds) ||
+        hasError = !setRecvTimeout(sockFd, recvTimeout.seconds) ||
                    bind(sockFd, asSockaddr(peerAddr), peerAddrLen) != 0;
     }
 }
@@ -95,7 +93,7 @@ int HASocketCommServer::Recv(std::string& out) {
 HASocketCommClient::HASocketCommClient(const std::string& ip, unsigned int timeoutSec) : HASocketComm(ip) {
     recvTimeout.seconds = timeoutSec;
     if (!hasError) {
-        hasError = !setRecvTimeout(sockFd, recvTimeout.seconds, recvTimeout.microseconds);
+        hasError = !setRecvTimeout(sockFd, recvTimeout.seconds);
     }
 }
 

@@ -39,8 +39,7 @@ bool MonitordSocket::serverHandle(const Json::Value& request, Json::Value& reply
         HA_LOG("Failed get action from content: " + jsonText(request));
         return false;
     }
-    std::string action;
-    readString(request[ACTION], action);
+    const std::string action = readString(request[ACTION]).value_or("");
     switch (action.c_str()[0]) {
         case 'R':
             if (!RebootRemote()(*_status)) {
@@ -75,11 +74,9 @@ bool MonitordSocket::rebootRemote() {
 
 bool MonitordSocket::isRebootRemote() {
     Json::Value reply;
-    bool rebooting = false;
-    if (exchange(*this, "r", reply) && reply.isObject()) {
-        readBool(std::as_const(reply)[IS_REBOOTING], rebooting);  // adds no member, which takes memory
-    }
-    return rebooting;
+    return exchange(*this, "r", reply) && reply.isObject() &&
+           readBool(std::as_const(reply)[IS_REBOOTING])
+               .value_or(false);  // adds no member, which takes memory
 }
 
 }  // namespace TERN::HA::Daemon

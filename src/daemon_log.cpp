@@ -34,7 +34,8 @@ using Lock = std::unique_lock<std::timed_mutex>;
 // Writes every line of `chunk` to `to`, each with a write of its own. What follows the last newline is kept
 // in `beginning`, and what is there already goes in front.
 void moveWholeLines(std::string_view chunk, std::string& beginning, const File& to) {
-    for (std::size_t newline = 0; (newline = chunk.find('\n')) != std::string_view::npos;) {
+    for (std::size_t newline = chunk.find('\n'); newline != std::string_view::npos;
+         newline = chunk.find('\n')) {
         const std::string_view line = chunk.substr(0, newline + 1);
         if (beginning.empty()) {
             to.write(line.data(), line.size());
@@ -52,18 +53,21 @@ void moveWholeLines(std::string_view chunk, std::string& beginning, const File& 
 void moveLines(const File& from, const File& to) {
     std::string chunk(READ_SIZE, '\0');
     std::string beginning;
-    ssize_t count = 0;
-    int waits = 0;
-    do {
-        while ((count = from.read(chunk.data(), chunk.size())) > 0) {
+    for (int waits = 0;;) {
+        const ssize_t count = from.read(chunk.data(), chunk.size());
+        if (count > 0) {
             moveWholeLines({chunk.data(), static_cast<std::size_t>(count)}, beginning, to);
+            continue;
         }
         if (beginning.empty()) {
             return;
         }
         // Somebody may be in the middle of an append, whose beginning can be read already.
+        if (count == -1 || ++waits > LINE_END_WAITS) {
+            break;
+        }
         std::this_thread::sleep_for(LINE_END_WAIT);
-    } while (count == 0 && ++waits <= LINE_END_WAITS);
+    }
     beginning += '\n';
     to.write(beginning.data(), beginning.size());
 }
@@ -74,7 +78,6 @@ DaemonLog::DaemonLog(std::string directory, std::string fileName)
     : _logPath(std::move(directory) + fileName),
       _bufferPath(BUFFER_DIR + std::move(fileName)),
       _lockTimeout(LOCK_TIMEOUT) {
-    _rotateFiles.reserve(1 + ARCHIVES);
     _rotateFiles.push_back(_logPath);
     for (int number = 0; number < ARCHIVES; ++number) {
         _rotateFiles.push_back(_logPath + "." + std::to_string(number));
@@ -83,11 +86,7 @@ DaemonLog::DaemonLog(std::string directory, std::string fileName)
 
 void DaemonLog::set(const std::string& text) {
     const Lock lock(_mutex, std::chrono::seconds(_lockTimeout));
-    std::string line = _formatedTime();
-    line.reserve(line.size() + text.size() + 2);
-    line += ' ';
-    line += text;
-    line += '\n';
+    const std::string line = _formatedTime() + ' ' + text + '\n';
     const File buffer(_bufferPath.c_str(), O_WRONLY | O_APPEND | O_CREAT);
     if (buffer.isOpen()) {
         buffer.write(line.data(), line.size());
@@ -126,9 +125,9 @@ std::string DaemonLog::_formatedTime() const {
     // Lines come in bursts: what was made for the first of a second serves the others in the same zone.
     // Without a destructor, so that a process can log to its very end.
     struct Stamp {
-        std::time_t time = 0;
-        std::array<char, 64> zone = {};
-        std::array<char, 32> text = {};
+        std::time_t time;
+        std::array<char, 64> zone;
+        std::array<char, 32> text;
     };
     static thread_local Stamp last;
 
@@ -158,8 +157,8 @@ std::string DaemonLog::_formatedTime() const {
 }
 
 bool DaemonLog::_xz(const std::string& path) const {
-    const std::array<const char*, 3> argv = {XZ, path.c_str(), nullptr};
-    return PLATExecv(XZ, argv.data(), 1) != 0;
+    const char* const argv[] = {XZ, path.c_str(), nullptr};
+    return PLATExecv(XZ, static_cast<const char* const*>(argv), 1) != 0;
 }
 
 bool DaemonLog::_rename(const std::string& from, const std::string& to) const {

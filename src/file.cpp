@@ -3,38 +3,31 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
 
 namespace TERN::HA::Daemon {
 
-File::File(const char* path, int flags, mode_t mode) : _fd(-1) {
-    do {
-        _fd = open(path, flags | O_CLOEXEC, mode);
-    } while (_fd < 0 && errno == EINTR);
-}
+File::File(const char* path, int flags, mode_t mode)
+    : _fd(static_cast<int>(TEMP_FAILURE_RETRY(open(path, flags | O_CLOEXEC, mode)))) {}
 
 File::~File() {
-    if (_fd >= 0) {
+    if (isOpen()) {
         close(_fd);
     }
 }
 
 ssize_t File::read(char* buffer, std::size_t size) const {
-    ssize_t count = 0;
-    do {
-        count = ::read(_fd, buffer, size);
-    } while (count < 0 && errno == EINTR);
-    return count;
+    return TEMP_FAILURE_RETRY(::read(_fd, buffer, size));
 }
 
 bool File::write(const char* data, std::size_t size) const {
     while (size > 0) {
-        const ssize_t count = ::write(_fd, data, size);
-        if (count >= 0) {
-            data += count;
-            size -= static_cast<std::size_t>(count);
-        } else if (errno != EINTR) {
+        const ssize_t count = TEMP_FAILURE_RETRY(::write(_fd, data, size));
+        if (count == -1) {
             return false;
         }
+        data += count;
+        size -= static_cast<std::size_t>(count);
     }
     return true;
 }
@@ -44,13 +37,14 @@ bool readFile(const char* path, std::string& content) {
     if (!file.isOpen()) {
         return false;
     }
-    content.clear();
-    char buffer[4096];
-    ssize_t count = 0;
-    while ((count = file.read(buffer, sizeof buffer)) > 0) {
+    char buffer[BUFSIZ];
+    while (true) {
+        const ssize_t count = file.read(buffer, sizeof buffer);
+        if (count <= 0) {
+            return true;
+        }
         content.append(buffer, static_cast<std::size_t>(count));
     }
-    return true;
 }
 
 }  // namespace TERN::HA::Daemon

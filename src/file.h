@@ -31,8 +31,7 @@ class File {
     int _fd;
 };
 
-// Puts the bytes of the file at `path`, as far as they can be read, into `content`. False when it cannot be
-// opened.
+// Appends the bytes of the file at `path`, best effort, to `content`. False when it cannot be opened.
 bool readFile(const char* path, std::string& content);
 
 }  // namespace TERN::HA::Daemon

@@ -11,7 +11,7 @@ bool parseJson(const std::string& text, Json::Value& value) {
     try {
         Json::Reader reader;
         Json::Value parsed;
-        if (!reader.parse(text, parsed, true)) {
+        if (!reader.parse(text, parsed)) {
             return false;
         }
         value.swap(parsed);
@@ -29,20 +29,12 @@ std::string jsonText(const Json::Value& value) {
 
 #pragma GCC diagnostic pop
 
-bool readString(const Json::Value& value, std::string& result) {
-    if (!value.isConvertibleTo(Json::stringValue)) {
-        return false;
-    }
-    result = value.asString();
-    return true;
+std::optional<std::string> readString(const Json::Value& value) {
+    return value.isConvertibleTo(Json::stringValue) ? std::optional(value.asString()) : std::nullopt;
 }
 
-bool readBool(const Json::Value& value, bool& result) {
-    if (!value.isConvertibleTo(Json::booleanValue)) {
-        return false;
-    }
-    result = value.asBool();
-    return true;
+std::optional<bool> readBool(const Json::Value& value) {
+    return value.isConvertibleTo(Json::booleanValue) ? std::optional(value.asBool()) : std::nullopt;
 }
 
 }  // namespace TERN::HA::Daemon

@@ -2,6 +2,7 @@
 
 #include <json/json.h>
 
+#include <optional>
 #include <string>
 
 // JSON as all units read and write it. jsoncpp throws where a value has the wrong shape or nests too deep; no
@@ -18,8 +19,8 @@ bool parseJson(const std::string& text, Json::Value& value);
 // The text of `value`: compact, without line end, keys sorted.
 std::string jsonText(const Json::Value& value);
 
-// `value` read as a string or a bool. False, with `result` as it was, when it cannot be read as one.
-bool readString(const Json::Value& value, std::string& result);
-bool readBool(const Json::Value& value, bool& result);
+// `value` read as a string or a bool; nothing when it cannot be read as one.
+std::optional<std::string> readString(const Json::Value& value);
+std::optional<bool> readBool(const Json::Value& value);
 
 }  // namespace TERN::HA::Daemon

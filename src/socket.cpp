@@ -25,7 +25,7 @@ constexpr int BACKLOG = 100;
 constexpr std::size_t PATH_LIMIT = sizeof(sockaddr_un::sun_path) - 1;
 
 struct Address {
-    explicit Address(const std::string& path) : name(), size(0) {
+    explicit Address(const std::string& path) : name() {
         name.sun_family = AF_UNIX;
         const std::size_t length = path.copy(static_cast<char*>(name.sun_path), PATH_LIMIT);
         size = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + length);
@@ -53,34 +53,25 @@ class Connection {
 // host's own handling of SIGPIPE: the signal is held back in this thread and taken back if this send raised
 // it.
 ssize_t sendText(int fd, const std::string& text) {
-    sigset_t pipeSignal;
+    sigset_t pipeSignal = {};
+    sigset_t pending = {};
     sigset_t oldMask;
-    sigset_t pending;
-    sigemptyset(&pipeSignal);
     sigaddset(&pipeSignal, SIGPIPE);
     sigpending(&pending);
     const bool wasPending = sigismember(&pending, SIGPIPE) == 1;
     pthread_sigmask(SIG_BLOCK, &pipeSignal, &oldMask);
 
     const ssize_t sent = send(fd, text.data(), text.size(), 0);
-    const int error = errno;
-
-    if (sent == -1 && error == EPIPE && !wasPending) {
+    if (sent == -1 && errno == EPIPE && !wasPending) {
         const timespec now = {};
         sigtimedwait(&pipeSignal, nullptr, &now);
     }
     pthread_sigmask(SIG_SETMASK, &oldMask, nullptr);
-    errno = error;
     return sent;
 }
 
 bool serverOutOfMemory(const char* request) {
     syslog(LOG_ERR, "%s:%d Failed to handle input data: %s", __FILE_NAME__, __LINE__, request);
-    return false;
-}
-
-bool clientOutOfMemory() {
-    syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
     return false;
 }
 
@@ -200,7 +191,6 @@ bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& repl
     }
     if (!_clientConnect()) {
         syslog(LOG_ERR, "%s:%d Failed to connect socket server: %m", __FILE_NAME__, __LINE__);
-        _hasError = true;
         return false;
     }
     const std::string requestText = jsonText(request);
@@ -223,11 +213,9 @@ bool DaemonLocalSocket::clientSend(const Json::Value& request, Json::Value& repl
     }
     return true;
 } catch (const std::bad_alloc&) {
+    syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
     _hasError = true;
-    return clientOutOfMemory();
-} catch (const JsonOutOfMemory&) {
-    _hasError = true;
-    return clientOutOfMemory();
+    return false;
 }
 
 }  // namespace TERN::HA::Daemon

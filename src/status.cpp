@@ -29,9 +29,8 @@ Json::Value toArray(const std::set<std::string>& names) {
 std::set<std::string> toSet(const Json::Value& array) {
     std::set<std::string> names;
     for (const Json::Value& element : array) {
-        std::string name;
-        if (readString(element, name)) {
-            names.insert(name);
+        if (const std::optional<std::string> name = readString(element)) {
+            names.insert(*name);
         }
     }
     return names;

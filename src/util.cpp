@@ -1,7 +1,7 @@
 #include "util.h"
 
 #include <array>
-#include <utility>
+#include <optional>
 
 #include "file.h"
 #include "ha_log.h"
@@ -61,12 +61,13 @@ std::vector<std::string> devListToHumanReadable(const std::vector<std::string>& 
     };
     std::vector<Disk> disks;
     for (auto member = table.begin(); member != table.end(); ++member) {
-        Disk disk;
-        std::string container;
-        if (member->isObject() && readString((*member)["HD_DEVNAME"], disk.device) &&
-            readString((*member)["HD_CONTAINER"], container)) {
-            disk.name = readableName(member.name(), container);
-            disks.push_back(std::move(disk));
+        if (!member->isObject()) {
+            continue;
+        }
+        const std::optional<std::string> device = readString((*member)["HD_DEVNAME"]);
+        const std::optional<std::string> container = readString((*member)["HD_CONTAINER"]);
+        if (device && container) {
+            disks.push_back({*device, readableName(member.name(), *container)});
         }
     }
     std::vector<std::string> names;
