@@ -173,6 +173,7 @@ TEST_F(InterfaceTest, TheRateIsTheShareOfWhatIsNotOk) {
     EXPECT_FLOAT_EQ(checker._rateCaculate(5, 1995), 0.0025F);
     EXPECT_EQ(checker._rateCaculate(0, 7), 0.0F);
     EXPECT_EQ(checker._rateCaculate(7, 0), 1.0F);
+    EXPECT_EQ(checker._rateCaculate(1, 0), 1.0F);
     EXPECT_EQ(checker._rateCaculate(0, 0), 0.0F);
     EXPECT_EQ(checker._rateCaculate(7, -7), 0.0F);
     EXPECT_EQ(checker._rateCaculate(-5, 15), -0.5F);

@@ -43,6 +43,11 @@ TEST_F(LocalHostnameTest, IsTheWholeFileByteForByte) {
     EXPECT_EQ(getLocalHostname(), content);
 }
 
+TEST_F(LocalHostnameTest, MayBeOneByte) {
+    writeFile(kHostname, "n");
+    EXPECT_EQ(getLocalHostname(), "n");
+}
+
 TEST_F(LocalHostnameTest, IsLookedForAgainWhileTheFileIsMissing) {
     EXPECT_EQ(getLocalHostname(), "");
     EXPECT_EQ(getLocalHostname(), "");

@@ -156,6 +156,17 @@ TEST_F(TransportTest, TheDestructorClosesTheSocket) {
     EXPECT_FALSE(successor.HasError());
 }
 
+TEST_F(TransportTest, DescriptorZeroIsOneLikeOthers) {
+    close(STDIN_FILENO);
+    {
+        OpenClient client(kOwnAddress, 1);
+        EXPECT_EQ(client.sockFd, STDIN_FILENO);
+        EXPECT_FALSE(client.HasError());
+    }
+    EXPECT_EQ(fcntl(STDIN_FILENO, F_GETFD), -1);
+    open("/dev/null", O_RDONLY);
+}
+
 TEST_F(TransportTest, WithoutASocketTheSystemLogSaysSoAndEveryCallFails) {
     test::SystemLog log;
     {
@@ -230,6 +241,17 @@ TEST_F(ServerTest, ReceivesADatagramWithoutChangeAndAnswersItsSender) {
     EXPECT_EQ(answer->bytes, "answer");
     EXPECT_EQ(answer->address, kOwnAddress);
     EXPECT_EQ(answer->port, 7499);
+}
+
+TEST_F(ServerTest, HasRoomForEachSendersAddress) {
+    HASocketCommServer server(kOwnAddress, kTimeout);
+    server.peerAddrLen = 0;
+    UdpSocket asker;
+    asker.send("question", kOwnAddress, kPeerPort);
+    std::string text;
+    EXPECT_EQ(server.Recv(text), 8);
+    EXPECT_EQ(server.Send("answer"), 6);
+    EXPECT_THAT(arrived(asker), ElementsAre("answer"));
 }
 
 TEST_F(ServerTest, AnswersOnlyWhoeverAskedLast) {

@@ -147,6 +147,22 @@ TEST_F(DaemonLogTest, StampsAreThoseOfTheMoment) {
     EXPECT_LE(timegm(&stamp), after);
 }
 
+TEST_F(DaemonLogTest, LinesOfOneSecondLookAtTheZoneOnce) {
+    // Longer names are looked at for every line.
+    for (const auto& [length, looks] :
+         {std::pair(4, 1), std::pair(63, 1), std::pair(64, 3), std::pair(5, 1)}) {
+        setenv("TZ", ("X" + std::string(static_cast<std::size_t>(length) - 2, 'X') + "0").c_str(), 1);
+        const int before = test::zoneLooks();
+        for (int i = 0; i < 3; ++i) {
+            setAt(1794730821, "line");
+        }
+        EXPECT_EQ(test::zoneLooks() - before, looks) << length;
+    }
+    const int before = test::zoneLooks();
+    setAt(1794730822, "line");
+    EXPECT_EQ(test::zoneLooks() - before, 1);
+}
+
 TEST_F(DaemonLogTest, AnyTextIsKeptByteForByte) {
     const test::FixedTime now(1794730821);
     const std::string text("\n{}\n\0\xff%s\r\n", 11);
@@ -328,6 +344,22 @@ TEST_F(DaemonLogTest, WithADirectoryForABufferNothingIsMoved) {
     test::makeDirectories(BUFFER);
     log.writeLogToDisk();
     EXPECT_EQ(test::readFile(LOG), "");
+}
+
+TEST_F(DaemonLogTest, TheEndOfALineIsWaitedForForATenthOfASecond) {
+    test::writeFile(BUFFER, "x");
+    const test::NoSleep noSleep;
+    log.writeLogToDisk();
+    EXPECT_EQ(test::readFile(LOG), "x\n");
+    EXPECT_EQ(test::NoSleep::total(), std::chrono::milliseconds(100));
+}
+
+TEST_F(DaemonLogTest, NothingIsWaitedForWithoutALogToMoveItTo) {
+    test::writeFile(BUFFER, "the beginning of a line");
+    test::removeTree("/var/log/ha");
+    const test::NoSleep noSleep;
+    log.writeLogToDisk();
+    EXPECT_EQ(test::NoSleep::total(), std::chrono::milliseconds(0));
 }
 
 TEST_F(DaemonLogTest, ALastLineWithoutANewlineGainsOne) {

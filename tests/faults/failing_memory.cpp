@@ -1,18 +1,27 @@
 #include "faults/failing_memory.h"
 
+#include <dlfcn.h>
+
 #include <cstdlib>
+#include <cstring>
 #include <new>
+
+#include "support/real_function.h"
 
 namespace {
 
 thread_local int countdown = 0;
+
+bool fails() {
+    return countdown > 0 && --countdown == 0;
+}
 
 }  // namespace
 
 // Taken by every library of the process before those of the standard library, whose other forms call these.
 
 void* operator new(std::size_t size) {
-    if (countdown > 0 && --countdown == 0) {
+    if (fails()) {
         throw std::bad_alloc();
     }
     void* const memory = std::malloc(size == 0 ? 1 : size);
@@ -29,6 +38,19 @@ void operator delete(void* memory) noexcept {
 void operator delete(void* memory, std::size_t /*size*/) noexcept {
     std::free(memory);
 }
+
+// jsoncpp has the memory of strings from malloc, which otherwise belongs to the sanitizers.
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+extern "C" void* malloc(std::size_t size) {
+    static auto* const real = test::realFunction<void*(std::size_t)>("malloc");
+    Dl_info caller = {};
+    if (countdown > 0 && dladdr(__builtin_return_address(0), &caller) != 0 &&
+        std::strstr(caller.dli_fname, "libjsoncpp") != nullptr && fails()) {
+        return nullptr;
+    }
+    return real(size);
+}
+#endif
 
 namespace test {
 

@@ -79,6 +79,9 @@ class MemoryTest : public test::SandboxTest {
         } catch (const std::bad_alloc&) {
             hasFailed = true;
             return OUT_OF_MEMORY;
+        } catch (const Json::RuntimeError&) {
+            hasFailed = true;
+            return OUT_OF_MEMORY;
         }
         return result;
     }
@@ -128,9 +131,18 @@ TEST_F(MemoryTest, LocalChecks) {
                  [] { return yesNo(isDRBDConnect()); },
                  "yes",
                  {"no"}});
+    expectWhole({"isDRBDConnect without a connection",
+                 [] { test::writeFile("/proc/drbd", " 0: cs:StandAlone ro:Primary/Unknown\n"); },
+                 [] { return yesNo(isDRBDConnect()); }, "no"});
     expectWhole({"isDRBDConnect without DRBD", [] { test::removeTree("/proc/drbd"); },
                  [] { return yesNo(isDRBDConnect()); }, "no"});
     Operation md{"isMDResync", [] {}, [] { return yesNo(isMDResync()); }, "yes", {"no"}};
+    expectWhole(md);
+    md.name = "isMDResync without a resync";
+    md.prepare = [] {
+        test::writeFile("/sys/block/md0/md/sync_action", "no resync, but something longer\n");
+    };
+    md.result = "no";
     expectWhole(md);
     md.name = "isMDResync without arrays";
     md.prepare = [] { test::removeTree("/sys/block/md0"); };
@@ -150,8 +162,15 @@ TEST_F(MemoryTest, LocalChecks) {
                      "yes 1",
                      {"no 0"}};
     expectWhole(errors);
-    expectWholeOrThrow({"devListToHumanReadable", [] {},
-                        [] { return Util::devListToHumanReadable({"sda"}).at(0); }, "Disk 3"});
+    errors.name = "isDiskErrHandling without errors";
+    errors.prepare = [] { test::writeFile("/sys/class/ata_port/ata1/error_handling", "0\n"); };
+    errors.result = "no 0";
+    expectWhole(errors);
+    expectWholeOrThrow({"devListToHumanReadable",
+                        [] {},
+                        [] { return Util::devListToHumanReadable({"sda"}).at(0); },
+                        "Disk 3",
+                        {"sda"}});
 }
 
 // ---- Programs ----
@@ -332,16 +351,19 @@ TEST_F(MemoryTest, AskingAPeerWithoutAnAddress) {
 
 TEST_F(MemoryTest, AskingThePeerForItsDisks) {
     remoteIP(test::kPeerAddress);
-    test::FakePeer peer(R"({"errHandlingDisk":["sda","sdb"],"isDiskErrHandling":true})");
-    Json::Value disks;
-    expectWhole({"IsRemoteDiskErrHandling",
-                 [&disks] { disks = Json::Value(Json::arrayValue); },
-                 [&disks] { return yesNo(IsRemoteDiskErrHandling()(disks)); },
-                 "yes",
-                 {"no"},
-                 [&disks] { return std::to_string(disks.size()); },
-                 "2",
-                 {"0"}});
+    for (const bool isHandling : {true, false}) {
+        const std::string flag = isHandling ? "true" : "false";
+        test::FakePeer peer(R"({"errHandlingDisk":["sda","sdb"],"isDiskErrHandling":)" + flag + "}");
+        Json::Value disks;
+        expectWhole({"IsRemoteDiskErrHandling " + flag,
+                     [&disks] { disks = Json::Value(Json::arrayValue); },
+                     [&disks] { return yesNo(IsRemoteDiskErrHandling()(disks)); },
+                     yesNo(isHandling),
+                     {"no"},
+                     [&disks] { return std::to_string(disks.size()); },
+                     "2",
+                     {"0"}});
+    }
 }
 
 TEST_F(MemoryTest, OrderingAReboot) {
@@ -467,13 +489,14 @@ TEST_F(MemoryTest, AskingOverTheControlSocket) {
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
     std::optional<test::HandlerSocket> client;
+    const Json::Value request("question");
     Json::Value reply;
     Operation exchange{"clientSend",
                        [&client, &reply] {
                            client.emplace(test::HandlerSocket::Handler(), test::LOCAL_SOCKET, 5);
                            reply = "as it was";
                        },
-                       [&client, &reply] { return yesNo(client->clientSend("question", reply)); },
+                       [&client, &request, &reply] { return yesNo(client->clientSend(request, reply)); },
                        "yes",
                        {"no"},
                        [&client, &reply] { return yesNo(client->hasError()) + " " + reply.asString(); },

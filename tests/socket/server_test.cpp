@@ -103,6 +103,36 @@ TEST_F(ServerSocketTest, ARefusedRequestGetsNoReply) {
     EXPECT_FALSE(server.hasError());
 }
 
+TEST_F(ServerSocketTest, AHandlerWithoutMemoryRefusesTheRequest) {
+    bool isJsons = false;
+    HandlerSocket server([&isJsons](const Json::Value&, Json::Value&) -> bool {
+        if (isJsons) {
+            throw Json::RuntimeError("Failed to allocate string value buffer");
+        }
+        throw std::bad_alloc();
+    });
+    ASSERT_TRUE(server.serverBind());
+    for (const bool value : {false, true}) {
+        isJsons = value;
+        const test::RawClient client;
+        client.send("{}");
+        EXPECT_FALSE(server.serverListen());
+        EXPECT_EQ(client.receiveAll(), "");
+    }
+    const auto line = test::LogLine("socket.cpp", "Failed to handle input data: {}");
+    EXPECT_THAT(systemLog(), ElementsAre(line, line));
+    EXPECT_FALSE(server.hasError());
+}
+
+TEST_F(ServerSocketTest, AnErrorOfTheHandlerIsNotSilenced) {
+    HandlerSocket server([](const Json::Value&, Json::Value&) -> bool { throw std::logic_error("handler"); });
+    ASSERT_TRUE(server.serverBind());
+    const test::RawClient client;
+    client.send("{}");
+    EXPECT_THROW(server.serverListen(), std::logic_error);
+    EXPECT_EQ(client.receiveAll(), "");
+}
+
 TEST_F(ServerSocketTest, TheReplyBeginsAsNull) {
     HandlerSocket server([](const Json::Value&, Json::Value& reply) { return reply.isNull(); });
     ASSERT_TRUE(server.serverBind());

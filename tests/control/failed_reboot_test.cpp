@@ -1,0 +1,32 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "checker.h"
+#include "control.h"
+#include "support/json.h"
+#include "support/sandbox.h"
+
+// The dynamic linker takes this one, which fails as the library's own never does.
+bool TERN::HA::Daemon::RebootRemote::operator()(Status& /*status*/) {
+    return false;
+}
+
+namespace {
+
+using namespace TERN::HA::Daemon;
+using ::testing::ElementsAre;
+
+class FailedRebootTest : public test::SandboxTest {};
+
+TEST_F(FailedRebootTest, IsLoggedAndNotAnswered) {
+    Status status;
+    MonitordSocket server("/tmp/control.sock", 0);
+    server.setStatus(&status);
+    Json::Value reply;
+    EXPECT_FALSE(server.serverHandle(test::parsed(R"({"act":"R"})"), reply));
+    EXPECT_TRUE(reply.isNull());
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("control.cpp", "Failed to reboot remote")));
+}
+
+}  // namespace
