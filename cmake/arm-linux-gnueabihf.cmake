@@ -7,7 +7,7 @@ set(CMAKE_LIBRARY_ARCHITECTURE arm-linux-gnueabihf)
 # Without a prefix: the emulator would look every path up in it first, "/" included.
 set(CMAKE_CROSSCOMPILING_EMULATOR qemu-arm)
 
-# Libraries come from a sysroot (CMAKE_SYSROOT, see script/sysroot) or else from Debian's foreign-architecture
+# Libraries come from a sysroot (CMAKE_SYSROOT, see script/debian-root) or else from Debian's foreign-architecture
 # packages, whose headers and package files are shared.
 set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
 if(CMAKE_SYSROOT)

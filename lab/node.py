@@ -111,6 +111,11 @@ class Node:
         """The lines of the daemon log: those on disk, then those that are still buffered."""
         return self.run("cat /var/log/ha/ha.daemon.log /tmp/ha/ha.daemon.log 2>/dev/null || true").splitlines()
 
+    def full_log(self) -> list[str]:
+        """The lines of the daemon log with those of its archives."""
+        archives = "for file in $(ls -r /var/log/ha/ha.daemon.log.*.xz 2>/dev/null); do xz -dc $file; done"
+        return self.run(f"{archives}; true").splitlines() + self.log()
+
     def has_logged(self, text: str) -> bool:
         return any(line.endswith(text) for line in self.log())
 

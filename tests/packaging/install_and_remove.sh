@@ -21,7 +21,7 @@ eventually() { # LIMIT_IN_SECONDS COMMAND...
 # architecture that the machine lacks lie in one below.
 layers=/run/layers
 sysroot=
-[ "$architecture" = "$(dpkg --print-architecture)" ] || sysroot=$("${0%/*}/../../script/sysroot")
+[ "$architecture" = "$(dpkg --print-architecture)" ] || sysroot=$("${0%/*}/../../script/debian-root" sysroot)
 for directory in /usr/*; do
     if [ ! -d "$directory" ] || [ -L "$directory" ]; then
         continue

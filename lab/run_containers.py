@@ -1,0 +1,60 @@
+"""Runs the scenario of the service: run_containers.py ROOT PACKAGES, in namespaces of its own."""
+
+import shutil
+import signal
+import sys
+import tempfile
+import time
+from pathlib import Path
+
+import container_scenario
+from checks import Checks
+from consoles import Consoles
+from containers import Pair
+from failure import CheckFailed, LabError
+from repack import repack
+from service import PACKAGES
+
+ROOT = Path(__file__).resolve().parents[1]
+
+
+def main() -> int:
+    root, built = sys.argv[1], Path(sys.argv[2])
+    for number in (signal.SIGTERM, signal.SIGHUP):
+        signal.signal(number, signal.default_int_handler)
+    begin = time.monotonic()
+    consoles = Consoles(ROOT / "build/containers", begin)
+    checks = Checks(consoles, begin)
+    print(f"containers: the consoles of both nodes go to {consoles.path.relative_to(ROOT)}", flush=True)
+    failed = False
+    try:
+        with tempfile.TemporaryDirectory(prefix="ternha-containers.") as directory:
+            make_packages(built, Path(directory))
+            with Pair(root, Path(directory), consoles) as pair:
+                container_scenario.run(pair, checks)
+    except CheckFailed as failure:
+        failed = True
+        print(f"FAILED: {failure.what}\n  expected: {failure.expected}\n  seen:     {failure.seen}", flush=True)
+    except LabError as error:
+        failed = True
+        print(f"FAILED: {error}", flush=True)
+    except KeyboardInterrupt:
+        print("containers: interrupted", file=sys.stderr)
+        return 130
+    if failed:
+        print(f"The last lines of the consoles, all of which are in {consoles.path}:\n{consoles.tail()}", flush=True)
+    print(f"containers: {checks.passed} passed, {int(failed)} failed", flush=True)
+    return int(failed)
+
+
+def make_packages(built: Path, directory: Path):
+    """The packages in `new`, and in `old` the same with a lower version."""
+    for age in ("new", "old"):
+        (directory / age).mkdir()
+    for name in PACKAGES:
+        (package,) = built.glob(f"{name}_*_amd64.deb")
+        shutil.copy(package, directory / "new")
+        repack(package, directory / "old" / package.name, 0)
+
+
+sys.exit(main())

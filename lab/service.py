@@ -1,0 +1,56 @@
+"""The daemon as a service of a node: what systemd knows of it."""
+
+from pathlib import Path
+
+from node import Node
+
+FILE = "/etc/ternha/ternhad.conf"
+DROP_IN = "/run/systemd/system/ternhad.service.d/lab.conf"
+PACKAGES = ["libterncore6", "libternhadaemon6", "ternhad"]
+
+
+def configure(node: Node, peer: Node, interface: str):
+    """Edits the configuration as an administrator does."""
+    values = {"local-ip": node.address, "remote-ip": peer.address, "interface": interface}
+    node.run("sed -i " + " ".join(f"-e 's/^#{key} = .*/{key} = {value}/'" for key, value in values.items()) + f" {FILE}")
+
+
+def properties(node: Node, *names: str) -> list[str]:
+    lines = node.run(f"systemctl show ternhad --property={','.join(names)}").splitlines()
+    values = dict(line.split("=", 1) for line in lines)
+    return [values[name] for name in names]
+
+
+def state(node: Node) -> str:
+    return properties(node, "ActiveState")[0]
+
+
+def pid(node: Node) -> int:
+    return int(properties(node, "MainPID")[0])
+
+
+def restarts(node: Node) -> int:
+    """How often systemd has started the daemon again by itself."""
+    return int(properties(node, "NRestarts")[0])
+
+
+def starts(node: Node) -> int:
+    return int(node.run("journalctl --unit=ternhad --output=cat | grep --count '^Started ' || true"))
+
+
+def ends(node: Node) -> list[str]:
+    """How the daemon's main process has ended, each time that systemd calls a failure."""
+    lines = node.run("journalctl --unit=ternhad --output=cat | grep 'Main process exited' || true").splitlines()
+    return [line.partition("exited, ")[2] for line in lines]
+
+
+def override(node: Node, *settings: str):
+    """Puts settings of the service above those of its unit, or takes them away again."""
+    lines = "\\n".join(["[Service]", *settings])
+    edit = f"mkdir -p {Path(DROP_IN).parent} && printf '{lines}\\n' >{DROP_IN}" if settings else f"rm -f {DROP_IN}"
+    node.run(f"{edit} && systemctl daemon-reload")
+
+
+def times_dead(node: Node) -> int:
+    """How often the node has declared its peer dead."""
+    return sum(line.endswith("Remote server status changed to dead") for line in node.full_log())

@@ -1,0 +1,102 @@
+"""Scenes of the daemon as a service, on whatever nodes."""
+
+import time
+
+import service
+from checks import Checks
+
+RETURN_LIMIT = 30  # seconds until everything is well again
+STOP_LIMIT = 10
+ABORTED = "code=killed, status=6/ABRT"
+HOSTNAME_FILE = "/tmp/.ha.hostname.original"
+
+
+def kill(lab, checks: Checks, well: dict):
+    checks.scene("The daemon of node-b is killed")
+    times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
+    lab.b.run("systemctl kill --signal=KILL ternhad")
+    check_restarted(lab, checks, [*ends, "code=killed, status=9/KILL"], well)
+    checks.equal("node-a has never said dead", times_dead, service.times_dead(lab.a))
+
+
+def unknown_request(lab, checks: Checks, well: dict):
+    checks.scene("node-a sends node-b a request that does not exist")
+    times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
+    send(lab, "no_such_request")
+    check_restarted(lab, checks, [*ends, ABORTED], well)
+    checks.equal("node-a has never said dead", times_dead, service.times_dead(lab.a))
+
+
+def hung_thread(lab, checks: Checks, well: dict):
+    checks.scene("A thread of node-b's daemon hangs")
+    ends = service.ends(lab.b)
+    service.override(lab.b, "WatchdogSec=10")
+    lab.b.run(f"systemctl restart ternhad && mv -f {HOSTNAME_FILE} /run/hostname 2>/dev/null; mkfifo {HOSTNAME_FILE}")
+    checks.within(RETURN_LIMIT, "both are well again", lab.statuses, [well] * 2)
+    send(lab, "remote_hostname")  # the reply waits for somebody who writes into the file
+    checks.within(RETURN_LIMIT, "node-a says dead", lab.a.status, {"isRemoteAlive": False})
+    lab.b.run(f"rm {HOSTNAME_FILE}; mv /run/hostname {HOSTNAME_FILE} 2>/dev/null || true")
+    check_restarted(lab, checks, [*ends, ABORTED], well)
+    watchdog = lab.b.run("journalctl --unit=ternhad --output=cat | grep -c 'Watchdog timeout'").strip()
+    checks.equal("by the watchdog", "1", watchdog)
+    service.override(lab.b)
+
+
+def reload(lab, checks: Checks):
+    checks.scene("The service is reloaded")
+    before = lab.b.log()
+    pid = service.pid(lab.b)
+    archive = "/var/log/ha/ha.daemon.log.0.xz"
+    lab.b.run("systemctl reload ternhad")
+    checks.within(RETURN_LIMIT, "the log is moved and archived",
+                  lambda: lab.b.run(f"xz --decompress --stdout {archive} 2>&1").splitlines()[: len(before)], before)
+    checks.equal("by the same daemon", pid, service.pid(lab.b))
+
+
+def stop(lab, checks: Checks, well: dict):
+    checks.scene("The service is stopped")
+    before = lab.b.log()
+    begin = time.monotonic()
+    lab.b.run("systemctl stop ternhad")
+    took = time.monotonic() - begin
+    checks.that(f"it has stopped within its time ({took:.1f} s)", took < STOP_LIMIT, f"less than {STOP_LIMIT} s", took)
+    checks.equal("in order", ["inactive", "success"], service.properties(lab.b, "ActiveState", "Result"))
+    on_disk = lab.b.run("cat /var/log/ha/ha.daemon.log").splitlines()
+    checks.equal("its log is on the disk", before, on_disk[: len(before)])
+    checks.equal("and nowhere else", "", lab.b.run("cat /tmp/ha/ha.daemon.log 2>/dev/null || true"))
+    lab.b.run("systemctl start ternhad")
+    checks.within(RETURN_LIMIT, "started again: both are well", lab.statuses, [well] * 2)
+
+
+def upgrade(lab, checks: Checks, well: dict, packages: str):
+    checks.scene("Rolling upgrade: node-a, then node-b")
+    times_dead = [service.times_dead(node) for node in lab.nodes]
+    for node in lab.nodes:
+        configuration = node.run(f"cat {service.FILE}")
+        starts, version = service.starts(node), installed_version(node)
+        node.run(f"apt-get install --quiet --yes {packages}/*.deb", 300)
+        checks.that(f"{node} has another version", installed_version(node) != version, f"not {version}", version)
+        checks.equal("its edited configuration is kept", configuration, node.run(f"cat {service.FILE}"))
+        checks.equal("the daemon was started once again", starts + 1, service.starts(node))
+        checks.within(RETURN_LIMIT, "both are well again", lab.statuses, [well] * 2)
+    checks.equal("neither node has said dead", times_dead, [service.times_dead(node) for node in lab.nodes])
+
+
+def installed_version(node) -> str:
+    return node.run("dpkg-query --show --showformat='${Version}' ternhad")
+
+
+def send(lab, request: str):
+    """A datagram from node-a to the port of node-b."""
+    lab.a.run(f"bash -c 'printf {request} >/dev/udp/{lab.b.address}/7499'")
+
+
+def check_restarted(lab, checks: Checks, ends: list[str], well: dict):
+    """The daemon of node-b ends in the last of these ways, or has done so, and another is at work."""
+    checks.within(
+        RETURN_LIMIT,
+        f"it ends ({ends[-1].rpartition('/')[2]}) and another is started",
+        lambda: (service.ends(lab.b), service.state(lab.b)),
+        (ends, "active"),
+    )
+    checks.within(RETURN_LIMIT, "both are well again", lab.statuses, [well] * 2)
