@@ -38,6 +38,8 @@ constexpr int REBOOT_ROUNDS = 30;  // a second each
 constexpr std::size_t LINE_SIZE = 512;
 using Line = std::array<char, LINE_SIZE>;
 
+const char* const PS_ARGV[] = {"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args", nullptr};
+
 // The paths that match a pattern, sorted.
 class Glob {
  public:
@@ -474,8 +476,7 @@ void recordCMD(const char* const* argv) {
 }
 
 void recordPS() {
-    const char* const argv[] = {"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args", nullptr};
-    recordCMD(static_cast<const char* const*>(argv));
+    recordCMD(static_cast<const char* const*>(PS_ARGV));
 }
 
 void recordDF() {
