@@ -59,6 +59,7 @@ class DaemonLog {
 
  private:
     std::string _formatedTime() const;
+    // Frozen: docs/compatibility.md#inverted-results
     bool _xz(const std::string& path) const;                             ///< true when it failed
     bool _rename(const std::string& from, const std::string& to) const;  ///< true when it failed
 

@@ -81,6 +81,7 @@ class CheckerRegister {
         if (CheckerFactory::opMap == nullptr) {
             CheckerFactory::opMap = new std::map<std::string, EnvCheck* (*)()>;
         }
+        // Frozen: docs/compatibility.md#first-factory-wins
         CheckerFactory::opMap->emplace(name, &createEnvCheckT<T>);
     }
 };

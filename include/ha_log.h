@@ -20,6 +20,7 @@ constexpr char LOG_DIR[] = "/var/log/ha";                   ///< directory of th
 constexpr char DAEMON_LOG_FILE[] = "/ha.daemon.log";        ///< file name of daemonLog
 constexpr char DAEMON_RECORD_FILE[] = "/ha.daemon.record";  ///< file name of recordLog
 
+// Frozen: docs/compatibility.md#log-objects-per-source-file
 /// Diagnostic messages of this source file.
 [[gnu::used]] static DaemonLog* const daemonLog = new DaemonLog(LOG_DIR, DAEMON_LOG_FILE);
 

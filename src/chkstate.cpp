@@ -40,6 +40,7 @@ HASocketComm::HASocketComm(const std::string& ip)
     : sockFd(socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0)), peerAddr(), recvTimeout(), hasError(sockFd < 0) {
     peerAddr.sin_family = AF_INET;
     peerAddr.sin_port = htons(HA_PEER_PORT);
+    // Frozen: docs/compatibility.md#unparsable-address
     inet_pton(AF_INET, ip.c_str(), &peerAddr.sin_addr);
     if (hasError) {
         const int error = errno;
@@ -99,6 +100,7 @@ HASocketCommClient::HASocketCommClient(const std::string& ip, unsigned int timeo
 
 int HASocketCommClient::Recv(std::string& out) {
     Message message = {};
+    // Frozen: docs/compatibility.md#any-sender
     const ssize_t received = recvfrom(sockFd, message.data(), message.size() - 1, 0, nullptr, nullptr);
     return takeMessage(received, message, out);
 }

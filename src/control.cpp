@@ -40,6 +40,7 @@ bool MonitordSocket::serverHandle(const Json::Value& request, Json::Value& reply
         return false;
     }
     const std::string action = readString(request[ACTION]).value_or("");
+    // Frozen: docs/compatibility.md#first-character
     switch (action.c_str()[0]) {
         case 'R':
             if (!RebootRemote()(*_status)) {

@@ -84,6 +84,7 @@ DaemonLog::DaemonLog(std::string directory, std::string fileName)
     }
 }
 
+// Frozen: docs/compatibility.md#log-without-lock
 void DaemonLog::set(const std::string& text) {
     const Lock lock(_mutex, std::chrono::seconds(_lockTimeout));
     const std::string line = _formatedTime() + ' ' + text + '\n';
@@ -101,6 +102,7 @@ void DaemonLog::writeLogToDisk() {
         moveLines(buffer, log);
     }
     // Right after the last read: what others append in between is lost.
+    // Frozen: docs/compatibility.md#emptied-buffer
     const File emptied(_bufferPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC);
 }
 
@@ -108,6 +110,7 @@ void DaemonLog::rotate() {
     const Lock lock(_mutex, std::chrono::seconds(_lockTimeout));
     for (const std::string& file : _rotateFiles) {
         if (access(file.c_str(), F_OK) == 0) {
+            // Frozen: docs/compatibility.md#unchecked-rotation
             _xz(file);
         }
     }

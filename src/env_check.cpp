@@ -31,6 +31,7 @@ struct PeerServer {
     int error;
 };
 
+// Frozen: docs/compatibility.md#no-virtual-destructor
 struct CheckDeleter {
     void operator()(EnvCheck* check) const {
 // Checks have neither members nor destructors, so that this is sound without a virtual one.
@@ -53,6 +54,7 @@ bool EnvCheck::operator()(Json::Value&) {
     return true;
 }
 
+// Frozen: docs/compatibility.md#undefine
 std::string EnvCheck::handle(TERN::HA::Daemon::Status&) {
     return "Undefine";
 }
@@ -67,6 +69,7 @@ bool EnvCheck::_sendToRemote(std::string& reply) try {
         HA_LOG("Failed to start socket client");
         return false;
     }
+    // Frozen: docs/compatibility.md#unchecked-send
     client.Send(getType());  // a failure shows as a missing answer
     return client.Recv(reply) >= 0;
 } catch (const std::bad_alloc&) {
@@ -74,8 +77,10 @@ bool EnvCheck::_sendToRemote(std::string& reply) try {
 }
 
 bool SocketServer::operator()(TERN::HA::Daemon::Status& status) try {
+    // Frozen: docs/compatibility.md#server-not-rebuilt
     static PeerServer server;
     if (server.socket.HasError()) {
+        // Frozen: docs/compatibility.md#glued-error-text
         HA_LOG(std::string("Failed to start socket server") + std::strerror(server.error));
         return false;
     }
@@ -88,6 +93,7 @@ bool SocketServer::operator()(TERN::HA::Daemon::Status& status) try {
     }
     const auto entry = CheckerFactory::opMap->find(request);
     if (entry == CheckerFactory::opMap->end()) {
+        // Frozen: docs/compatibility.md#unknown-request-aborts
         std::abort();
     }
     const std::unique_ptr<EnvCheck, CheckDeleter> check(entry->second());

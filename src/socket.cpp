@@ -27,6 +27,7 @@ constexpr std::size_t PATH_LIMIT = sizeof(sockaddr_un::sun_path) - 1;
 struct Address {
     explicit Address(const std::string& path) : name() {
         name.sun_family = AF_UNIX;
+        // Frozen: docs/compatibility.md#cut-path
         const std::size_t length = path.copy(static_cast<char*>(name.sun_path), PATH_LIMIT);
         size = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + length);
     }
@@ -119,6 +120,7 @@ bool DaemonLocalSocket::serverBind() {
 
 bool DaemonLocalSocket::serverListen() {
     if (_hasError) {
+        // Frozen: docs/compatibility.md#shared-error-text
         syslog(LOG_ERR, "%s:%d Failed to send content: has error", __FILE_NAME__, __LINE__);
         return false;
     }

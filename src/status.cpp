@@ -14,6 +14,7 @@ using Lock = std::unique_lock<std::timed_mutex>;
 
 // The lock may not be owned; callers proceed anyway. The wait is on the monotonic clock: a deadline on the
 // wall clock would move when that is set, by any amount when it is set back during the wait.
+// Frozen: docs/compatibility.md#status-without-lock
 Lock lockFor(std::timed_mutex& mutex, std::int32_t timeout) {
     return {mutex, std::chrono::steady_clock::now() + std::chrono::seconds(timeout)};
 }
@@ -43,6 +44,7 @@ Status::Status()
       isRemoteDiskErrHandling(false),
       isMDResync(false),
       isDiskErrHandling(false),
+      // Frozen: docs/compatibility.md#drbd-starts-connected
       isDRBDConnect(true),
       heartbeatPacketFailRate(0),
       heartbeatLatency(0),
@@ -83,6 +85,7 @@ bool Status::setRemoteAlive(bool alive) {
     }
     if (alive) {
         addRemoteNodeState(NodeAlive);
+        // Frozen: docs/compatibility.md#pending-reboot-survives
         if (isRemoteNodeState(NodeRebooting)) {
             delRemoteNodeState(NodeRebooting);
         }

@@ -32,9 +32,11 @@ Json::Value readDiskTable() {
 std::string readableName(const std::string& position, const std::string& container) {
     const std::size_t dash = position.find('-');
     if (dash == std::string::npos) {
+        // Frozen: docs/compatibility.md#two-spellings-of-disk
         return "Disk " + position;
     }
     const std::string slot = "disk " + position.substr(dash + 1);
+    // Frozen: docs/compatibility.md#empty-brackets
     return position.substr(0, dash) == "0" ? slot : slot + "(" + container + ")";
 }
 
@@ -73,6 +75,7 @@ std::vector<std::string> devListToHumanReadable(const std::vector<std::string>& 
     std::vector<std::string> names;
     for (const std::string& device : devices) {
         for (const Disk& disk : disks) {
+            // Frozen: docs/compatibility.md#dropped-devices
             if (disk.device == device) {
                 names.push_back(disk.name);
             }
