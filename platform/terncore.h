@@ -1,7 +1,7 @@
 #pragma once
 
-#include <stdbool.h>
-#include <stdio.h>
+#include <stdbool.h>  // NOLINT(modernize-deprecated-headers): for C, too
+#include <stdio.h>    // NOLINT(modernize-deprecated-headers)
 
 // The appliance's core platform library, as far as this project calls it. libterncore.so.6 implements it:
 // on the appliance the maker's own, elsewhere the stand-in beside this file.
