@@ -92,7 +92,7 @@ std::vector<Operation> localChecks() {
          {{"glob", {{"no", {line("checker.cpp", "Failed to set globBuf from /sys/block/md*")}}}},
           {"open",
            {{"no", {line("checker.cpp", "Failed to open sysfs file /sys/block/md0/md/sync_action")}}}},
-          {"read", {{"no"}}},
+          {"read", {{"no"}, {"yes"}}},
           {"close", {{"yes"}}}}},
         {"isDiskErrHandling",
          [] {
@@ -111,7 +111,7 @@ std::vector<Operation> localChecks() {
           {"open",
            {{"no 0",
              {line("checker.cpp", "Failed to open sysfs file /sys/class/ata_port/ata1/error_handling")}}}},
-          {"read", {{"no 0"}}},
+          {"read", {{"no 0"}, {"yes 1"}}},
           {"close", {{"yes 1"}}}}},
         {"devListToHumanReadable",
          [] { test::writeFile("/tmp/ha/info_hd.remote", R"({"3":{"HD_DEVNAME":"sda"}})"); },
