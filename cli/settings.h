@@ -14,9 +14,9 @@ struct Settings {
     Json json = Json::None;
     double watchInterval = 0;  // seconds, 0: once
     bool isConfirmed = false;
-    bool isSelfOnly = false;               // check: this node only
-    std::string output;                    // a file; empty: standard output
-    std::string condition;                 // that `wait` waits for
+    bool isSelfOnly = false;          // check: this node only
+    std::string output;               // a file; empty: standard output
+    std::string condition;            // that `wait` waits for
     std::optional<double> waitLimit;  // seconds; none: for ever
 };
 
