@@ -6,12 +6,15 @@ using TERN::HA::Daemon::NodeAlive;
 using TERN::HA::Daemon::NodeRebooting;
 
 void Health::setPeerAlive(bool isAlive) noexcept {
+    // Also when it was alive before: a peer that did not obey the order counts as rebooting, too.
+    if (isAlive && (_status.getRemoteNodeState() & NodeRebooting) != 0) {
+        _status.delRemoteNodeState(NodeRebooting);
+    }
     if (isAlive == isPeerAlive()) {
         return;
     }
     if (isAlive) {
         _status.addRemoteNodeState(NodeAlive);
-        _status.delRemoteNodeState(NodeRebooting);
         _peerAppeared.set();
     } else {
         _status.delRemoteNodeState(NodeAlive);
