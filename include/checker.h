@@ -221,8 +221,9 @@ void recordDF();
 void recordMemoryInfo();
 
 /// Return this node's own host name, as it was before the HA package took over the shared name: the bytes of
-/// /tmp/.ha.hostname.original, a trailing newline included. Returns the empty string while that file is
-/// missing or empty. A name once read is kept for the life of the process. Thread-safe; blocks for the
+/// /tmp/.ha.hostname.original, at most 4096 and a trailing newline included. Returns the empty string while
+/// that file is missing or empty, or is not a regular file of root or this process's user; a symbolic link is
+/// not followed. A name once read is kept for the life of the process. Thread-safe; blocks for the
 /// reading of a small file.
 std::string getLocalHostname();
 

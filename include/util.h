@@ -21,9 +21,9 @@ std::string getHAHostname();
 ///
 /// The table of disks is read from /tmp/ha/info_hd.remote on every call. Returns the names in the order of
 /// `devices`; a device without an entry is left out, one with two entries yields two names. Returns `devices`
-/// unchanged when the table is missing, empty or unusable; one that exists but cannot be opened or parsed
-/// also logs "Failed to read HD info json: " and its path. Blocks for the reading of a small file.
-/// Thread-safe.
+/// unchanged when the table is missing, empty or unusable; one that exists but cannot be opened or parsed,
+/// is larger than 1 MiB or is no regular file also logs "Failed to read HD
+/// info json: " and its path. Blocks for the reading of a small file. Thread-safe.
 std::vector<std::string> devListToHumanReadable(const std::vector<std::string>& devices);
 
 }  // namespace TERN::HA::Daemon::Util

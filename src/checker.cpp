@@ -33,6 +33,8 @@ constexpr char NOT_RESYNC[] = "not_resync";
 constexpr char DISK_ERR_FLAG[] = "isDiskErrHandling";
 constexpr char DISK_ERR_LIST[] = "errHandlingDisk";
 
+constexpr std::size_t HOSTNAME_LIMIT = 4096;
+
 constexpr int REBOOT_ROUNDS = 30;  // a second each
 
 constexpr std::size_t LINE_SIZE = 512;
@@ -517,7 +519,7 @@ std::string getLocalHostname() {
     const std::lock_guard<std::mutex> lock(mutex);
     if (cache.empty()) {
         std::string content;
-        readFile("/tmp/.ha.hostname.original", content);
+        readSmallFile("/tmp/.ha.hostname.original", HOSTNAME_LIMIT, Owner::trusted, content);
         cache.swap(content);  // the whole name or none, also when memory runs out
     }
     return cache;

@@ -1,7 +1,9 @@
 #include "file.h"
 
+#include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 
@@ -32,19 +34,48 @@ bool File::write(const char* data, std::size_t size) const {
     return true;
 }
 
+bool File::isRegular() const {
+    struct stat info = {};
+    return fstat(_fd, &info) == 0 && S_ISREG(info.st_mode);
+}
+
+bool File::isTrusted() const {
+    struct stat info = {};
+    return fstat(_fd, &info) == 0 && (info.st_uid == 0 || info.st_uid == geteuid());
+}
+
+namespace {
+
+void readAll(const File& file, std::size_t limit, std::string& content) {
+    char buffer[BUFSIZ];
+    while (content.size() < limit) {
+        const ssize_t count = file.read(buffer, std::min(sizeof buffer, limit - content.size()));
+        if (count <= 0) {
+            return;
+        }
+        content.append(buffer, static_cast<std::size_t>(count));
+    }
+}
+
+}  // namespace
+
 bool readFile(const char* path, std::string& content) {
     const File file(path, O_RDONLY);
     if (!file.isOpen()) {
         return false;
     }
-    char buffer[BUFSIZ];
-    while (true) {
-        const ssize_t count = file.read(buffer, sizeof buffer);
-        if (count <= 0) {
-            return true;
-        }
-        content.append(buffer, static_cast<std::size_t>(count));
+    readAll(file, std::string::npos, content);
+    return true;
+}
+
+bool readSmallFile(const char* path, std::size_t limit, Owner owner, std::string& content) {
+    const bool mustBeTrusted = owner == Owner::trusted;
+    const File file(path, O_RDONLY | O_NONBLOCK | (mustBeTrusted ? O_NOFOLLOW : 0));
+    if (!file.isOpen() || !file.isRegular() || (mustBeTrusted && !file.isTrusted())) {
+        return false;
     }
+    readAll(file, limit, content);
+    return true;
 }
 
 }  // namespace TERN::HA::Daemon

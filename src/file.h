@@ -27,11 +27,23 @@ class File {
     // Writes all of `data`: one write(2), more only where the kernel took part of it. False on failure.
     bool write(const char* data, std::size_t size) const;
 
+    // A regular file; of root or of this process's user.
+    bool isRegular() const;
+    bool isTrusted() const;
+
  private:
     int _fd;
 };
 
 // Appends the bytes of the file at `path`, best effort, to `content`. False when it cannot be opened.
 bool readFile(const char* path, std::string& content);
+
+enum class Owner { any, trusted };
+
+// The same for a path where something else than a small file may stand. Opens without waiting, and takes at
+// most `limit` bytes. False, too, for what is no regular file. Owner::trusted: where other users can write to
+// the directory; false, too, for a symbolic link and for what belongs neither to root nor to this process's
+// user.
+bool readSmallFile(const char* path, std::size_t limit, Owner owner, std::string& content);
 
 }  // namespace TERN::HA::Daemon

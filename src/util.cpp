@@ -14,6 +14,7 @@ namespace {
 
 constexpr char PACKAGE_CONFIG[] = "/usr/tern/etc/packages/FailoverPair/ha.conf";
 constexpr char DISK_TABLE[] = "/tmp/ha/info_hd.remote";
+constexpr std::size_t DISK_TABLE_LIMIT = 1048576;
 
 // The peer's disks, a JSON object by position; null when there is none.
 Json::Value readDiskTable() {
@@ -22,7 +23,9 @@ Json::Value readDiskTable() {
         return table;
     }
     std::string text;
-    if (!readFile(DISK_TABLE, text) || !parseJson(text, table)) {
+    const bool isRead =
+        readSmallFile(DISK_TABLE, DISK_TABLE_LIMIT + 1, Owner::any, text) && text.size() <= DISK_TABLE_LIMIT;
+    if (!isRead || !parseJson(text, table)) {
         HA_LOG(std::string("Failed to read HD info json: ") + DISK_TABLE);
     }
     return table.isObject() ? table : Json::Value();

@@ -1,5 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include "support/files.h"
 #include "support/sandbox.h"
@@ -68,6 +69,29 @@ TEST_F(DiskNamesTest, ATableThatCannotBeReadLeavesALine) {
     EXPECT_THAT(
         test::daemonLogMessages(),
         ElementsAre(test::LogLine("util.cpp", "Failed to read HD info json: /tmp/ha/info_hd.remote")));
+}
+
+// What cannot be a table.
+class StrangeTableTest : public DiskNamesTest {
+ protected:
+    static void expectUseless() {
+        EXPECT_THAT(devListToHumanReadable({"sda"}), ElementsAre("sda"));
+        EXPECT_THAT(
+            test::daemonLogMessages(),
+            ElementsAre(test::LogLine("util.cpp", "Failed to read HD info json: /tmp/ha/info_hd.remote")));
+    }
+};
+
+TEST_F(StrangeTableTest, AFifoIsNotWaitedFor) {
+    ASSERT_EQ(mkfifo(TABLE, 0600), 0);
+    expectUseless();
+}
+
+TEST_F(StrangeTableTest, AMebibyteIsTheLimit) {
+    const std::string table = THREE_DISKS;
+    EXPECT_THAT(names(table + std::string(1048576 - table.size(), ' '), {"sda"}), ElementsAre("Disk 1"));
+    test::writeFile(TABLE, table + std::string(1048577 - table.size(), ' '));
+    expectUseless();
 }
 
 TEST_F(DiskNamesTest, AnEnclosureWithoutANameKeepsItsBrackets) {
