@@ -9,6 +9,7 @@
 #include <iostream>
 
 #include "ha_log.h"
+#include "printable.h"
 
 namespace ternhad {
 
@@ -35,6 +36,8 @@ bool makeDirectory(const std::string& path) {
     return true;
 }
 
+// Whether nobody else can have put anything into the directory. What others left in it before it became this
+// user's could lead astray whoever opens it.
 bool isOurs(const char* path) {
     struct stat info = {};
     if (lstat(path, &info) != 0) {
@@ -52,10 +55,29 @@ bool isOurs(const char* path) {
     return true;
 }
 
+bool hasOnlyOurFiles(const char* path) {
+    std::error_code error;
+    for (const auto& entry : std::filesystem::directory_iterator(path, error)) {
+        const std::string name = path + ("/" + printable(entry.path().filename()));
+        struct stat info = {};
+        if (lstat(entry.path().c_str(), &info) != 0) {
+            continue;  // it has gone
+        }
+        if (!S_ISREG(info.st_mode) && !S_ISDIR(info.st_mode)) {
+            return complain(name, "neither a file nor a directory");
+        }
+        if (info.st_uid != geteuid()) {
+            return complain(name, "belongs to another user");
+        }
+    }
+    return !error || complain(path, error.message());
+}
+
 }  // namespace
 
 bool prepareDirectories(const char* socketPath) {
-    return makeDirectory(BUFFER_DIR) && isOurs(BUFFER_DIR) && makeDirectory(TERN::HA::Daemon::LOG_DIR) &&
+    return makeDirectory(BUFFER_DIR) && isOurs(BUFFER_DIR) && hasOnlyOurFiles(BUFFER_DIR) &&
+           makeDirectory(TERN::HA::Daemon::LOG_DIR) &&
            makeDirectory(std::filesystem::path(socketPath).parent_path());
 }
 

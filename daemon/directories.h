@@ -3,8 +3,9 @@
 namespace ternhad {
 
 // Makes the directories that the library writes to and that of the control socket (`socketPath`), mode 0700,
-// where they are missing. /tmp/ha must be a real directory of this user that nobody else can write to:
-// anybody can put something of that name into /tmp. Returns false after a message on standard error.
+// where they are missing. /tmp/ha must be a real directory of this user that nobody else can write to,
+// with nothing in it but this user's files: anybody can put something of that name into /tmp. Returns false
+// after a message on standard error.
 bool prepareDirectories(const char* socketPath);
 
 }  // namespace ternhad

@@ -1,10 +1,18 @@
 #include "options.h"
 
 #include <arpa/inet.h>
+#include <ifaddrs.h>
 #include <net/if.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
 #include <sys/un.h>
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
+#include <iostream>
+#include <memory>
+
+#include "printable.h"
 
 namespace ternhad {
 
@@ -16,7 +24,34 @@ constexpr double DAY = 86400;
 // As the library reads it: text that is no address to it, such as 010.0.0.1, would count as 0.0.0.0.
 std::string checkAddress(const std::string& text) {
     in_addr address = {};
-    return inet_pton(AF_INET, text.c_str(), &address) == 1 ? "" : "not an IPv4 address: " + text;
+    if (inet_pton(AF_INET, text.c_str(), &address) != 1) {
+        return "not an IPv4 address: " + text;
+    }
+    const in_addr_t value = ntohl(address.s_addr);
+    if (value == INADDR_ANY || IN_MULTICAST(value) || value == INADDR_BROADCAST) {
+        return "not the address of one node: " + text;
+    }
+    return {};
+}
+
+// The interfaces that have `address` as the broadcast address of their network reach more than one node by
+// it.
+bool isBroadcast(const std::string& address) {
+    in_addr wanted = {};
+    inet_pton(AF_INET, address.c_str(), &wanted);
+    ifaddrs* list = nullptr;
+    if (getifaddrs(&list) != 0) {
+        return false;
+    }
+    const std::unique_ptr<ifaddrs, decltype(&freeifaddrs)> owner(list, freeifaddrs);
+    for (const ifaddrs* entry = list; entry != nullptr; entry = entry->ifa_next) {
+        const auto* broadcast = reinterpret_cast<const sockaddr_in*>(entry->ifa_broadaddr);
+        if ((entry->ifa_flags & IFF_BROADCAST) != 0 && broadcast != nullptr &&
+            broadcast->sin_family == AF_INET && broadcast->sin_addr.s_addr == wanted.s_addr) {
+            return true;
+        }
+    }
+    return false;
 }
 
 // A path that is bound as it is: neither relative to wherever the process stands nor cut.
@@ -31,8 +66,9 @@ std::string checkSocketPath(const std::string& path) {
 }
 
 std::string checkInterfaceName(const std::string& name) {
-    if (name.empty() || name.size() >= IF_NAMESIZE || name.find_first_of("/ \t") != std::string::npos) {
-        return "not the name of a network interface: " + name;
+    if (name.empty() || name.size() >= IF_NAMESIZE ||
+        !std::all_of(name.begin(), name.end(), [](char c) { return c > ' ' && c < 0x7f && c != '/'; })) {
+        return "not the name of a network interface: " + printable(name);
     }
     return {};
 }
@@ -102,11 +138,18 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
         if (options.localIp == options.remoteIp) {
             throw CLI::ValidationError("--remote-ip", "the same address as --local-ip");
         }
+        if (isBroadcast(options.remoteIp)) {
+            throw CLI::ValidationError("--remote-ip",
+                                       "the broadcast address of a network: " + options.remoteIp);
+        }
         if (options.checkInterval * 3 > options.deadAfter) {
             throw CLI::ValidationError("--check-interval", "above a third of --dead-after");
         }
     } catch (const CLI::ParseError& error) {
         return app.exit(error) == 0 ? 0 : WRONG_USAGE;
+    }
+    if (if_nametoindex(options.interface.c_str()) == 0) {
+        std::cerr << "ternhad: warning: there is no network interface " << options.interface << " (yet)\n";
     }
     return std::nullopt;
 }

@@ -127,6 +127,42 @@ TEST_F(DaemonTest, RefusesABufferDirectoryThatOthersCanWriteTo) {
     expectRefusal("others can write to it");
 }
 
+TEST_F(DaemonTest, RefusesABufferDirectoryWithALinkInIt) {
+    test::makeDirectories("/tmp/ha");
+    ASSERT_EQ(chmod("/tmp/ha", 0700), 0);
+    test::writeFile("/tmp/secret", "kept");
+    std::filesystem::create_symlink("/tmp/secret", "/tmp/ha/ha.daemon.log");
+    const auto result = test::run(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_EQ(result.error, "ternhad: /tmp/ha/ha.daemon.log: neither a file nor a directory\n");
+    EXPECT_EQ(test::readFile("/tmp/secret"), "kept");
+}
+
+TEST_F(DaemonTest, RefusesABufferDirectoryWithAFifoInIt) {
+    test::makeDirectories("/tmp/ha");
+    ASSERT_EQ(chmod("/tmp/ha", 0700), 0);
+    ASSERT_EQ(mkfifo("/tmp/ha/ha.daemon.record", 0600), 0);
+    const auto result = test::run(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_EQ(result.error, "ternhad: /tmp/ha/ha.daemon.record: neither a file nor a directory\n");
+}
+
+TEST_F(DaemonTest, UsesABufferDirectoryOfItsOwn) {
+    test::makeDirectories("/tmp/ha");
+    ASSERT_EQ(chmod("/tmp/ha", 0700), 0);
+    test::writeFile("/tmp/ha/info_hd.remote", "{}");
+    auto daemon = startAndWait();
+    stop(daemon);
+    EXPECT_EQ(test::readFile("/tmp/ha/info_hd.remote"), "{}");
+}
+
+TEST_F(DaemonTest, WarnsOfAnInterfaceThatDoesNotExist) {
+    test::Process daemon(test::daemonArguments("127.0.0.1", "127.0.0.2", "eth9"));
+    EXPECT_TRUE(test::eventually(10s, isUp)) << daemon.error();
+    EXPECT_EQ(daemon.error(), "ternhad: warning: there is no network interface eth9 (yet)\n");
+    stop(daemon);
+}
+
 // Connects as another user. Returns 0, the error number, or -1 in a sandbox that knows no other user.
 int connectAsAnotherUser() {
     int error = -1;

@@ -62,6 +62,18 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{"AddressWithALeadingZero",
                    {"--local-ip", "127.0.0.1", "--remote-ip", "127.0.0.02", "--interface", "lo"},
                    "--remote-ip: not an IPv4 address: 127.0.0.02"},
+        WrongUsage{"AnyAddress",
+                   {"--local-ip", "0.0.0.0", "--remote-ip", "127.0.0.2", "--interface", "lo"},
+                   "--local-ip: not the address of one node: 0.0.0.0"},
+        WrongUsage{"MulticastAddress",
+                   {"--local-ip", "127.0.0.1", "--remote-ip", "224.0.0.18", "--interface", "lo"},
+                   "--remote-ip: not the address of one node: 224.0.0.18"},
+        WrongUsage{"BroadcastAddress",
+                   {"--local-ip", "127.0.0.1", "--remote-ip", "255.255.255.255", "--interface", "lo"},
+                   "--remote-ip: not the address of one node: 255.255.255.255"},
+        WrongUsage{"InterfaceWithAControlCharacter",
+                   {"--local-ip", "127.0.0.1", "--remote-ip", "127.0.0.2", "--interface", "l\x1bo"},
+                   "--interface: not the name of a network interface: l?o"},
         WrongUsage{"SameAddresses",
                    {"--local-ip", "127.0.0.1", "--remote-ip", "127.0.0.1", "--interface", "lo"},
                    "--remote-ip: the same address as --local-ip"},
@@ -91,6 +103,16 @@ TEST_F(OptionsTest, AnUnknownKeyInTheConfigurationIsAnError) {
     EXPECT_EQ(result.exitCode, 2);
     EXPECT_THAT(result.error, HasSubstr("frobnicate"));
     EXPECT_FALSE(test::exists("/tmp/ha"));
+}
+
+TEST_F(OptionsTest, TheBroadcastAddressOfAnInterfaceIsNoPeer) {
+    ASSERT_EQ(test::run({"ip", "link", "add", "eth1", "type", "veth", "peer", "name", "eth2"}).exitCode, 0);
+    ASSERT_EQ(test::run({"ip", "address", "add", "10.5.0.1/24", "broadcast", "+", "dev", "eth1"}).exitCode,
+              0);
+    const auto result =
+        ternhad({"--local-ip", "10.5.0.1", "--remote-ip", "10.5.0.255", "--interface", "eth1"});
+    EXPECT_EQ(result.exitCode, 2);
+    EXPECT_THAT(result.error, HasSubstr("--remote-ip: the broadcast address of a network: 10.5.0.255"));
 }
 
 TEST_F(OptionsTest, HelpAndVersionAreNoErrors) {
