@@ -20,6 +20,7 @@ namespace {
 
 constexpr int WRONG_USAGE = 2;
 constexpr double DAY = 86400;
+constexpr Seconds ROUNDING = std::chrono::nanoseconds(1);  // three times 0.2 is more than 0.6
 
 // As the library reads it: text that is no address to it, such as 010.0.0.1, would count as 0.0.0.0.
 std::string checkAddress(const std::string& text) {
@@ -142,7 +143,7 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
             throw CLI::ValidationError("--remote-ip",
                                        "the broadcast address of a network: " + options.remoteIp);
         }
-        if (options.checkInterval * 3 > options.deadAfter) {
+        if (options.checkInterval * 3 > options.deadAfter + ROUNDING) {
             throw CLI::ValidationError("--check-interval", "above a third of --dead-after");
         }
     } catch (const CLI::ParseError& error) {

@@ -10,10 +10,36 @@
 
 namespace ternhad {
 
+using TERN::HA::Daemon::IsRemoteDiskErrHandling;
+using TERN::HA::Daemon::IsRemoteMDResync;
+
 namespace {
 
 // A request that took as long as this got no reply, whatever its result. The library waits for 3 seconds.
 constexpr auto REPLY_LIMIT = std::chrono::milliseconds(2900);
+
+// Whether the last request of this thread had a socket to go out by. A check has no data members.
+thread_local bool isSent = false;
+
+// The library's check of the same type. It asks for the type once it has a socket: without one, the check's
+// result is this node's trouble and tells nothing about the peer.
+template <typename Check>
+class Observed : public Check {
+ public:
+    std::string getType() override {
+        isSent = true;
+        return Check::getType();
+    }
+};
+
+// Runs `request`. True when it got a reply.
+template <typename Request>
+bool exchange(const Request& request) {
+    isSent = false;
+    const auto start = Clock::now();
+    request();
+    return isSent && Clock::now() - start < REPLY_LIMIT;
+}
 
 }  // namespace
 
@@ -39,9 +65,9 @@ void PeerWatcher::run() {
 void PeerWatcher::requestDisks() {
     const Json::Value unread("unread");
     Json::Value disks = unread;
-    const auto start = Clock::now();
-    const bool isHandling = TERN::HA::Daemon::IsRemoteDiskErrHandling()(disks);
-    if (_shutdown.isRequested() || Clock::now() - start >= REPLY_LIMIT) {
+    bool isHandling = false;
+    const bool hasReply = exchange([&] { isHandling = Observed<IsRemoteDiskErrHandling>()(disks); });
+    if (_shutdown.isRequested() || !hasReply) {
         return;
     }
     const bool isRead = disks != unread;
@@ -53,13 +79,12 @@ void PeerWatcher::requestDisks() {
 }
 
 void PeerWatcher::requestResync() {
-    const auto start = Clock::now();
-    const bool isResync = TERN::HA::Daemon::IsRemoteMDResync()();
-    if (_shutdown.isRequested() || Clock::now() - start >= REPLY_LIMIT) {
+    bool isResync = false;
+    const bool hasReply = exchange([&] { isResync = Observed<IsRemoteMDResync>()(); });
+    if (_shutdown.isRequested() || !hasReply) {
         return;
     }
-    // A request that could not be sent and "no resync" look alike: the end is believed when it is reported
-    // twice.
+    // A reply that says nothing and "no resync" look alike: the end is believed when it is reported twice.
     _health.set(Flag::peerResync, isResync || _wasResync);
     _wasResync = isResync;
 }

@@ -1,0 +1,32 @@
+#include <dlfcn.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+// Preloaded into a daemon: while a file of this name exists, the call fails or does not return.
+
+namespace {
+
+bool exists(const char* path) {
+    return access(path, F_OK) == 0;
+}
+
+}  // namespace
+
+extern "C" ssize_t sendto(int fd, const void* data, size_t size, int flags, const sockaddr* address,
+                          socklen_t length) {
+    if (exists("/tmp/no-buffers")) {
+        errno = ENOBUFS;
+        return -1;
+    }
+    using Function = ssize_t (*)(int, const void*, size_t, int, const sockaddr*, socklen_t);
+    static const auto next = reinterpret_cast<Function>(dlsym(RTLD_NEXT, "sendto"));
+    return next(fd, data, size, flags, address, length);
+}
+
+extern "C" void sync() noexcept {
+    while (exists("/tmp/hanging-sync")) {
+        usleep(10000);
+    }
+}

@@ -1,0 +1,277 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+
+#include <algorithm>
+#include <atomic>
+#include <filesystem>
+#include <thread>
+
+#include "support/udp.h"
+#include "ternhad/daemon.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::HasSubstr;
+using ::testing::Not;
+
+constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";
+constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
+constexpr char TRIGGER[] = "/proc/sysrq-trigger";
+
+// A peer at 127.0.0.2 that replies to everything for as long as it lives.
+class Peer {
+ public:
+    Peer() : _thread([this] { run(); }) {}
+    ~Peer() { end(); }
+
+    Peer(const Peer&) = delete;
+    Peer& operator=(const Peer&) = delete;
+
+    void end() {
+        _isOver = true;
+        if (_thread.joinable()) {
+            _thread.join();
+        }
+    }
+
+ private:
+    void run() {
+        test::UdpSocket socket("127.0.0.2", 7499);
+        while (!_isOver) {
+            if (const auto request = socket.receive(10ms)) {
+                const std::string reply = request->bytes == "is_alive" ? "alive"
+                                          : request->bytes == "is_disk_err_handling"
+                                              ? R"({"errHandlingDisk":[],"isDiskErrHandling":false})"
+                                              : "not_resync";
+                socket.send(reply, request->address, request->port);
+            }
+        }
+    }
+
+    std::atomic<bool> _isOver{false};
+    std::thread _thread;
+};
+
+// Makes every open of this file for writing hang, as on a disk that hangs. Until release().
+void hang(const char* file) {
+    test::removeTree(file);
+    ASSERT_EQ(mkfifo(file, 0600), 0);
+}
+
+// A daemon on 127.0.0.1, on a machine that gets sick while its peer at 127.0.0.2 is well.
+class SickMachineTest : public ::testing::Test {
+ protected:
+    void SetUp() override {
+        test::writeFile(TRIGGER, "");
+        test::makeDirectories("/var/log/ha");
+    }
+
+    void start(const std::vector<std::string>& more = {}) {
+        std::vector<std::string> command = {"/usr/bin/env", std::string("LD_PRELOAD=") + SICK_MACHINE};
+        const auto arguments = test::daemonArguments("127.0.0.1", "127.0.0.2", "lo", more);
+        command.insert(command.end(), arguments.begin(), arguments.end());
+        daemon.emplace(command);
+        ASSERT_TRUE(test::eventually(20s, [] { return isPeerAlive(); })) << daemon->error();
+    }
+
+    static bool isPeerAlive() { return test::statusAt()["isRemoteAlive"].asBool(); }
+
+    // The daemon's replies to a request from another address of this machine.
+    static bool replies(const std::string& request) {
+        test::UdpSocket asker("127.0.0.4");
+        asker.send(request, "127.0.0.1", 7499);
+        return asker.receive(2s).has_value();
+    }
+
+    static void orderReboot() { test::UdpSocket("127.0.0.4").send("reboot_remote", "127.0.0.1", 7499); }
+
+    static bool isRebooted() { return test::readFile(TRIGGER) == "b"; }
+
+    void expectEndInTime(std::chrono::milliseconds limit = 2s) {
+        const test::Stopwatch stopwatch;
+        daemon->signal(SIGTERM);
+        const auto status = daemon->waitFor(20s);
+        ASSERT_TRUE(status.has_value());
+        EXPECT_EQ(*status, 0);
+        EXPECT_LT(stopwatch.elapsed(), limit);
+    }
+
+    Peer peer;
+    std::optional<test::Process> daemon;
+};
+
+TEST_F(SickMachineTest, LackOfDescriptorsIsNeitherThePeersDeathNorItsDiskErrors) {
+    start();
+    int highest = 0;
+    for (const auto& entry :
+         std::filesystem::directory_iterator("/proc/" + std::to_string(daemon->pid()) + "/fd")) {
+        highest = std::max(highest, std::stoi(entry.path().filename()));
+    }
+    rlimit usual = {};
+    ASSERT_EQ(prlimit(daemon->pid(), RLIMIT_NOFILE, nullptr, &usual), 0);
+    const rlimit none = {static_cast<rlim_t>(highest) + 1, usual.rlim_max};
+    ASSERT_EQ(prlimit(daemon->pid(), RLIMIT_NOFILE, &none, nullptr), 0);
+    EXPECT_FALSE(test::eventually(6s, [] {
+        const std::string log = test::wholeLog();
+        return log.find("changed to dead") != std::string::npos;
+    }));
+    ASSERT_EQ(prlimit(daemon->pid(), RLIMIT_NOFILE, &usual, nullptr), 0);
+    EXPECT_TRUE(test::eventually(20s, [] { return isPeerAlive(); }));
+    EXPECT_FALSE(test::statusAt()["isRemoteDiskErrHandling"].asBool());
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, ProbesThatCannotLeaveAreLoggedOnceAndAreNotThePeersDeath) {
+    start({"--dead-after", "0.6"});
+    test::writeFile("/tmp/no-buffers", "");
+    EXPECT_TRUE(test::eventually(20s, [] {
+        return test::wholeLog().find("Cannot send liveness probes: No buffer space available\n") !=
+               std::string::npos;
+    }));
+    EXPECT_FALSE(test::eventually(3s, [] { return !isPeerAlive(); }));
+    test::removeTree("/tmp/no-buffers");
+    EXPECT_TRUE(test::eventually(
+        20s, [] { return test::wholeLog().find("Can again send liveness probes\n") != std::string::npos; }));
+    const std::string log = test::wholeLog();
+    EXPECT_EQ(log.find("Cannot send"), log.rfind("Cannot send"));
+    EXPECT_THAT(log, Not(HasSubstr("changed to dead")));
+    peer.end();
+    EXPECT_TRUE(test::eventually(20s, [] { return !isPeerAlive(); }));
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, AFifoForTheHostNameHangsNobody) {
+    ASSERT_EQ(mkfifo("/tmp/.ha.hostname.original", 0600), 0);
+    start();
+    EXPECT_TRUE(replies("remote_hostname"));
+    EXPECT_TRUE(replies("is_alive"));
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, AHangingBufferDelaysNoChangeOfState) {
+    start();
+    hang(BUFFER);
+    peer.end();
+    EXPECT_TRUE(test::eventually(6s, [] { return !isPeerAlive(); }));
+    EXPECT_TRUE(replies("is_alive"));
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, AHangingBufferHindersNoReboot) {
+    start();
+    hang(BUFFER);
+    orderReboot();
+    EXPECT_TRUE(test::eventually(20s, isRebooted));
+}
+
+TEST_F(SickMachineTest, AHangingLogDiskHindersNoReboot) {
+    start();
+    hang(LOG);
+    orderReboot();
+    EXPECT_TRUE(test::eventually(20s, isRebooted));
+    EXPECT_TRUE(replies("is_alive"));
+}
+
+TEST_F(SickMachineTest, AHangingSyncHindersNoReboot) {
+    start();
+    test::writeFile("/tmp/hanging-sync", "");
+    orderReboot();
+    EXPECT_TRUE(test::eventually(20s, isRebooted));
+}
+
+TEST_F(SickMachineTest, ARebootThatIsNotHinderedDoesNotWait) {
+    start();
+    const test::Stopwatch stopwatch;
+    orderReboot();
+    EXPECT_TRUE(test::eventually(4s, isRebooted)) << "the deadline is for what hangs";
+}
+
+TEST_F(SickMachineTest, AnOrderThatTheKernelDoesNotTakeIsAnswered) {
+    test::removeTree(TRIGGER);
+    test::makeDirectories(TRIGGER);
+    start();
+    EXPECT_TRUE(replies("reboot_remote"));
+    EXPECT_TRUE(test::eventually(10s, [] {
+        return test::wholeLog().find("Cannot reboot at the peer's order: Is a directory") !=
+               std::string::npos;
+    }));
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, AHangingLogDiskDelaysNeitherTheEndNorARestart) {
+    start({"--log-interval", "0.1"});
+    hang(LOG);
+    EXPECT_FALSE(test::eventually(1s, [] { return !isPeerAlive(); }));
+    expectEndInTime();
+    start();
+    EXPECT_TRUE(replies("is_alive"));
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, ACompressionThatHangsDoesNotDelayTheEndAndLosesNoLine) {
+    test::replaceProgram("/bin/xz", ": > /tmp/compressing; exec sleep 60");
+    start();
+    daemon->signal(SIGHUP);
+    ASSERT_TRUE(test::eventually(20s, [] { return test::exists("/tmp/compressing"); }));
+    expectEndInTime();
+    EXPECT_THAT(test::readFile(LOG), HasSubstr("Stopping"));
+    EXPECT_NE(test::run({"pgrep", "sleep"}).exitCode, 0);
+}
+
+pid_t childOf(pid_t process) {
+    const auto result = test::run({"pgrep", "-P", std::to_string(process), "ternhad"});
+    return result.exitCode == 0 ? std::stoi(result.output) : -1;
+}
+
+TEST_F(SickMachineTest, TheLogKeeperIsStartedAgainWhenItDies) {
+    start({"--log-interval", "3600"});
+    const pid_t keeper = childOf(daemon->pid());
+    ASSERT_GT(keeper, 0);
+    kill(keeper, SIGKILL);
+    ASSERT_TRUE(test::eventually(20s, [&] {
+        const pid_t next = childOf(daemon->pid());
+        return next > 0 && next != keeper;
+    }));
+    daemon->signal(SIGHUP);
+    EXPECT_TRUE(test::eventually(20s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
+    EXPECT_THAT(test::wholeLog() + test::run({"xz", "-dc", "/var/log/ha/ha.daemon.log.0.xz"}).output,
+                HasSubstr("The log keeper has died, another is started"));
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, TheLogKeeperDiesWithTheDaemon) {
+    start();
+    const pid_t keeper = childOf(daemon->pid());
+    ASSERT_GT(keeper, 0);
+    daemon->signal(SIGKILL);
+    EXPECT_TRUE(test::eventually(10s, [&] { return kill(keeper, 0) != 0; }));
+}
+
+TEST_F(SickMachineTest, TheLogKeeperHoldsNoSocket) {
+    start();
+    const pid_t keeper = childOf(daemon->pid());
+    for (const auto& entry : std::filesystem::directory_iterator("/proc/" + std::to_string(keeper) + "/fd")) {
+        std::error_code gone;
+        EXPECT_THAT(std::filesystem::read_symlink(entry.path(), gone).string(), Not(HasSubstr("socket:")));
+    }
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, AStoppedDaemonDoesNotDeclareThePeerDead) {
+    start({"--dead-after", "0.6"});
+    for (int i = 0; i < 3; ++i) {
+        daemon->signal(SIGSTOP);
+        std::this_thread::sleep_for(2s);  // what is tried, not what is waited for
+        daemon->signal(SIGCONT);
+        EXPECT_TRUE(test::eventually(20s, isPeerAlive));
+    }
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
+    expectEndInTime();
+}
+
+}  // namespace
