@@ -3,8 +3,8 @@
 #include <string>
 
 #include "checker.h"
-#include "env_check/failing_calls.h"
 #include "env_check/peer.h"
+#include "faults/failing_call.h"
 #include "support/sandbox.h"
 #include "support/wait.h"
 
@@ -60,7 +60,7 @@ TEST_F(AliveTest, ASilentPeerIsNotAliveAfterOneQuestionAndThreeSeconds) {
 TEST_F(AliveTest, WithoutASocketThePeerIsNotAliveAndOnlyTheExchangeLogs) {
     FakePeer peer("alive");
     {
-        const test::FailingCall failing(test::SystemCall::Socket, EMFILE);
+        const test::FailingCall failing("socket", EMFILE);
         EXPECT_FALSE(isRemoteAlive());
     }
     EXPECT_THAT(test::daemonLogMessages(),

@@ -3,8 +3,8 @@
 #include <string>
 
 #include "checker.h"
-#include "env_check/failing_calls.h"
 #include "env_check/peer.h"
+#include "faults/failing_call.h"
 #include "support/files.h"
 #include "support/sandbox.h"
 #include "support/wait.h"
@@ -65,7 +65,7 @@ TEST_F(HostnameTest, ASilentPeerLeavesOneLineInTheLog) {
 TEST_F(HostnameTest, WithoutASocketTheExchangeLogsFirst) {
     FakePeer peer("node-b");
     {
-        const test::FailingCall failing(test::SystemCall::Socket, EMFILE);
+        const test::FailingCall failing("socket", EMFILE);
         EXPECT_FALSE(getRemoteHostname(hostname));
     }
     EXPECT_THAT(test::daemonLogMessages(),

@@ -6,8 +6,8 @@
 #include <vector>
 
 #include "checker.h"
-#include "checker/fast_sleep.h"
 #include "checker/obedient_peer.h"
+#include "faults/clock.h"
 #include "ha_log.h"
 #include "support/files.h"
 #include "support/programs.h"

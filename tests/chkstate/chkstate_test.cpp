@@ -18,8 +18,8 @@
 #include <type_traits>
 #include <utility>
 
-#include "env_check/failing_calls.h"
 #include "env_check/peer.h"
+#include "faults/failing_call.h"
 #include "support/sandbox.h"
 #include "support/system_log.h"
 #include "support/udp.h"
@@ -170,7 +170,7 @@ TEST_F(TransportTest, DescriptorZeroIsOneLikeOthers) {
 TEST_F(TransportTest, WithoutASocketTheSystemLogSaysSoAndEveryCallFails) {
     test::SystemLog log;
     {
-        const test::FailingCall failing(test::SystemCall::Socket, EMFILE);
+        const test::FailingCall failing("socket", EMFILE);
         HASocketCommServer server(kOwnAddress);
         EXPECT_EQ(errno, EMFILE);
         HASocketCommServer serverWithTimeout(kOwnAddress, 1);
@@ -193,7 +193,7 @@ TEST_F(TransportTest, WithoutASocketTheSystemLogSaysSoAndEveryCallFails) {
 
 TEST_F(TransportTest, AnOptionThatCannotBeSetIsAnErrorAndNothingIsBound) {
     test::SystemLog log;
-    const test::FailingCall failing(test::SystemCall::SetSocketOption, EDOM);
+    const test::FailingCall failing("setsockopt", EDOM);
     HASocketCommClient client(kOwnAddress, 1);
     EXPECT_TRUE(client.HasError());
     HASocketCommServer server(kOwnAddress, 1);
@@ -204,7 +204,7 @@ TEST_F(TransportTest, AnOptionThatCannotBeSetIsAnErrorAndNothingIsBound) {
 }
 
 TEST_F(TransportTest, AServerWithoutTimeoutSetsNoOption) {
-    const test::FailingCall failing(test::SystemCall::SetSocketOption, EDOM);
+    const test::FailingCall failing("setsockopt", EDOM);
     HASocketCommServer server(kOwnAddress);
     EXPECT_FALSE(server.HasError());
 }

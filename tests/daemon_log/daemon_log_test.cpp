@@ -12,8 +12,8 @@
 #include <ostream>
 #include <thread>
 
-#include "daemon_log/clock.h"
 #include "daemon_log/other_unit.h"
+#include "faults/clock.h"
 #include "ha_log.h"
 #include "support/files.h"
 #include "support/programs.h"

@@ -5,8 +5,8 @@
 #include <vector>
 
 #include "env_check.h"
-#include "env_check/failing_calls.h"
 #include "env_check/peer.h"
+#include "faults/failing_call.h"
 #include "support/files.h"
 #include "support/programs.h"
 #include "support/sandbox.h"
@@ -130,7 +130,7 @@ TEST_F(ExchangeTest, WithoutASocketNothingIsSentAndTheLogSaysSo) {
     UdpSocket peer(kPeerAddress, kPeerPort);
     remoteIP(kPeerAddress);
     {
-        const test::FailingCall failing(test::SystemCall::Socket, EMFILE);
+        const test::FailingCall failing("socket", EMFILE);
         EXPECT_FALSE(question._sendToRemote(reply));
     }
     EXPECT_EQ(reply, "before");
@@ -144,7 +144,7 @@ TEST_F(ExchangeTest, WithoutATimeoutNothingIsSentAndTheLogSaysSo) {
     UdpSocket peer(kPeerAddress, kPeerPort);
     remoteIP(kPeerAddress);
     {
-        const test::FailingCall failing(test::SystemCall::SetSocketOption, EDOM);
+        const test::FailingCall failing("setsockopt", EDOM);
         EXPECT_FALSE(question._sendToRemote(reply));
     }
     EXPECT_EQ(reply, "before");

@@ -6,8 +6,8 @@
 #include <string>
 
 #include "env_check.h"
-#include "env_check/failing_calls.h"
 #include "env_check/peer.h"
+#include "faults/failing_call.h"
 #include "status.h"
 #include "support/files.h"
 #include "support/sandbox.h"
@@ -89,7 +89,7 @@ TEST_F(ServerStartTest, NoSocketBreaksTheServerAndBothLogsSaySo) {
     test::SystemLog systemLog;
     localIP(kServer);
     {
-        const test::FailingCall failing(test::SystemCall::Socket, EMFILE);
+        const test::FailingCall failing("socket", EMFILE);
         EXPECT_FALSE(server(status));
     }
     test::writeFile("/tmp/ha/ha.daemon.log", "");
@@ -100,7 +100,7 @@ TEST_F(ServerStartTest, NoSocketBreaksTheServerAndBothLogsSaySo) {
 TEST_F(ServerStartTest, NoTimeoutBreaksTheServer) {
     test::SystemLog systemLog;
     localIP(kServer);
-    const test::FailingCall failing(test::SystemCall::SetSocketOption, EDOM);
+    const test::FailingCall failing("setsockopt", EDOM);
     expectBroken("Failed to start socket serverNumerical argument out of domain");
     EXPECT_FALSE(isBound(kServer, kPeerPort));
     EXPECT_THAT(systemLog.texts(), IsEmpty());

@@ -5,31 +5,45 @@
 #include <spawn.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/time.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
+#include <cstring>
+#include <utility>
 
 #include "support/real_function.h"
 
 namespace {
 
+std::atomic<const char*> failingAlways{nullptr};
+std::atomic<int> failureAlways{0};
+std::atomic<int> lastBacklog{-1};
+std::atomic<std::chrono::seconds> lastTimeout{std::chrono::seconds(-1)};
+std::function<void()> afterConnect;
+
 thread_local std::map<std::string, int>* counted = nullptr;
-thread_local const char* failing = nullptr;
+thread_local std::string failing;
 thread_local int countdown = 0;
 thread_local int failure = 0;
 
-// Counts the call, and tells whether it is the one to fail; errno is set then.
+// Counts the call, and tells whether it is one to fail; errno is set then.
 bool fails(const char* function) {
     if (counted != nullptr) {
-        std::map<std::string, int>* const counts = counted;
-        counted = nullptr;  // what the map needs is not the library's
-        ++(*counts)[function];
+        std::map<std::string, int>* const counts = std::exchange(counted, nullptr);
+        ++(*counts)[function];  // what the map needs is not the library's
         counted = counts;
     }
-    if (failing == nullptr || std::string(failing) != function || --countdown != 0) {
+    const char* const always = failingAlways;
+    if (always != nullptr && std::strcmp(always, function) == 0) {
+        errno = failureAlways;
+        return true;
+    }
+    if (failing != function || --countdown != 0) {
         return false;
     }
     errno = failure;
@@ -37,6 +51,62 @@ bool fails(const char* function) {
 }
 
 }  // namespace
+
+// Puts a function in front of the C library's: it fails when `fails(KEY)` says so, and calls the real one
+// otherwise.
+#define INTERPOSE(RESULT, NAME, KEY, FAILURE, PARAMETERS, ARGUMENTS, SPECIFIER) \
+    RESULT NAME PARAMETERS SPECIFIER {                                          \
+        static auto* const real = test::realFunction<RESULT PARAMETERS>(#NAME); \
+        return fails(KEY) ? FAILURE : real ARGUMENTS;                           \
+    }
+
+// clang-format off
+INTERPOSE(ssize_t, read, "read", -1, (int fd, void* data, size_t size), (fd, data, size), )
+INTERPOSE(ssize_t, write, "write", -1, (int fd, const void* data, size_t size), (fd, data, size), )
+INTERPOSE(int, socket, "socket", -1, (int domain, int type, int protocol), (domain, type, protocol), noexcept)
+INTERPOSE(int, bind, "bind", -1, (int fd, const sockaddr* address, socklen_t size), (fd, address, size), noexcept)
+INTERPOSE(int, accept4, "accept", -1, (int fd, sockaddr* address, socklen_t* size, int flags),
+          (fd, address, size, flags), )
+INTERPOSE(ssize_t, send, "send", -1, (int fd, const void* data, size_t size, int flags), (fd, data, size, flags), )
+INTERPOSE(ssize_t, recv, "recv", -1, (int fd, void* data, size_t size, int flags), (fd, data, size, flags), )
+INTERPOSE(ssize_t, sendto, "sendto", -1,
+          (int fd, const void* data, size_t size, int flags, const sockaddr* address, socklen_t length),
+          (fd, data, size, flags, address, length), )
+INTERPOSE(ssize_t, recvfrom, "recvfrom", -1,
+          (int fd, void* data, size_t size, int flags, sockaddr* address, socklen_t* length),
+          (fd, data, size, flags, address, length), )
+INTERPOSE(int, unlink, "unlink", -1, (const char* path), (path), noexcept)
+INTERPOSE(int, rename, "rename", -1, (const char* from, const char* to), (from, to), noexcept)
+INTERPOSE(int, access, "access", -1, (const char* path, int mode), (path, mode), noexcept)
+INTERPOSE(int, posix_spawn, "posix_spawn", errno,
+          (pid_t* child, const char* path, const posix_spawn_file_actions_t* actions,
+           const posix_spawnattr_t* attributes, char* const* argv, char* const* envp),
+          (child, path, actions, attributes, argv, envp), )
+INTERPOSE(int, pipe2, "pipe", -1, (int* ends, int flags), (ends, flags), noexcept)
+INTERPOSE(FILE*, fdopen, "fdopen", nullptr, (int fd, const char* mode), (fd, mode), noexcept)
+// clang-format on
+
+// With 64-bit time on 32 bits these have other names.
+
+int setsockopt(int fd, int level, int name, const void* value, socklen_t size) noexcept {
+    static auto* const real =
+        test::realFunction<int(int, int, int, const void*, socklen_t)>("setsockopt", "__setsockopt64");
+    if (level == SOL_SOCKET && name == SO_RCVTIMEO) {
+        lastTimeout = std::chrono::seconds(static_cast<const timeval*>(value)->tv_sec);
+    }
+    return fails("setsockopt") ? -1 : real(fd, level, name, value, size);
+}
+
+int glob64(const char* pattern, int flags, int (*onError)(const char*, int), glob64_t* matches) {
+    static auto* const real = test::realFunction<int(const char*, int, int (*)(const char*, int), glob64_t*)>(
+        "glob64", "__glob64_time64");
+    return fails("glob") ? GLOB_NOSPACE : real(pattern, flags, onError, matches);
+}
+
+int stat(const char* path, struct stat* info) noexcept {
+    static auto* const real = test::realFunction<int(const char*, struct stat*)>("stat64", "__stat64_time64");
+    return fails("stat") ? -1 : real(path, info);
+}
 
 // Opened for the library with a mode only where it is made.
 int open64(const char* path, int flags, ...) {
@@ -48,108 +118,10 @@ int open64(const char* path, int flags, ...) {
     return fails("open") ? -1 : real(path, flags, mode);
 }
 
-ssize_t read(int fd, void* buffer, std::size_t size) {
-    static auto* const real = test::realFunction<ssize_t(int, void*, std::size_t)>("read");
-    return fails("read") ? -1 : real(fd, buffer, size);
-}
-
-ssize_t write(int fd, const void* data, std::size_t size) {
-    static auto* const real = test::realFunction<ssize_t(int, const void*, std::size_t)>("write");
-    return fails("write") ? -1 : real(fd, data, size);
-}
-
 int close(int fd) {
     static auto* const real = test::realFunction<int(int)>("close");
     const int result = real(fd);  // closed all the same, as by the kernel
     return fails("close") ? -1 : result;
-}
-
-int socket(int domain, int type, int protocol) noexcept {
-    static auto* const real = test::realFunction<int(int, int, int)>("socket");
-    return fails("socket") ? -1 : real(domain, type, protocol);
-}
-
-int bind(int fd, const sockaddr* address, socklen_t length) noexcept {
-    static auto* const real = test::realFunction<int(int, const sockaddr*, socklen_t)>("bind");
-    return fails("bind") ? -1 : real(fd, address, length);
-}
-
-int listen(int fd, int backlog) noexcept {
-    static auto* const real = test::realFunction<int(int, int)>("listen");
-    return fails("listen") ? -1 : real(fd, backlog);
-}
-
-int connect(int fd, const sockaddr* address, socklen_t length) {
-    static auto* const real = test::realFunction<int(int, const sockaddr*, socklen_t)>("connect");
-    return fails("connect") ? -1 : real(fd, address, length);
-}
-
-int accept4(int fd, sockaddr* address, socklen_t* length, int flags) {
-    static auto* const real = test::realFunction<int(int, sockaddr*, socklen_t*, int)>("accept4");
-    return fails("accept") ? -1 : real(fd, address, length, flags);
-}
-
-int setsockopt(int fd, int level, int name, const void* value, socklen_t length) noexcept {
-    static auto* const real =
-        test::realFunction<int(int, int, int, const void*, socklen_t)>("setsockopt", "__setsockopt64");
-    return fails("setsockopt") ? -1 : real(fd, level, name, value, length);
-}
-
-ssize_t send(int fd, const void* data, std::size_t size, int flags) {
-    static auto* const real = test::realFunction<ssize_t(int, const void*, std::size_t, int)>("send");
-    return fails("send") ? -1 : real(fd, data, size, flags);
-}
-
-ssize_t recv(int fd, void* buffer, std::size_t size, int flags) {
-    static auto* const real = test::realFunction<ssize_t(int, void*, std::size_t, int)>("recv");
-    return fails("recv") ? -1 : real(fd, buffer, size, flags);
-}
-
-ssize_t sendto(int fd, const void* data, std::size_t size, int flags, const sockaddr* address,
-               socklen_t length) {
-    static auto* const real =
-        test::realFunction<ssize_t(int, const void*, std::size_t, int, const sockaddr*, socklen_t)>("sendto");
-    return fails("sendto") ? -1 : real(fd, data, size, flags, address, length);
-}
-
-ssize_t recvfrom(int fd, void* buffer, std::size_t size, int flags, sockaddr* address, socklen_t* length) {
-    static auto* const real =
-        test::realFunction<ssize_t(int, void*, std::size_t, int, sockaddr*, socklen_t*)>("recvfrom");
-    return fails("recvfrom") ? -1 : real(fd, buffer, size, flags, address, length);
-}
-
-int unlink(const char* path) noexcept {
-    static auto* const real = test::realFunction<int(const char*)>("unlink");
-    return fails("unlink") ? -1 : real(path);
-}
-
-int rename(const char* from, const char* to) noexcept {
-    static auto* const real = test::realFunction<int(const char*, const char*)>("rename");
-    return fails("rename") ? -1 : real(from, to);
-}
-
-int access(const char* path, int mode) noexcept {
-    static auto* const real = test::realFunction<int(const char*, int)>("access");
-    return fails("access") ? -1 : real(path, mode);
-}
-
-int stat(const char* path, struct stat* info) noexcept {
-    static auto* const real = test::realFunction<int(const char*, struct stat*)>("stat64", "__stat64_time64");
-    return fails("stat") ? -1 : real(path, info);
-}
-
-int glob64(const char* pattern, int flags, int (*onError)(const char*, int), glob64_t* matches) {
-    static auto* const real = test::realFunction<int(const char*, int, int (*)(const char*, int), glob64_t*)>(
-        "glob64", "__glob64_time64");
-    return fails("glob") ? GLOB_NOSPACE : real(pattern, flags, onError, matches);
-}
-
-int posix_spawn(pid_t* child, const char* path, const posix_spawn_file_actions_t* actions,
-                const posix_spawnattr_t* attributes, char* const argv[], char* const envp[]) {
-    static auto* const real =
-        test::realFunction<int(pid_t*, const char*, const posix_spawn_file_actions_t*,
-                               const posix_spawnattr_t*, char* const[], char* const[])>("posix_spawn");
-    return fails("posix_spawn") ? failure : real(child, path, actions, attributes, argv, envp);
 }
 
 pid_t waitpid(pid_t child, int* status, int options) {
@@ -158,14 +130,21 @@ pid_t waitpid(pid_t child, int* status, int options) {
     return fails("waitpid") ? -1 : result;
 }
 
-int pipe2(int* ends, int flags) noexcept {
-    static auto* const real = test::realFunction<int(int*, int)>("pipe2");
-    return fails("pipe") ? -1 : real(ends, flags);
+int listen(int fd, int backlog) noexcept {
+    static auto* const real = test::realFunction<int(int, int)>("listen");
+    lastBacklog = backlog;
+    return fails("listen") ? -1 : real(fd, backlog);
 }
 
-FILE* fdopen(int fd, const char* mode) noexcept {
-    static auto* const real = test::realFunction<FILE*(int, const char*)>("fdopen");
-    return fails("fdopen") ? nullptr : real(fd, mode);
+int connect(int fd, const sockaddr* address, socklen_t size) {
+    static auto* const real = test::realFunction<int(int, const sockaddr*, socklen_t)>("connect");
+    const int result = fails("connect") ? -1 : real(fd, address, size);
+    if (afterConnect) {
+        const int error = errno;
+        afterConnect();
+        errno = error;
+    }
+    return result;
 }
 
 namespace test {
@@ -175,28 +154,47 @@ CallCounter::CallCounter() {
 }
 
 CallCounter::~CallCounter() {
-    delete counted;
-    counted = nullptr;
+    delete std::exchange(counted, nullptr);
 }
 
 std::map<std::string, int> CallCounter::counts() const {
     return *counted;
 }
 
+FailingCall::FailingCall(const char* function, int error) {
+    failureAlways = error;
+    failingAlways = function;
+}
+
 FailingCall::FailingCall(const std::string& function, int number, int error) {
-    static thread_local std::string name;
-    name = function;
     countdown = number;
     failure = error;
-    failing = name.c_str();
+    failing = function;
 }
 
 FailingCall::~FailingCall() {
-    failing = nullptr;
+    failingAlways = nullptr;
+    failing.clear();
 }
 
 bool FailingCall::hasFailed() const {
     return countdown <= 0;
+}
+
+int backlog() {
+    return lastBacklog;
+}
+
+std::chrono::seconds receiveTimeout() {
+    return lastTimeout;
+}
+
+ConnectHook::ConnectHook(std::function<void()> onConnect) {
+    afterConnect = std::move(onConnect);
+}
+
+ConnectHook::~ConnectHook() {
+    afterConnect = nullptr;
 }
 
 }  // namespace test

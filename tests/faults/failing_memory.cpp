@@ -1,6 +1,7 @@
 #include "faults/failing_memory.h"
 
 #include <dlfcn.h>
+#include <unistd.h>
 
 #include <cstdlib>
 #include <cstring>
@@ -12,8 +13,12 @@ namespace {
 
 thread_local int countdown = 0;
 
+// For a program that this is preloaded into: there is no memory while the file of this name exists.
+const char* const EXHAUSTED_WHILE = std::getenv("NO_MEMORY_WHILE");
+
 bool fails() {
-    return countdown > 0 && --countdown == 0;
+    return (countdown > 0 && --countdown == 0) ||
+           (EXHAUSTED_WHILE != nullptr && access(EXHAUSTED_WHILE, F_OK) == 0);
 }
 
 }  // namespace
@@ -21,10 +26,7 @@ bool fails() {
 // Taken by every library of the process before those of the standard library, whose other forms call these.
 
 void* operator new(std::size_t size) {
-    if (fails()) {
-        throw std::bad_alloc();
-    }
-    void* const memory = std::malloc(size == 0 ? 1 : size);
+    void* const memory = fails() ? nullptr : std::malloc(size == 0 ? 1 : size);
     if (memory == nullptr) {
         throw std::bad_alloc();
     }

@@ -4,9 +4,9 @@
 
 #include <csignal>
 #include <optional>
+#include <regex>
 
 #include "support/node.h"
-#include "support/pattern.h"
 #include "support/udp.h"
 #include "ternhad/daemon.h"
 
@@ -120,9 +120,10 @@ class FilterTest : public ::testing::Test {
                 {"sh", "-c", std::string("echo 0 > /proc/sys/net/ipv4/conf/") + interface + "/rp_filter"}));
         }
         const auto link = node.run({"ip", "-o", "link", "show", "eth2"});
-        const auto found = test::Pattern("link/ether ([0-9a-f:]+)").find(link.output);
-        EXPECT_FALSE(found.empty()) << link.output;
-        succeed(third.run({"ip", "neighbour", "replace", "10.0.0.1", "lladdr", found.at(1), "dev", "eth2"}));
+        std::smatch found;
+        EXPECT_TRUE(std::regex_search(link.output, found, std::regex("link/ether ([0-9a-f:]+)")))
+            << link.output;
+        succeed(third.run({"ip", "neighbour", "replace", "10.0.0.1", "lladdr", found[1], "dev", "eth2"}));
 
         test::writeFile(node.path(CONFIG),
                         "local-ip = \"10.0.0.1\"\nremote-ip = 10.0.0.2\ninterface = eth1\n"
@@ -171,8 +172,10 @@ class FilterTest : public ::testing::Test {
 
     std::string dropped() {
         const auto rules = node.run({"nft", "list", "table", "inet", "ternha"});
-        const auto found = test::Pattern("counter packets ([0-9]+) bytes [0-9]+ drop").find(rules.output);
-        return found.empty() ? "no rule in " + rules.output + rules.error : found[1];
+        std::smatch found;
+        const std::regex counter("counter packets ([0-9]+) bytes [0-9]+ drop");
+        return std::regex_search(rules.output, found, counter) ? found[1].str()
+                                                               : "no rule in " + rules.output + rules.error;
     }
 
     bool haveDropped(const std::string& count) {

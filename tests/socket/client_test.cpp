@@ -4,7 +4,7 @@
 #include <optional>
 #include <thread>
 
-#include "socket/failing_calls.h"
+#include "faults/failing_call.h"
 #include "socket/local_sockets.h"
 #include "socket/socket_test.h"
 #include "support/wait.h"
@@ -71,7 +71,7 @@ TEST_F(ClientSocketTest, WithoutAServerTwoLinesSaySo) {
 
 TEST_F(ClientSocketTest, ATimeoutThatCannotBeSetTwoLinesSaySo) {
     HandlerSocket client({}, test::LOCAL_SOCKET, 5);
-    const test::FailingSocketCalls failing(EDOM);
+    const test::FailingCall failing("setsockopt", EDOM);
     EXPECT_FALSE(client.clientSend(request, reply));
     EXPECT_TRUE(client.hasError());
     EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp", "Failed to set socket timeout"),
@@ -107,7 +107,7 @@ class NoTimeoutTest : public ClientSocketTest, public ::testing::WithParamInterf
 
 TEST_P(NoTimeoutTest, WaitsForEver) {
     test::HandlerSocket client({}, "/tmp/nowhere", GetParam());
-    const test::FailingSocketCalls failing(EDOM);  // no time-out is set at all
+    const test::FailingCall failing("setsockopt", EDOM);  // no time-out is set at all
     EXPECT_FALSE(client.clientSend(request, reply));
     EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to connect socket /tmp/nowhere: "),
                                          HasSubstr(" Failed to connect socket server: ")));

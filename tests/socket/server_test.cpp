@@ -15,7 +15,7 @@
 #include <thread>
 #include <vector>
 
-#include "socket/failing_calls.h"
+#include "faults/failing_call.h"
 #include "socket/local_sockets.h"
 #include "socket/socket_test.h"
 #include "support/case_name.h"
@@ -408,7 +408,7 @@ TEST_F(ServerSocketTest, APathThatCannotBeBoundIsAnErrorForGood) {
 TEST_F(ServerSocketTest, AFailureToListenIsAnErrorForGood) {
     HandlerSocket server(echo);
     {
-        const test::FailingSocketCalls failing(EADDRINUSE);
+        const test::FailingCall failing("listen", EADDRINUSE);
         EXPECT_FALSE(server.serverBind());
     }
     EXPECT_TRUE(server.hasError());
@@ -421,7 +421,7 @@ TEST_F(ServerSocketTest, AFailureToListenIsAnErrorForGood) {
 TEST_F(ServerSocketTest, WithoutADescriptorThereIsNoSocket) {
     std::optional<HandlerSocket> server;
     {
-        const test::FailingSocketCalls failing(EMFILE);
+        const test::FailingCall failing("socket", EMFILE);
         server.emplace(echo);
     }
     EXPECT_TRUE(server->hasError());

@@ -5,8 +5,8 @@
 #include <future>
 #include <thread>
 
+#include "faults/clock.h"
 #include "status.h"
-#include "status/stepped_clock.h"
 #include "support/sandbox.h"
 #include "support/wait.h"
 

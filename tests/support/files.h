@@ -3,8 +3,7 @@
 #include <string>
 #include <vector>
 
-/// Files of the sandbox. Paths are absolute; failures throw std::system_error or
-/// std::filesystem::filesystem_error; outside the sandbox every operation ends the process.
+/// Files of the sandbox. Paths are absolute; failures throw std::system_error.
 namespace test {
 
 /// Replaces the content of `path`; missing parent directories are made.
@@ -13,7 +12,7 @@ void writeFile(const std::string& path, const std::string& text);
 /// Adds to the end of `path`; the file and its parent directories are made when missing.
 void appendFile(const std::string& path, const std::string& text);
 
-/// The whole content, byte for byte. Throws when the file cannot be read.
+/// The whole content, byte for byte.
 std::string readFile(const std::string& path);
 
 /// Whether there is a file of any kind; a dangling link counts.

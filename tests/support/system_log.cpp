@@ -1,37 +1,28 @@
 #include "support/system_log.h"
 
 #include <poll.h>
-#include <sys/eventfd.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
-#include <cstdint>
-#include <mutex>
+#include <regex>
 #include <stdexcept>
-#include <thread>
 
-#include "support/descriptor.h"
-#include "support/pattern.h"
-#include "support/sandbox_check.h"
 #include "support/wait.h"
 
 namespace test {
 namespace {
 
 SystemLog::Entry parseEntry(std::string datagram) {
-    while (!datagram.empty() && datagram.back() == '\0') {
-        datagram.pop_back();
-    }
+    datagram.erase(datagram.find_last_not_of('\0') + 1);
     // "<11>Nov 20 22:00:00 ident: text"; the text may have several lines.
-    static const Pattern kHeader(
-        "^<([0-9]+)>[A-Z][a-z]{2} [ 0-9][0-9] [0-9]{2}:[0-9]{2}:[0-9]{2} ([^ :]+): ");
-    const std::vector<std::string> header = kHeader.find(datagram);
-    if (header.empty()) {
+    static const std::regex HEADER("^<(\\d+)>[A-Z][a-z]{2} [ \\d]\\d \\d\\d:\\d\\d:\\d\\d ([^ :]+): ");
+    std::smatch header;
+    if (!std::regex_search(datagram, header, HEADER)) {
         return {-1, "", datagram};
     }
-    return {std::stoi(header[1]), header[2], datagram.substr(header[0].size())};
+    return {std::stoi(header[1]), header[2], header.suffix()};
 }
 
 Descriptor boundSocket(const std::string& path) {
@@ -41,8 +32,7 @@ Descriptor boundSocket(const std::string& path) {
         throw std::invalid_argument("too long for a socket: " + path);
     }
     path.copy(address.sun_path, path.size());
-    Descriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0),
-                      "cannot make a socket");
+    Descriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0), "cannot make a socket");
     unlink(path.c_str());
     if (bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == -1) {
         throw std::system_error(errno, std::generic_category(), "cannot bind " + path);
@@ -53,55 +43,32 @@ Descriptor boundSocket(const std::string& path) {
 
 }  // namespace
 
-struct SystemLog::Receiver {
-    explicit Receiver(const std::string& logPath)
-        : path(logPath), socket(boundSocket(logPath)), stop(eventfd(0, EFD_CLOEXEC), "cannot make an event") {
-        thread = std::thread([this] { receive(); });
-    }
-
-    ~Receiver() {
-        eventfd_write(stop.get(), 1);
-        thread.join();
-        unlink(path.c_str());
-    }
-
-    // Under the lock, so that nothing is between the socket and the entries while somebody looks.
-    std::vector<Entry> drained() {
-        const std::lock_guard lock(mutex);
-        char datagram[16384];
-        ssize_t length = 0;
-        while ((length = recv(socket.get(), datagram, sizeof datagram, 0)) >= 0) {
-            entries.push_back(parseEntry({datagram, static_cast<size_t>(length)}));
-        }
-        return entries;
-    }
-
-    void receive() {
-        pollfd waited[] = {{socket.get(), POLLIN, 0}, {stop.get(), POLLIN, 0}};
-        while (waited[1].revents == 0) {
-            if (poll(waited, std::size(waited), -1) > 0 && waited[0].revents != 0) {
-                drained();
+SystemLog::SystemLog(const std::string& path) : _path(path), _socket(boundSocket(path)) {
+    _receiver = std::thread([this] {
+        pollfd waited{_socket.get(), POLLIN, 0};
+        while (!_isStopping) {
+            if (poll(&waited, 1, 10) > 0) {
+                entries();
             }
         }
-    }
-
-    std::string path;
-    Descriptor socket;
-    Descriptor stop;
-    std::mutex mutex;
-    std::vector<Entry> entries;
-    std::thread thread;
-};
-
-SystemLog::SystemLog(const std::string& path) {
-    requireSandbox();
-    receiver_ = std::make_unique<Receiver>(path);
+    });
 }
 
-SystemLog::~SystemLog() = default;
+SystemLog::~SystemLog() {
+    _isStopping = true;
+    _receiver.join();
+    unlink(_path.c_str());
+}
 
+// Received under the lock, so that nothing is between the socket and the entries while somebody looks.
 std::vector<SystemLog::Entry> SystemLog::entries() {
-    return receiver_->drained();
+    const std::lock_guard lock(_mutex);
+    char datagram[16384];
+    ssize_t length = 0;
+    while ((length = recv(_socket.get(), datagram, sizeof datagram, MSG_DONTWAIT)) >= 0) {
+        _entries.push_back(parseEntry({datagram, static_cast<std::size_t>(length)}));
+    }
+    return _entries;
 }
 
 std::vector<std::string> SystemLog::texts() {
@@ -112,7 +79,7 @@ std::vector<std::string> SystemLog::texts() {
     return texts;
 }
 
-bool SystemLog::waitFor(size_t count, std::chrono::milliseconds deadline) {
+bool SystemLog::waitFor(std::size_t count, std::chrono::milliseconds deadline) {
     return eventually(deadline, [&] { return entries().size() >= count; });
 }
 

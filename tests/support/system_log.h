@@ -1,9 +1,13 @@
 #pragma once
 
+#include <atomic>
 #include <chrono>
-#include <memory>
+#include <mutex>
 #include <string>
+#include <thread>
 #include <vector>
+
+#include "support/descriptor.h"
 
 namespace test {
 
@@ -31,11 +35,15 @@ class SystemLog {
     std::vector<std::string> texts();
 
     /// Waits until there are at least `count` entries; returns whether there are.
-    bool waitFor(size_t count, std::chrono::milliseconds deadline = std::chrono::seconds(10));
+    bool waitFor(std::size_t count, std::chrono::milliseconds deadline = std::chrono::seconds(10));
 
  private:
-    struct Receiver;
-    std::unique_ptr<Receiver> receiver_;
+    std::string _path;
+    Descriptor _socket;
+    std::mutex _mutex;
+    std::vector<Entry> _entries;
+    std::atomic<bool> _isStopping{false};
+    std::thread _receiver;
 };
 
 }  // namespace test

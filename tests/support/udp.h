@@ -29,7 +29,7 @@ class UdpSocket {
     std::optional<Datagram> receive(std::chrono::milliseconds deadline);
 
  private:
-    Descriptor socket_;
+    Descriptor _socket;
 };
 
 }  // namespace test

@@ -9,13 +9,13 @@ namespace test {
 /// Returns whether it held; it is asked at least once.
 template <typename Predicate>
 bool eventually(std::chrono::milliseconds deadline, Predicate&& predicate) {
-    constexpr std::chrono::milliseconds kInterval{3};
+    constexpr std::chrono::milliseconds INTERVAL{3};
     const auto end = std::chrono::steady_clock::now() + deadline;
     while (!predicate()) {
         if (std::chrono::steady_clock::now() >= end) {
             return false;
         }
-        std::this_thread::sleep_for(kInterval);
+        std::this_thread::sleep_for(INTERVAL);
     }
     return true;
 }
@@ -23,10 +23,10 @@ bool eventually(std::chrono::milliseconds deadline, Predicate&& predicate) {
 /// Measures on the monotonic clock from its construction on.
 class Stopwatch {
  public:
-    std::chrono::nanoseconds elapsed() const { return std::chrono::steady_clock::now() - start_; }
+    std::chrono::nanoseconds elapsed() const { return std::chrono::steady_clock::now() - _start; }
 
  private:
-    std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
+    std::chrono::steady_clock::time_point _start = std::chrono::steady_clock::now();
 };
 
 }  // namespace test

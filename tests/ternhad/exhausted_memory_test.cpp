@@ -16,7 +16,8 @@ class ExhaustedMemoryTest : public ::testing::Test {
  protected:
     void SetUp() override {
         test::connect(a.node, "10.0.0.1", b.node, "10.0.0.2");
-        std::vector<std::string> command = {"/usr/bin/env", std::string("LD_PRELOAD=") + EXHAUSTED_MEMORY};
+        std::vector<std::string> command = {"/usr/bin/env", "NO_MEMORY_WHILE=/tmp/no-memory",
+                                            std::string("LD_PRELOAD=") + FAILING_MEMORY};
         const auto arguments = test::daemonArguments(a.address, a.peer, "eth1");
         command.insert(command.end(), arguments.begin(), arguments.end());
         a.daemon.emplace(a.node.start(command));

@@ -58,26 +58,6 @@ TEST_F(SupportTest, ReadsTheDaemonLog) {
     EXPECT_THAT("other.cpp: Failed", Not(LogLine("other.cpp", "Failed")));
 }
 
-TEST_F(SupportTest, KnowsTheCallSiteOfAMessage) {
-    const std::string source = readFile(TERNHA_LIBRARY_SOURCES "/checker.cpp");
-    const auto end = source.begin() + static_cast<std::ptrdiff_t>(source.find("\"Failed to get meminfo\""));
-    const auto number = std::count(source.begin(), end, '\n') + 1;
-    const auto message = [](std::ptrdiff_t at, const char* text) {
-        return "checker.cpp:" + std::to_string(at) + " " + text;
-    };
-    EXPECT_TRUE(test::hasCallSite(message(number, "Failed to get meminfo")));
-    EXPECT_FALSE(test::hasCallSite(message(number - 1, "Failed to get meminfo")));
-    EXPECT_FALSE(test::hasCallSite(message(number + 1, "Failed to get meminfo")));
-    EXPECT_FALSE(test::hasCallSite(message(number, "Failed to get memory")));
-    EXPECT_FALSE(test::hasCallSite(message(0, "Failed to get meminfo")));
-    EXPECT_FALSE(test::hasCallSite(message(1000000, "Failed to get meminfo")));
-    EXPECT_TRUE(test::hasCallSite("other.cpp:1 Failed to get meminfo"));
-    EXPECT_THAT(message(number, "Failed to get meminfo"), LogLine("checker.cpp", "Failed to get meminfo"));
-    EXPECT_THAT(message(number + 1, "Failed to get meminfo"),
-                Not(LogLine("checker.cpp", "Failed to get meminfo")));
-    EXPECT_FALSE(test::hasCallSite("Failed to get meminfo"));
-}
-
 TEST_F(SupportTest, NoticesALogLineWithoutATimeStamp) {
     EXPECT_NONFATAL_FAILURE(messages("2026-11-15 09:23:41 checker.cpp:88 text\n"), "no time stamp");
     EXPECT_NONFATAL_FAILURE(messages("2026-11-15T09:23:41+0100 checker.cpp:88 text\n"), "no time stamp");

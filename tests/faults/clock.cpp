@@ -1,19 +1,41 @@
-#include "daemon_log/clock.h"
+#include "faults/clock.h"
+
+#include <sys/syscall.h>
+#include <unistd.h>
 
 #include <atomic>
+#include <utility>
 
 #include "support/real_function.h"
 
 namespace {
 
+#ifdef SYS_clock_gettime64
+constexpr long CLOCK_GETTIME = SYS_clock_gettime64;
+#else
+constexpr long CLOCK_GETTIME = SYS_clock_gettime;
+#endif
+
 std::atomic<std::time_t> fixedTime{0};
+std::atomic<std::time_t> nextStep{0};
 std::atomic<bool> isSleepless{false};
 std::atomic<std::chrono::nanoseconds> slept{std::chrono::nanoseconds(0)};
 std::atomic<int> looks{0};
+std::function<void(int)> hook;
+std::vector<unsigned int> asked;
 
 }  // namespace
 
 // The dynamic linker takes these before those of the C library, for every library of the process.
+
+int clock_gettime(clockid_t clock, timespec* now) noexcept {
+    const int result = static_cast<int>(syscall(CLOCK_GETTIME, clock, now));
+    if (clock == CLOCK_REALTIME) {
+        now->tv_sec -= nextStep.exchange(0);
+    }
+    return result;
+}
+
 std::time_t time(std::time_t* result) noexcept {
     std::time_t now = fixedTime;
     if (now == 0) {
@@ -43,6 +65,16 @@ void tzset() noexcept {
     real();
 }
 
+unsigned int sleep(unsigned int seconds) {
+    static auto* const real = test::realFunction<unsigned int(unsigned int)>("sleep");
+    if (!hook) {
+        return real(seconds);
+    }
+    asked.push_back(seconds);
+    hook(static_cast<int>(asked.size()));
+    return 0;
+}
+
 namespace test {
 
 FixedTime::FixedTime(std::time_t now) {
@@ -51,6 +83,10 @@ FixedTime::FixedTime(std::time_t now) {
 
 FixedTime::~FixedTime() {
     fixedTime = 0;
+}
+
+void stepClockAfterNextLook(std::chrono::seconds step) {
+    nextStep = step.count();
 }
 
 NoSleep::NoSleep() {
@@ -68,6 +104,19 @@ std::chrono::milliseconds NoSleep::total() {
 
 int zoneLooks() {
     return looks;
+}
+
+FastSleep::FastSleep(std::function<void(int)> onSleep) {
+    asked.clear();
+    hook = std::move(onSleep);
+}
+
+FastSleep::~FastSleep() {
+    hook = nullptr;
+}
+
+std::vector<unsigned int> FastSleep::sleeps() {
+    return asked;
 }
 
 }  // namespace test
