@@ -431,6 +431,9 @@ TEST_F(ServerSocketTest, WithoutADescriptorThereIsNoSocket) {
     EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp", "Failed to set socket"),
                                          test::LogLine("socket.cpp", "Failed to send content: has error"),
                                          test::LogLine("socket.cpp", "Failed to send content: has error")));
+    errno = 0;
+    server.reset();
+    EXPECT_EQ(errno, 0);  // there is nothing to close
 }
 
 // ---- Interruptions ----
