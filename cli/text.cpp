@@ -18,7 +18,7 @@ constexpr double DAY = 24 * HOUR;
 std::string formatted(double time, const char* format) {
     const auto seconds = static_cast<std::time_t>(time);
     std::tm fields = {};
-    localtime_r(&seconds, &fields);
+    (void)localtime_r(&seconds, &fields);
     std::ostringstream text;
     text << std::put_time(&fields, format);
     return text.str();
