@@ -36,7 +36,7 @@ Json::Value parse(const std::string& text) {
     throw NoAnswer("the reply is not ternhad's");
 }
 
-int connectedSocket(const Settings& settings) {
+int connectedSocket(const Settings& settings, const Deadline& deadline) {
     sockaddr_un address = {};
     address.sun_family = AF_UNIX;
     if (settings.socket.size() >= sizeof address.sun_path) {
@@ -47,9 +47,13 @@ int connectedSocket(const Settings& settings) {
     if (fd < 0) {
         failWithError();
     }
-    // Also limits the wait for a place in the queue.
+    // Also limits the wait for a place in the queue. 0 would be no limit.
+    const auto rest =
+        std::chrono::duration_cast<std::chrono::microseconds>(deadline.time - Deadline::Clock::now());
+    const auto limit = std::max(rest, std::chrono::microseconds(1)).count();
     timeval timeout = {};
-    timeout.tv_sec = settings.timeout;
+    timeout.tv_sec = limit / 1000000;
+    timeout.tv_usec = limit % 1000000;
     setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof timeout);
     if (connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
         const int error = errno;
@@ -62,7 +66,8 @@ int connectedSocket(const Settings& settings) {
 
 }  // namespace
 
-Connection::Connection(const Settings& settings, const std::string& action) : _fd(connectedSocket(settings)) {
+Connection::Connection(const Settings& settings, const std::string& action, const Deadline& deadline)
+    : _fd(connectedSocket(settings, deadline)) {
     const std::string request = R"({"act":")" + action + "\"}";
     if (send(_fd, request.data(), request.size(), MSG_NOSIGNAL) < 0) {
         const int error = errno;
@@ -132,11 +137,11 @@ std::optional<Json::Value> Connection::line(Clock::time_point deadline) {
     return parse(text);
 }
 
-Json::Value ask(const Settings& settings, const std::string& action, unsigned int timeout) {
-    Connection connection(settings, action);
-    auto reply = connection.reply(Connection::Clock::now() + std::chrono::seconds(timeout));
+Json::Value ask(const Settings& settings, const std::string& action, const Deadline& deadline) {
+    Connection connection(settings, action, deadline);
+    auto reply = connection.reply(deadline.time);
     if (!reply) {
-        throw NoAnswer("no reply within " + std::to_string(timeout) + " s");
+        throw NoAnswer("no reply within " + std::to_string(deadline.seconds) + " s");
     }
     return *reply;
 }

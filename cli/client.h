@@ -21,13 +21,24 @@ struct Refused : NoAnswer {
     using NoAnswer::NoAnswer;
 };
 
+// When to give up: after `seconds` from now, whatever the daemon does.
+struct Deadline {
+    using Clock = std::chrono::steady_clock;
+
+    explicit Deadline(unsigned int limit)
+        : seconds(limit), time(Clock::now() + std::chrono::seconds(limit)) {}
+
+    unsigned int seconds;
+    Clock::time_point time;
+};
+
 // A connection to the daemon that carries one request.
 class Connection {
  public:
-    using Clock = std::chrono::steady_clock;
+    using Clock = Deadline::Clock;
 
     // Connects and sends {"act": `action`}. Throws NoAnswer.
-    Connection(const Settings& settings, const std::string& action);
+    Connection(const Settings& settings, const std::string& action, const Deadline& deadline);
     ~Connection();
 
     Connection(const Connection&) = delete;
@@ -46,7 +57,7 @@ class Connection {
     std::string _buffer;
 };
 
-// The reply to {"act": `action`}, which must come within `timeout` seconds. Throws NoAnswer.
-Json::Value ask(const Settings& settings, const std::string& action, unsigned int timeout);
+// The reply to {"act": `action`}, which must come by `deadline`. Throws NoAnswer.
+Json::Value ask(const Settings& settings, const std::string& action, const Deadline& deadline);
 
 }  // namespace ternhactl

@@ -18,10 +18,10 @@ constexpr auto NO_LIMIT = std::chrono::hours(24 * 365);
 
 // Asks for the changes. The first line of the reply is the report, which tells what holds already; a line for
 // each change follows as it comes.
-Json::Value firstLine(Connection& connection, const Settings& settings) {
-    auto line = connection.line(Clock::now() + std::chrono::seconds(settings.timeout));
+Json::Value firstLine(Connection& connection, const Deadline& deadline) {
+    auto line = connection.line(deadline.time);
     if (!line) {
-        throw NoAnswer("no reply within " + std::to_string(settings.timeout) + " s");
+        throw NoAnswer("no reply within " + std::to_string(deadline.seconds) + " s");
     }
     return *line;
 }
@@ -51,8 +51,9 @@ ExitCode wait(const Settings& settings) {
         (settings.waitLimit
              ? std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(*settings.waitLimit))
              : NO_LIMIT);
-    Connection connection(settings, "E");
-    bool isSo = holds(Report(firstLine(connection, settings)), settings.condition);
+    const Deadline firstDeadline(settings.timeout);
+    Connection connection(settings, "E", firstDeadline);
+    bool isSo = holds(Report(firstLine(connection, firstDeadline)), settings.condition);
     while (!isSo) {
         const auto line = connection.line(deadline);
         if (!line) {
@@ -65,8 +66,9 @@ ExitCode wait(const Settings& settings) {
 }
 
 ExitCode events(const Settings& settings) {
-    Connection connection(settings, "E");
-    firstLine(connection, settings);
+    const Deadline firstDeadline(settings.timeout);
+    Connection connection(settings, "E", firstDeadline);
+    firstLine(connection, firstDeadline);
     Json::StreamWriterBuilder compact;
     compact["indentation"] = "";
     while (std::cout) {

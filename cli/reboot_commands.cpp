@@ -37,7 +37,7 @@ ExitCode rebootPeer(const Settings& settings) {
         return ExitCode::No;
     }
     std::cout << "Ordering the reboot and following the peer down, up to 33 seconds...\n" << std::flush;
-    ask(settings, "R", REBOOT_TIMEOUT);
+    ask(settings, "R", Deadline(REBOOT_TIMEOUT));
     if (before.peerAlive.is(false)) {
         std::cout << "The peer was already dead: nobody knows whether it heard the order.\n";
         return ExitCode::No;

@@ -118,24 +118,33 @@ const std::vector<FlagName>& flagNames() {
     return names;
 }
 
-Json::Value fetchRecord(const Settings& settings) {
-    Json::Value record = ask(settings, "I", settings.timeout);
+namespace {
+
+Json::Value fetchRecord(const Settings& settings, const Deadline& deadline) {
+    Json::Value record = ask(settings, "I", deadline);
     if (!record.isObject()) {
         throw NoAnswer("the reply is not ternhad's");
     }
     return record;
 }
 
+}  // namespace
+
+Json::Value fetchRecord(const Settings& settings) {
+    return fetchRecord(settings, Deadline(settings.timeout));
+}
+
 Json::Value fetchReport(const Settings& settings) {
+    const Deadline deadline(settings.timeout);
     try {
-        Json::Value report = ask(settings, "S", settings.timeout);
+        Json::Value report = ask(settings, "S", deadline);
         if (!report.isObject()) {
             throw NoAnswer("the reply is not ternhad's");
         }
         return report;
     } catch (const Refused&) {
-        const Json::Value record = fetchRecord(settings);
-        const Json::Value rebooting = ask(settings, "r", settings.timeout);
+        const Json::Value record = fetchRecord(settings, deadline);
+        const Json::Value rebooting = ask(settings, "r", deadline);
         const Json::Value& value = member(rebooting, "is_froce_reboot_remote");
         return reportOf(record, value.isBool() && value.asBool());
     }

@@ -212,6 +212,34 @@ TEST_F(TernhactlTest, GivesUpOnASilentDaemonAfterItsTimeout) {
               "ternhactl: ternhad does not answer on /run/ternha/control.sock: no reply within 1 s\n");
 }
 
+TEST_F(TernhactlTest, GivesUpInTimeWhenNoConnectionIsAccepted) {
+    const RawServer server;
+    std::vector<test::Process> waiting;  // fill the queue
+    for (int i = 0; i < 12; ++i) {
+        waiting.emplace_back(
+            std::vector<std::string>{TERNHACTL_DIR "/ternhactl", "--timeout", "20", "status"});
+    }
+    const auto isFull = [] {
+        const auto result = shell("ternhactl --timeout 1 status");
+        return result.output.find("temporarily unavailable") != std::string::npos;
+    };
+    ASSERT_TRUE(test::eventually(20s, isFull));
+    const test::Stopwatch stopwatch;
+    EXPECT_EQ(shell("ternhactl --timeout 1 status").exitCode, 3);
+    EXPECT_LT(stopwatch.elapsed(), 1900ms);
+}
+
+TEST_F(TernhactlTest, GivesUpInTimeOnHalfAReply) {
+    const RawServer server;
+    const test::Stopwatch stopwatch;
+    test::Process status({TERNHACTL_DIR "/ternhactl", "--timeout", "1", "status"});
+    const int connection = server.accept();
+    RawServer::send(connection, R"({"version":1,)");
+    EXPECT_EQ(test::resultOf(std::move(status)).exitCode, 3);
+    EXPECT_LT(stopwatch.elapsed(), 1900ms);
+    close(connection);
+}
+
 TEST_F(TernhactlTest, TellsWhyTheDaemonDoesNotAnswer) {
     const auto reason = [](const std::string& command) {
         const std::string output = shell(command).output;
