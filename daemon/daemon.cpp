@@ -3,6 +3,7 @@
 #include <poll.h>
 #include <pthread.h>
 #include <sys/mman.h>
+#include <sys/resource.h>
 #include <sys/signalfd.h>
 #include <unistd.h>
 
@@ -40,6 +41,15 @@ int openSignals() {
     return signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK);
 }
 
+// What is in use stays in memory when others thrash it. Not what is not: that would triple the daemon. Only
+// without a limit, at which the stacks of the threads would fail.
+void keepInMemory() {
+    rlimit limit = {};
+    if (getrlimit(RLIMIT_MEMLOCK, &limit) == 0 && limit.rlim_cur == RLIM_INFINITY) {
+        mlockall(MCL_CURRENT | MCL_FUTURE | MCL_ONFAULT);
+    }
+}
+
 bool complain(const std::string& what, int error) {
     std::cerr << "ternhad: cannot " << what << ": " << std::strerror(error) << '\n';
     return false;
@@ -68,8 +78,7 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
 
 int Daemon::run() {
     const int signals = openSignals();
-    // What is in use stays in memory when others thrash it. Not what is not: that would triple the daemon.
-    mlockall(MCL_CURRENT | MCL_FUTURE | MCL_ONFAULT);
+    keepInMemory();
     if (!_logKeeper.start()) {
         complain("start the log keeper", errno);
         return 1;
