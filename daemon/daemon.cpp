@@ -3,7 +3,6 @@
 #include <poll.h>
 #include <pthread.h>
 #include <sys/mman.h>
-#include <sys/resource.h>
 #include <sys/signalfd.h>
 #include <unistd.h>
 
@@ -41,15 +40,6 @@ int openSignals() {
     return signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK);
 }
 
-// What is in use stays in memory when others thrash it. Not what is not: that would triple the daemon. Only
-// without a limit, at which the stacks of the threads would fail.
-void keepInMemory() {
-    rlimit limit = {};
-    if (getrlimit(RLIMIT_MEMLOCK, &limit) == 0 && limit.rlim_cur == RLIM_INFINITY) {
-        mlockall(MCL_CURRENT | MCL_FUTURE | MCL_ONFAULT);
-    }
-}
-
 bool complain(const std::string& what, int error) {
     std::cerr << "ternhad: cannot " << what << ": " << std::strerror(error) << '\n';
     return false;
@@ -78,7 +68,6 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
 
 int Daemon::run() {
     const int signals = openSignals();
-    keepInMemory();
     if (!_logKeeper.start()) {
         complain("start the log keeper", errno);
         return 1;
@@ -88,6 +77,9 @@ int Daemon::run() {
         _shutdown.request(1);
         return stop();
     }
+    // What is in use stays in memory when others thrash it, as far as this is permitted. Not what is not in
+    // use: that would triple the daemon.
+    mlockall(MCL_CURRENT | MCL_ONFAULT);
     TERNHAD_LOG(_events, "Started on " + _options.localIp + ", peer " + _options.remoteIp);
     notifyReady();
     waitForStop(signals);
