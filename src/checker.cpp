@@ -1,27 +1,25 @@
 #include "checker.h"
 
-#include <glob.h>
 #include <libgen.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
-#include <cerrno>
-#include <climits>
 #include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <mutex>
 #include <new>
 #include <optional>
 #include <string_view>
-#include <vector>
 
 #include "file.h"
 #include "ha_log.h"
+#include "interface_listing.h"
 #include "json_text.h"
+#include "path_glob.h"
 #include "terncore.h"
+#include "text.h"
 
 namespace TERN::HA::Daemon {
 
@@ -37,67 +35,7 @@ constexpr std::size_t HOSTNAME_LIMIT = 4096;
 
 constexpr int REBOOT_ROUNDS = 30;  // a second each
 
-constexpr std::size_t LINE_SIZE = 512;
-using Line = std::array<char, LINE_SIZE>;
-
 const char* const PS_ARGV[] = {"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args", nullptr};
-
-// The paths that match a pattern, sorted.
-class Glob {
- public:
-    explicit Glob(const char* pattern) : _paths(), _matched(glob64(pattern, 0, nullptr, &_paths) == 0) {}
-    ~Glob() { globfree64(&_paths); }
-
-    Glob(const Glob&) = delete;
-    Glob& operator=(const Glob&) = delete;
-
-    // False when nothing matched or the search failed.
-    bool matched() const { return _matched; }
-    char** begin() const { return _paths.gl_pathv; }
-    char** end() const { return _paths.gl_pathv + _paths.gl_pathc; }
-
- private:
-    glob64_t _paths;
-    bool _matched;
-};
-
-// The next line, or the next 511 bytes of a longer one, with its newline; nothing at the end of the output.
-// Like fgets, for which a signal would be the end.
-std::string_view readLine(const CommandPipe& pipe, Line& line) {
-    std::size_t size = 0;
-    while (size < line.size() - 1) {
-        const int byte = getc_unlocked(pipe._fp);
-        if (byte != EOF) {
-            line[size++] = static_cast<char>(byte);
-            if (byte == '\n') {
-                break;
-            }
-        } else if (std::ferror(pipe._fp) != 0 && errno == EINTR) {
-            std::clearerr(pipe._fp);
-        } else {
-            break;
-        }
-    }
-    line[size] = '\0';
-    return {line.data(), size};
-}
-
-// The words between blanks. Not by a stream, which would take a lack of memory for the end of the line.
-std::vector<std::string> split(std::string_view line) {
-    constexpr std::string_view BLANKS = " \t\n\v\f\r";
-    std::vector<std::string> tokens;
-    std::size_t begin = 0;
-    while ((begin = line.find_first_not_of(BLANKS, begin)) != std::string_view::npos) {
-        const std::size_t end = std::min(line.find_first_of(BLANKS, begin), line.size());
-        tokens.emplace_back(line.substr(begin, end - begin));
-        begin = end;
-    }
-    return tokens;
-}
-
-bool startsWith(std::string_view text, std::string_view prefix) {
-    return text.substr(0, prefix.size()) == prefix;
-}
 
 // Counters are whatever a program printed: their sums and differences wrap around instead of overflowing.
 long long add(long long a, long long b) {
@@ -293,7 +231,7 @@ bool isSysfsValue(const std::string& path, const std::string& expected) try {
 }
 
 bool isMDResync() try {
-    const Glob arrays("/sys/block/md*");
+    const PathGlob arrays("/sys/block/md*");
     if (!arrays.matched()) {
         HA_LOG("Failed to set globBuf from /sys/block/md*");
         return false;
@@ -307,7 +245,7 @@ bool isMDResync() try {
 }
 
 bool isDiskErrHandling(Json::Value& disks) try {
-    const Glob ports("/sys/class/ata_port/ata*");
+    const PathGlob ports("/sys/class/ata_port/ata*");
     if (!ports.matched()) {
         HA_LOG("Failed to set globBuf from /sys/class/ata_port/ata*");
         return false;
@@ -379,7 +317,7 @@ float heartbeatLatency() {
         return 0.0F;
     }
     float average = 0.0F;
-    while (!readLine(ping, line).empty()) {
+    while (!readLine(ping._fp, line).empty()) {
         if (std::sscanf(line.data(), "rtt min/avg/max/mdev = %*f/%f/%*f/%*f ms", &average) == 1) {
             break;
         }
@@ -408,47 +346,21 @@ bool InterfaceChecker::_interfaceDetail(const std::string& ifname,
         HA_LOG("Failed to exec ifconfig to get interface status");
         return false;
     }
-    Line line = {};
-    if (readLine(ifconfig, line).empty()) {
-        HA_LOG("Failed to get title from ifconfig output");
-        return false;
+    InterfaceListing listing = readInterfaceListing(ifconfig._fp, ifname);
+    switch (listing.outcome) {
+        case InterfaceListing::Outcome::READ:
+            counters.swap(listing.counters);
+            return true;
+        case InterfaceListing::Outcome::NO_TITLE:
+            HA_LOG("Failed to get title from ifconfig output");
+            return false;
+        case InterfaceListing::Outcome::OUT_OF_RANGE:
+            HA_LOG("strtoll failed: " + listing.token);
+            return false;
+        case InterfaceListing::Outcome::LINE_TOO_SHORT:
+            break;
     }
-    std::map<std::string, long long> columns;  // index of each counter's column, until its value is known
-    // Frozen: docs/compatibility.md#unknown-title
-    if (startsWith(line.data(), "Iface")) {
-        long long index = 0;
-        for (const std::string& column : split(line.data())) {
-            if (startsWith(column, "RX") || startsWith(column, "TX")) {
-                columns.emplace(column, index);
-            }
-            ++index;
-        }
-    }
-    bool isFound = false;
-    while (!readLine(ifconfig, line).empty()) {
-        // Frozen: docs/compatibility.md#interface-prefix
-        // A prefix suffices (eth1 finds eth10 as well); the first such line counts.
-        if (isFound || !startsWith(line.data(), ifname)) {
-            continue;
-        }
-        isFound = true;
-        const std::vector<std::string> tokens = split(line.data());
-        for (auto& [name, value] : columns) {
-            const auto index = static_cast<std::size_t>(value);
-            if (index >= tokens.size()) {
-                return false;
-            }
-            // Frozen: docs/compatibility.md#counter-bases
-            value = std::strtoll(tokens[index].c_str(), nullptr, 0);
-            if (value == LLONG_MAX || value == LLONG_MIN) {
-                HA_LOG("strtoll failed: " + tokens[index]);
-                return false;
-            }
-        }
-    }
-    // Frozen: docs/compatibility.md#unlisted-interface
-    counters = columns;
-    return true;
+    return false;
 }
 
 float InterfaceChecker::_rateGet(const std::map<std::string, long long>& counters) {
@@ -485,7 +397,7 @@ void recordCMD(const char* const* argv) {
         return;
     }
     std::string output;
-    for (std::string_view piece; !(piece = readLine(command, line)).empty();) {
+    for (std::string_view piece; !(piece = readLine(command._fp, line)).empty();) {
         output += piece;
     }
     // Before the pipe closes: what a failing program printed is recorded, then its failure is reported.
