@@ -17,6 +17,7 @@ namespace ternhactl {
 
 namespace {
 
+constexpr char REFUSAL[] = "refused: ";  // a reason follows
 constexpr char NO_REPLY[] = "the connection was closed without a reply";
 
 [[noreturn]] void failWithError() {
@@ -24,6 +25,9 @@ constexpr char NO_REPLY[] = "the connection was closed without a reply";
 }
 
 Json::Value parse(const std::string& text) {
+    if (text.rfind(REFUSAL, 0) == 0) {
+        throw Refused(text);
+    }
     const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
     Json::Value value;
     try {
@@ -129,6 +133,9 @@ std::optional<Json::Value> Connection::line(Clock::time_point deadline) {
             case Input::Timeout:
                 return std::nullopt;
             case Input::End:
+                if (!_buffer.empty()) {
+                    return parse(_buffer);
+                }
                 throw Refused("the connection was closed");
         }
     }

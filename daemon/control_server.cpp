@@ -24,11 +24,13 @@ constexpr auto SILENCE_LIMIT = std::chrono::seconds(5);
 constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the socket file
 constexpr std::size_t MOST_CLIENTS = 16;
 constexpr int BACKLOG = 100;
+constexpr mode_t SHARED_MODE = 0660;
 constexpr std::size_t REQUEST_SIZE = 2096;
 constexpr char RESTORING[] = "make the vanished control socket again";
 constexpr char ACCEPTING[] = "accept control clients";
-// No JSON: a client that only looks for a reply takes it for a failure.
-constexpr char REFUSAL[] = "refused: an earlier order to reboot the peer is still being carried out";
+constexpr char ORDER = 'R';  // the actions
+constexpr char REPORT = 'S';
+constexpr char EVENTS = 'E';
 
 sockaddr_un addressOf(const std::string& path) {
     sockaddr_un address = {};
@@ -37,27 +39,55 @@ sockaddr_un addressOf(const std::string& path) {
     return address;
 }
 
-// True when the request that has come to `fd`, which stays there to be served, orders a reboot.
-bool isOrder(int fd) {
+// The first character of the action that the request asks for, as the library reads it; the request, which
+// has come to `fd`, stays there to be served. 0 when there is none.
+char actionOf(int fd) {
     std::array<char, REQUEST_SIZE> text;
     const ssize_t size = recv(fd, text.data(), text.size(), MSG_PEEK);
     Json::Value request;
     std::string errors;
     const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
-    return size > 0 && reader->parse(text.data(), text.data() + size, &request, &errors) &&
-           request.isObject() && request["act"].isString() && request["act"].asString()[0] == 'R';
+    const bool isRead = size > 0 && reader->parse(text.data(), text.data() + size, &request, &errors) &&
+                        request.isObject() && request["act"].isString();
+    return isRead ? request["act"].asString()[0] : '\0';
+}
+
+// A request that is left unread would reset the connection, and with it a reply.
+void discardRequest(int fd) {
+    std::array<char, REQUEST_SIZE> text;
+    (void)!recv(fd, text.data(), text.size(), 0);
+}
+
+// Not JSON: a client that only looks for a reply takes it for a failure.
+void refuse(int fd, const char* reason) {
+    discardRequest(fd);
+    const std::string text = std::string("refused: ") + reason;
+    send(fd, text.data(), text.size(), MSG_NOSIGNAL);
 }
 
 }  // namespace
 
-ControlServer::ControlServer(const std::string& path, Health& health, Events& events,
-                             const Shutdown& shutdown, Progress& progress)
+ControlServer::Endpoint::Endpoint(const std::string& path, const Reporter& reporter)
+    : MonitordSocket(path, CLIENT_TIMEOUT), _reporter(reporter) {}
+
+bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Value& reply) {
+    if (request.isObject() && request["act"].isString() && request["act"].asString()[0] == REPORT) {
+        reply = _reporter.report();
+        return true;
+    }
+    return MonitordSocket::serverHandle(request, reply);
+}
+
+ControlServer::ControlServer(const std::string& path, Access access, Health& health, const Reporter& reporter,
+                             EventStreams& streams, Events& events, const Shutdown& shutdown)
     : _path(path),
+      _access(access),
+      _health(health),
+      _streams(streams),
       _events(events),
       _shutdown(shutdown),
-      _progress(progress),
-      _requests(path, CLIENT_TIMEOUT),
-      _orders(path, CLIENT_TIMEOUT) {
+      _requests(path, reporter),
+      _orders(path, reporter) {
     _requests.setStatus(&health.status());
     _orders.setStatus(&health.status());
     _clients.reserve(MOST_CLIENTS);
@@ -93,9 +123,22 @@ bool ControlServer::listen() {
         ::listen(_listener, BACKLOG) != 0 || lstat(_path.c_str(), &info) != 0) {
         return false;
     }
+    if (_group && !share()) {
+        return false;
+    }
     _device = info.st_dev;
     _inode = info.st_ino;
     return true;
+}
+
+bool ControlServer::shareWith(gid_t group) {
+    _group = group;
+    return share();
+}
+
+bool ControlServer::share() const {
+    return chown(_path.c_str(), static_cast<uid_t>(-1), *_group) == 0 &&
+           chmod(_path.c_str(), SHARED_MODE) == 0;
 }
 
 bool ControlServer::hasFile() const {
@@ -122,7 +165,7 @@ void ControlServer::restoreFile() {
     }
 }
 
-void ControlServer::run() {
+void ControlServer::run(Progress* progress) {
     Passes passes;
     while (!_shutdown.isRequested()) {
         passes.run([this] {
@@ -132,7 +175,9 @@ void ControlServer::run() {
             _clients.erase(std::remove_if(_clients.begin(), _clients.end(), isDone), _clients.end());
             acceptClients();
         });
-        _progress.made(Progress::controlServer);
+        if (progress != nullptr) {
+            progress->made(Progress::controlServer);
+        }
     }
 }
 
@@ -178,8 +223,14 @@ bool ControlServer::serve(const Client& client) {
         return false;
     }
     if (state.revents != 0) {
-        if (isOrder(client.fd)) {
+        const char action = actionOf(client.fd);
+        if (action == ORDER) {
             order(client.fd);
+            return true;
+        }
+        if (action == EVENTS) {
+            discardRequest(client.fd);
+            follow(client.fd);
             return true;
         }
         _requests.serve(client.fd);
@@ -188,13 +239,24 @@ bool ControlServer::serve(const Client& client) {
     return true;
 }
 
+// The events go to the client from now on.
+void ControlServer::follow(int fd) {
+    if (!_streams.add(fd)) {
+        refuse(fd, "too many clients follow the events");
+        ::close(fd);
+    }
+}
+
 void ControlServer::order(int fd) {
     int nobody = -1;
-    if (_orderer.compare_exchange_strong(nobody, fd)) {
+    if (_access == Access::reading) {
+        refuse(fd, "this socket takes no orders");
+    } else if (_orderer.compare_exchange_strong(nobody, fd)) {
         _ordered.set();
         return;
+    } else {
+        refuse(fd, "an earlier order to reboot the peer is still being carried out");
     }
-    send(fd, REFUSAL, sizeof REFUSAL - 1, MSG_NOSIGNAL);
     ::close(fd);
 }
 
@@ -202,10 +264,28 @@ void ControlServer::runOrders() {
     Passes passes;
     while (_shutdown.sleepUntil(Clock::now() + std::chrono::hours(24), {&_ordered})) {
         if (_ordered.take()) {
-            passes.run([this] { _orders.serve(_orderer); });
+            passes.run([this] { carryOutOrder(); });
             ::close(_orderer.exchange(-1));
         }
     }
+}
+
+void ControlServer::carryOutOrder() {
+    const bool wasAlive = _health.isPeerAlive();
+    TERNHAD_LOG(_events,
+                std::string("Reboot of the peer ordered, which is ") + (wasAlive ? "alive" : "dead"));
+    _orders.serve(_orderer);
+    if (_shutdown.isRequested()) {
+        return;
+    }
+    const bool isAlive = _health.isPeerAlive();
+    if (isAlive) {
+        // It replies to each probe, so that no other thread would say that it is not being rebooted.
+        _health.status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
+    }
+    TERNHAD_LOG(_events, std::string("Reboot of the peer: ") + (isAlive    ? "it still answers, not rebooted"
+                                                                : wasAlive ? "it went down"
+                                                                           : "it was already dead"));
 }
 
 }  // namespace ternhad

@@ -4,14 +4,17 @@
 
 #include <atomic>
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <vector>
 
 #include "control.h"
 #include "event.h"
+#include "event_streams.h"
 #include "events.h"
 #include "health.h"
 #include "progress.h"
+#include "report.h"
 
 namespace ternhad {
 
@@ -19,8 +22,10 @@ namespace ternhad {
 // which takes up to 33 seconds, blocks only its own client; a second one meanwhile is refused.
 class ControlServer {
  public:
-    ControlServer(const std::string& path, Health& health, Events& events, const Shutdown& shutdown,
-                  Progress& progress);
+    enum class Access { all, reading };  // reading: no orders
+
+    ControlServer(const std::string& path, Access access, Health& health, const Reporter& reporter,
+                  EventStreams& streams, Events& events, const Shutdown& shutdown);
     ~ControlServer();
 
     ControlServer(const ControlServer&) = delete;
@@ -30,8 +35,11 @@ class ControlServer {
     // when that fails; EEXIST when something else than a socket has the name.
     bool listen();
 
-    // Body of the thread that serves clients.
-    void run();
+    // Gives the socket file to a group, which may then connect. False with errno.
+    bool shareWith(gid_t group);
+
+    // Body of the thread that serves clients. Tells `progress` of each pass, if given.
+    void run(Progress* progress);
 
     // Body of the thread that carries out orders.
     void runOrders();
@@ -42,10 +50,16 @@ class ControlServer {
  private:
     class Endpoint : public TERN::HA::Daemon::MonitordSocket {
      public:
-        using MonitordSocket::MonitordSocket;
+        Endpoint(const std::string& path, const Reporter& reporter);
+
+        // As documented for the base, and the report.
+        bool serverHandle(const Json::Value& request, Json::Value& reply) override;
 
         // Serves the request that has come to `fd`.
         void serve(int fd) { _serverListen(fd); }
+
+     private:
+        const Reporter& _reporter;
     };
 
     // One that has not sent its request yet.
@@ -60,12 +74,18 @@ class ControlServer {
     void wait() const;
     void acceptClients();
     bool serve(const Client& client);
+    bool share() const;
+    void follow(int fd);
     void order(int fd);
+    void carryOutOrder();
 
     std::string _path;
+    Access _access;
+    std::optional<gid_t> _group;
+    Health& _health;
+    EventStreams& _streams;
     Events& _events;
     const Shutdown& _shutdown;
-    Progress& _progress;
     Endpoint _requests;  // one for each thread
     Endpoint _orders;
 

@@ -50,14 +50,19 @@ bool complain(const std::string& what, int error) {
 Daemon::Daemon(const Options& options, InstanceLock& lock)
     : _options(options),
       _lock(lock),
-      _health(_events),
+      _health(_events, std::chrono::duration_cast<Clock::duration>(options.deadAfter)),
       _logKeeper(options, _health, _events),
       _reboot(_events, _shutdown),
       _peerServer(_health, _events, _reboot, _shutdown, _progress),
       _prober(options, _health, _events, _shutdown, _progress),
-      _controlServer(options.socket, _health, _events, _shutdown, _progress),
+      _reporter(options, _health),
+      _streams(_health.transitions(), _reporter, _shutdown),
+      _controlServer(options.socket, ControlServer::Access::all, _health, _reporter, _streams, _events,
+                     _shutdown),
+      _announcer(_health.transitions(), _shutdown),
+      _notifier(options, _health, _events, _shutdown),
       _peerWatcher(options, _health, _events, _shutdown),
-      _nodeWatcher(options, _health, _shutdown, _progress),
+      _nodeWatcher(options, _health, _events, _shutdown, _progress),
       _watchdog(watchdogInterval()),
       _nextWatchdog(Clock::now()) {
     drbdIF(options.interface);
@@ -98,9 +103,17 @@ bool Daemon::startThreads() try {
     if (!_controlServer.listen()) {
         return complain("bind the control socket " + _options.socket, errno);
     }
+    if (!startStatusServer()) {
+        return complain("bind the status socket " + _options.statusSocket, errno);
+    }
     _threads.start("reboot", [this] { _reboot.flush(); });
-    _threads.start("clients", [this] { _controlServer.run(); });
+    _threads.start("clients", [this] { _controlServer.run(&_progress); });
     _threads.start("orders", [this] { _controlServer.runOrders(); });
+    _threads.start("streams", [this] { _streams.run(); });
+    _threads.start("journal", [this] { _announcer.run(); });
+    if (!_options.notify.empty()) {
+        _threads.start("notify", [this] { _notifier.run(); });
+    }
     _threads.start("peer", [this] { _peerWatcher.run(); });
     _threads.start("checks", [this] { _nodeWatcher.runChecks(); });
     _threads.start("link", [this] { _nodeWatcher.runMeasurements(); });
@@ -108,6 +121,19 @@ bool Daemon::startThreads() try {
 } catch (const std::exception& error) {
     std::cerr << "ternhad: cannot start its threads: " << error.what() << '\n';
     return false;
+}
+
+bool Daemon::startStatusServer() {
+    if (_options.statusSocket.empty()) {
+        return true;
+    }
+    _statusServer.emplace(_options.statusSocket, ControlServer::Access::reading, _health, _reporter, _streams,
+                          _events, _shutdown);
+    if (!_statusServer->listen() || !_statusServer->shareWith(_options.statusGroupId)) {
+        return false;
+    }
+    _threads.start("readers", [this] { _statusServer->run(nullptr); });
+    return true;
 }
 
 bool Daemon::startPeerThreads() {
@@ -175,6 +201,9 @@ int Daemon::stop() {
     const bool isWritten = _eventThread.join(now + EVENTS_LIMIT);
     _logKeeper.finish(now + LOGS_LIMIT);
     _controlServer.removeFile();
+    if (_statusServer) {
+        _statusServer->removeFile();
+    }
     if (!haveEnded || !isWritten) {
         _exit(_shutdown.exitCode());  // without what hangs
     }

@@ -3,6 +3,7 @@
 #include <chrono>
 #include <optional>
 
+#include "announcer.h"
 #include "control_server.h"
 #include "event.h"
 #include "events.h"
@@ -10,6 +11,7 @@
 #include "instance.h"
 #include "log_keeper.h"
 #include "node_watcher.h"
+#include "notifier.h"
 #include "options.h"
 #include "peer_server.h"
 #include "peer_watcher.h"
@@ -36,6 +38,7 @@ class Daemon {
  private:
     bool startThreads();
     bool startPeerThreads();
+    bool startStatusServer();
     void waitForStop(int signals);
     void takeSignals(int signals);
     void updateWatchdog();
@@ -51,7 +54,12 @@ class Daemon {
     Reboot _reboot;
     PeerServer _peerServer;
     Prober _prober;
+    Reporter _reporter;
+    EventStreams _streams;
     ControlServer _controlServer;
+    std::optional<ControlServer> _statusServer;  // for monitoring without root
+    Announcer _announcer;
+    Notifier _notifier;
     PeerWatcher _peerWatcher;
     NodeWatcher _nodeWatcher;
     Threads _threads;

@@ -6,21 +6,9 @@
 
 #include "ha_log.h"
 #include "passes.h"
+#include "wall_clock.h"
 
 namespace ternhad {
-
-namespace {
-
-// Asked of the kernel here because the standard library's own clock fails after 2038 on 32-bit machines.
-std::chrono::system_clock::time_point wallClock() {
-    timespec now = {};
-    clock_gettime(CLOCK_REALTIME, &now);
-    return std::chrono::system_clock::time_point(
-        std::chrono::duration_cast<std::chrono::system_clock::duration>(
-            std::chrono::seconds(now.tv_sec) + std::chrono::nanoseconds(now.tv_nsec)));
-}
-
-}  // namespace
 
 void Events::changed(Flag flag, bool value) noexcept {
     Happening happening;

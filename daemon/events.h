@@ -8,12 +8,10 @@
 #include <mutex>
 #include <string>
 
+#include "flag.h"
 #include "status.h"
 
 namespace ternhad {
-
-// What can change about the two nodes.
-enum class Flag { peerAlive, peerResync, peerDiskErrors, resync, diskErrors, drbdConnected };
 
 // Something that happened.
 struct Happening {

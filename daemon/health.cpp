@@ -11,6 +11,7 @@ void Health::setPeerAlive(bool isAlive) noexcept {
         _status.delRemoteNodeState(NodeRebooting);
     }
     if (isAlive == isPeerAlive()) {
+        _transitions.found(Flag::peerAlive, isAlive);
         return;
     }
     if (isAlive) {
@@ -20,11 +21,14 @@ void Health::setPeerAlive(bool isAlive) noexcept {
         _status.delRemoteNodeState(NodeAlive);
         _snapshotWanted.set();
     }
+    _transitions.found(Flag::peerAlive, isAlive);
     _events.changed(Flag::peerAlive, isAlive);
 }
 
 void Health::set(Flag flag, bool value) noexcept {
-    if (flagOf(flag).exchange(value) == value) {
+    const bool isSame = flagOf(flag).exchange(value) == value;
+    _transitions.found(flag, value);
+    if (isSame) {
         return;
     }
     if (value && flag != Flag::drbdConnected) {
@@ -45,6 +49,7 @@ std::atomic<bool>& Health::flagOf(Flag flag) noexcept {
             return _status.isDiskErrHandling;
         case Flag::drbdConnected:
         case Flag::peerAlive:
+        case Flag::peerRebooting:
             break;
     }
     return _status.isDRBDConnect;

@@ -6,7 +6,9 @@
 
 #include "event.h"
 #include "events.h"
+#include "findings.h"
 #include "status.h"
+#include "transitions.h"
 
 namespace ternhad {
 
@@ -14,7 +16,8 @@ namespace ternhad {
 // trace. Thread-safe.
 class Health {
  public:
-    explicit Health(Events& events) : _events(events) {}
+    // `deadAfter`: see Transitions.
+    Health(Events& events, Clock::duration deadAfter) : _events(events), _transitions(deadAfter) {}
 
     TERN::HA::Daemon::Status& status() noexcept { return _status; }
 
@@ -26,6 +29,16 @@ class Health {
 
     // Any other flag.
     void set(Flag flag, bool value) noexcept;
+
+    // Stores whether the peer is being rebooted as the record has it now.
+    void updatePeerRebooting() noexcept {
+        _transitions.found(Flag::peerRebooting, _status.isRemoteRebooting());
+    }
+
+    Transitions& transitions() noexcept { return _transitions; }
+    const Transitions& transitions() const noexcept { return _transitions; }
+    Findings& findings() noexcept { return _findings; }
+    const Findings& findings() const noexcept { return _findings; }
 
     // This node's own host name; empty while unknown.
     std::string hostname() const;
@@ -40,6 +53,8 @@ class Health {
 
     Events& _events;
     TERN::HA::Daemon::Status _status;
+    Transitions _transitions;
+    Findings _findings;
     mutable std::mutex _mutex;  // guards the name
     std::string _hostname;
     Event _peerAppeared;

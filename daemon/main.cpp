@@ -7,9 +7,11 @@
 #include <iostream>
 #include <string_view>
 
+#include "check_config.h"
 #include "daemon.h"
 #include "directories.h"
 #include "instance.h"
+#include "journal.h"
 #include "log_keeper.h"
 #include "options.h"
 
@@ -46,6 +48,13 @@ int main(int argc, char** argv) try {
     ternhad::Options options;
     if (const auto exitCode = ternhad::parseOptions(argc, argv, options)) {
         return *exitCode;
+    }
+    for (const std::string& warning : ternhad::warningsOf(options)) {
+        ternhad::writeJournal(ternhad::Level::warning, warning);
+    }
+    if (options.isCheckOnly) {
+        std::cout << ternhad::configurationText(options) << std::flush;
+        return std::cout ? EXIT_SUCCESS : FAILURE;
     }
     openlog("ternhad", LOG_PID, LOG_DAEMON);
     return run(options);

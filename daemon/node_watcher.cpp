@@ -1,6 +1,13 @@
 #include "node_watcher.h"
 
+#include <glob.h>
 #include <json/value.h>
+#include <net/if.h>
+#include <sys/ioctl.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <string>
 
 #include "passes.h"
 
@@ -15,17 +22,37 @@ void NodeWatcher::runChecks() {
     } while (_shutdown.sleepUntil(next));
 }
 
+// Logs once when the files are missing, and once when they have appeared.
+bool NodeWatcher::isThere(KernelFiles& files) {
+    glob_t found = {};
+    const bool areThere = glob(files.pattern, GLOB_NOSORT, nullptr, &found) == 0;
+    globfree(&found);
+    if (files.wereThere != areThere) {
+        if (!areThere) {
+            TERNHAD_LOG(_events, std::string("No ") + files.what + ": no " + files.pattern);
+        } else if (files.wereThere) {
+            TERNHAD_LOG(_events, std::string("Found ") + files.what + ": " + files.pattern);
+        }
+        files.wereThere = areThere;
+    }
+    return areThere;
+}
+
+// What is not there gives the result that its check would give, but not a line in the log each time.
 void NodeWatcher::check() {
-    _health.set(Flag::drbdConnected, TERN::HA::Daemon::isDRBDConnect());
-    _health.set(Flag::resync, TERN::HA::Daemon::isMDResync());
-
-    Json::Value disks(Json::arrayValue);
-    const bool isHandling = TERN::HA::Daemon::isDiskErrHandling(disks);
-    _health.status().setErrHandlingDisk(disks);
-    _health.set(Flag::diskErrors, isHandling);
-
+    _health.set(Flag::drbdConnected, isThere(_drbd) && TERN::HA::Daemon::isDRBDConnect());
+    _health.set(Flag::resync, isThere(_arrays) && TERN::HA::Daemon::isMDResync());
+    checkDisks();
+    _health.updatePeerRebooting();
     _health.setHostname(TERN::HA::Daemon::getLocalHostname());
     _progress.made(Progress::nodeWatcher);
+}
+
+void NodeWatcher::checkDisks() {
+    Json::Value disks(Json::arrayValue);
+    const bool isHandling = isThere(_ports) && TERN::HA::Daemon::isDiskErrHandling(disks);
+    _health.status().setErrHandlingDisk(disks);
+    _health.set(Flag::diskErrors, isHandling);
 }
 
 void NodeWatcher::runMeasurements() {
@@ -38,15 +65,32 @@ void NodeWatcher::runMeasurements() {
     } while (_shutdown.sleepUntil(next));
 }
 
+// ifconfig lists no other.
+bool NodeWatcher::isInterfaceUp() {
+    const int fd = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+    ifreq request = {};
+    _options.interface.copy(static_cast<char*>(request.ifr_name), IFNAMSIZ - 1);
+    const bool isUp = ioctl(fd, SIOCGIFFLAGS, &request) == 0 && (request.ifr_flags & IFF_UP) != 0;
+    close(fd);
+    return isUp;
+}
+
 void NodeWatcher::measure(TERN::HA::Daemon::InterfaceChecker& interface) {
     float rate = 0;
-    if (interface.networkNonOkRate(rate)) {
-        _health.status().heartbeatPacketFailRate = rate;
-    }
+    // Outside of 0 to 1 the counters were reset, or the interface went down meanwhile.
+    const bool isMeasured = isInterfaceUp() && interface.networkNonOkRate(rate) && rate >= 0 && rate <= 1;
+    _health.findings().setNonOkRate(isMeasured ? std::optional<double>(rate) : std::nullopt);
+    _health.status().heartbeatPacketFailRate = isMeasured ? rate : 0;
+
     // A ping without a reply takes 10 seconds and shows nothing new.
     const float latency = _health.isPeerAlive() ? TERN::HA::Daemon::heartbeatLatency() : 0;
     if (!_shutdown.isRequested()) {
         _health.status().heartbeatLatency = latency;
+        if (latency > 0) {
+            _health.findings().setLatency(latency);
+        } else if (_health.isPeerAlive()) {  // that of a dead one stays the last known
+            _health.findings().setLatency(std::nullopt);
+        }
     }
 }
 

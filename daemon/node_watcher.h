@@ -1,5 +1,7 @@
 #pragma once
 
+#include <optional>
+
 #include "checker.h"
 #include "event.h"
 #include "health.h"
@@ -12,21 +14,37 @@ namespace ternhad {
 // the link takes up to 10 seconds.
 class NodeWatcher {
  public:
-    NodeWatcher(const Options& options, Health& health, const Shutdown& shutdown, Progress& progress)
-        : _options(options), _health(health), _shutdown(shutdown), _progress(progress) {}
+    NodeWatcher(const Options& options, Health& health, Events& events, const Shutdown& shutdown,
+                Progress& progress)
+        : _options(options), _health(health), _events(events), _shutdown(shutdown), _progress(progress) {}
 
     // The bodies of the threads.
     void runChecks();
     void runMeasurements();
 
  private:
+    // What the kernel shows of something that this node may not have.
+    struct KernelFiles {
+        const char* pattern;
+        const char* what;
+        std::optional<bool> wereThere = {};
+    };
+
     void check();
+    void checkDisks();
+    bool isThere(KernelFiles& files);
+    bool isInterfaceUp();
     void measure(TERN::HA::Daemon::InterfaceChecker& interface);
 
     const Options& _options;
     Health& _health;
+    Events& _events;
     const Shutdown& _shutdown;
     Progress& _progress;
+
+    KernelFiles _drbd{"/proc/drbd", "DRBD"};
+    KernelFiles _arrays{"/sys/block/md*/md/sync_action", "md arrays with redundancy"};
+    KernelFiles _ports{"/sys/class/ata_port/ata*/error_handling", "ATA ports that tell of error handling"};
 };
 
 }  // namespace ternhad

@@ -1,17 +1,24 @@
 #include "options.h"
 
 #include <arpa/inet.h>
+#include <grp.h>
 #include <ifaddrs.h>
 #include <net/if.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/un.h>
+#include <unistd.h>
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <cerrno>
+#include <cstring>
 #include <iostream>
 #include <memory>
+#include <vector>
 
+#include "config_file.h"
 #include "printable.h"
 
 namespace ternhad {
@@ -75,6 +82,21 @@ std::string checkInterfaceName(const std::string& name) {
 }
 
 // Not by CLI::Range, to which "nan" is in every range.
+std::string checkProgram(const std::string& path) {
+    struct stat info = {};
+    if (path.empty() || path.front() != '/') {
+        return "not an absolute path: " + path;
+    }
+    if (stat(path.c_str(), &info) != 0) {
+        return path + ": " + std::strerror(errno);
+    }
+    return S_ISREG(info.st_mode) && access(path.c_str(), X_OK) == 0 ? "" : "not an executable file: " + path;
+}
+
+std::string checkGroup(const std::string& name) {
+    return getgrnam(name.c_str()) != nullptr ? "" : "no such group: " + name;
+}
+
 void addInterval(CLI::App& app, const std::string& name, Seconds& value, double least, double most,
                  const std::string& description) {
     const std::string range = "from " + CLI::detail::to_string(least) + " to " + CLI::detail::to_string(most);
@@ -134,6 +156,22 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
         ->check(CLI::Range(std::int64_t{4096}, std::int64_t{1} << 40))
         ->type_name("BYTES");
 
+    app.add_option("--notify", options.notify, "Run this program at each change of a state")
+        ->check(checkProgram)
+        ->type_name("PROGRAM");
+    CLI::Option* const statusSocket =
+        app.add_option("--status-socket", options.statusSocket, "A second socket, which takes no orders")
+            ->check(checkSocketPath)
+            ->type_name("PATH");
+    app.add_option("--status-group", options.statusGroup, "The group that may use the status socket")
+        ->check(checkGroup)
+        ->needs(statusSocket)
+        ->type_name("GROUP");
+    app.add_flag("--check-config", options.isCheckOnly, "Print the values in effect, and warnings, and end")
+        ->configurable(false);
+    const auto file = std::make_shared<ConfigFile>(app);
+    app.config_formatter(file);
+
     try {
         app.parse(argc, argv);
         if (options.localIp == options.remoteIp) {
@@ -146,11 +184,22 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
         if (options.checkInterval * 3 > options.deadAfter + ROUNDING) {
             throw CLI::ValidationError("--check-interval", "above a third of --dead-after");
         }
+        if (!options.statusSocket.empty()) {
+            if (options.statusGroup.empty()) {
+                throw CLI::ValidationError("--status-socket", "needs --status-group");
+            }
+            if (options.statusSocket == options.socket) {
+                throw CLI::ValidationError("--status-socket", "the same path as --socket");
+            }
+            options.statusGroupId = getgrnam(options.statusGroup.c_str())->gr_gid;
+        }
     } catch (const CLI::ParseError& error) {
+        const std::string located = file->located(error, std::vector<std::string>(argv, argv + argc));
+        if (!located.empty()) {
+            std::cerr << "ternhad: " << located << '\n';
+            return WRONG_USAGE;
+        }
         return app.exit(error) == 0 ? 0 : WRONG_USAGE;
-    }
-    if (if_nametoindex(options.interface.c_str()) == 0) {
-        std::cerr << "ternhad: warning: there is no network interface " << options.interface << " (yet)\n";
     }
     return std::nullopt;
 }

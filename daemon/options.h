@@ -19,7 +19,12 @@ struct Options {
     Seconds heartbeatInterval = Seconds(10);   // latency and the interface's rate
     Seconds logInterval = Seconds(10);         // buffered lines to disk
     Seconds snapshotInterval = Seconds(3600);  // recording of status, processes, file systems and memory
-    std::int64_t rotateSize = 1048576;         // bytes of a log at which it is rotated
+    std::string notify;                        // a program to run at each change; empty: none
+    std::string statusSocket;                  // for clients that only read; empty: none
+    std::string statusGroup;                   // who may use it
+    unsigned int statusGroupId = 0;
+    bool isCheckOnly = false;           // print the configuration and end
+    std::int64_t rotateSize = 1048576;  // bytes of a log at which it is rotated
 };
 
 // Reads the command line and the configuration file that it names. Returns the exit code when the process is

@@ -71,10 +71,10 @@ void PeerWatcher::requestDisks() {
         return;
     }
     const bool isRead = disks != unread;
-    if (isRead) {
-        _health.status().setErrHandlingDiskRemote(disks);
-    }
-    // A report that cannot be read was cut, because it has more disks than a datagram holds.
+    // A report that cannot be read was cut, because it has more disks than a datagram holds: there are
+    // errors, on disks that are not known. Those of the report before may have recovered.
+    _health.status().setErrHandlingDiskRemote(isRead ? disks : Json::Value(Json::arrayValue));
+    _health.findings().setPeerDisksKnown(isRead);
     _health.set(Flag::peerDiskErrors, isHandling || !isRead);
 }
 
@@ -96,6 +96,7 @@ void PeerWatcher::requestHostname() {
     std::string hostname;
     _isHostnameKnown = TERN::HA::Daemon::GetRemoteHostname()(hostname);
     if (_isHostnameKnown) {
+        _health.findings().setPeerName(printable(hostname));
         TERNHAD_LOG(_events, "Remote hostname is " + printable(hostname));
     }
 }

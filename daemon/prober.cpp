@@ -157,6 +157,7 @@ void Prober::receive(FailureDetector& detector) noexcept {
                 }
                 if (reply == _expectedReply) {
                     detector.replyReceived(i);
+                    _health.findings().peerReplied();
                 }
             }
         } catch (const std::exception&) {

@@ -26,6 +26,10 @@ void notifyStopping() {
     sd_notify(KEEP_ENVIRONMENT, "STOPPING=1");
 }
 
+void notifyStatus(const std::string& status) {
+    sd_notify(KEEP_ENVIRONMENT, ("STATUS=" + status).c_str());
+}
+
 std::optional<std::chrono::microseconds> watchdogInterval() {
     std::uint64_t interval = 0;
     if (sd_watchdog_enabled(KEEP_ENVIRONMENT, &interval) <= 0) {
@@ -43,6 +47,8 @@ void notifyAlive() {
 void notifyReady() {}
 
 void notifyStopping() {}
+
+void notifyStatus(const std::string&) {}
 
 std::optional<std::chrono::microseconds> watchdogInterval() {
     return std::nullopt;

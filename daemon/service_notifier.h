@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <optional>
+#include <string>
 
 // Tells the service manager that started the daemon what state it is in. Without one, or in a build without
 // libsystemd, nothing happens. Each function may be called from any thread, and does not block but for a
@@ -13,6 +14,9 @@ void notifyReady();
 
 // The daemon is ending on purpose.
 void notifyStopping();
+
+// One line for people: what `systemctl status` shows.
+void notifyStatus(const std::string& status);
 
 // How often at least notifyAlive() is expected; nothing when nobody watches. Half of it is a good period.
 std::optional<std::chrono::microseconds> watchdogInterval();

@@ -25,6 +25,8 @@ TEST_F(ServiceNotifierTest, TellsEachState) {
     EXPECT_EQ(told(), "WATCHDOG=1");
     ternhad::notifyAlive();
     EXPECT_EQ(told(), "WATCHDOG=1");
+    ternhad::notifyStatus("peer alive");
+    EXPECT_EQ(told(), "STATUS=peer alive");
     ternhad::notifyStopping();
     EXPECT_EQ(told(), "STOPPING=1");
 }
@@ -33,6 +35,7 @@ TEST_F(ServiceNotifierTest, IsSilentWithoutAManager) {
     unsetenv("NOTIFY_SOCKET");
     ternhad::notifyReady();
     ternhad::notifyAlive();
+    ternhad::notifyStatus("peer alive");
     ternhad::notifyStopping();
     EXPECT_EQ(told(), "");
 }

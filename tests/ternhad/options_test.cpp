@@ -1,5 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <ostream>
 
@@ -101,7 +102,76 @@ TEST_F(OptionsTest, AnUnknownKeyInTheConfigurationIsAnError) {
                     "local-ip = 127.0.0.1\nremote-ip = 127.0.0.2\ninterface = lo\nfrobnicate = 1\n");
     const auto result = ternhad({"--config", "/tmp/ternhad.conf"});
     EXPECT_EQ(result.exitCode, 2);
-    EXPECT_THAT(result.error, HasSubstr("frobnicate"));
+    EXPECT_EQ(result.error, "ternhad: /tmp/ternhad.conf:4: unknown name: frobnicate\n");
+    EXPECT_FALSE(test::exists("/tmp/ha"));
+}
+
+struct WrongLine {
+    const char* name;
+    const char* line;
+    const char* message;
+};
+
+void PrintTo(const WrongLine& line, std::ostream* stream) {
+    *stream << line.name;
+}
+
+class WrongLineTest : public OptionsTest, public ::testing::WithParamInterface<WrongLine> {};
+
+TEST_P(WrongLineTest, IsNamedWithItsFileAndNumber) {
+    test::writeFile("/tmp/ternhad.conf", std::string("# Comment\nlocal-ip = 127.0.0.1\ninterface = lo\n\n") +
+                                             GetParam().line + '\n');
+    const auto result = ternhad({"--config", "/tmp/ternhad.conf", "--remote-ip", "127.0.0.2"});
+    EXPECT_EQ(result.exitCode, 2);
+    EXPECT_EQ(result.error, std::string("ternhad: /tmp/ternhad.conf:5: ") + GetParam().message + '\n');
+    EXPECT_FALSE(test::exists("/tmp/ha"));
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Lines, WrongLineTest,
+    ::testing::Values(
+        WrongLine{"Value", "check-interval = 0", "check-interval = 0: not in the range from 0.05 to 86400"},
+        WrongLine{"Word", "log-interval = often",
+                  "log-interval = often: Could not convert: --log-interval = often"},
+        WrongLine{"Path", "socket = here", "socket = here: not an absolute path: here"},
+        WrongLine{"Pair", "dead-after = 2",
+                  "dead-after = 2: --check-interval: above a third of --dead-after"},
+        WrongLine{"NoValue", "rotate-size", "not NAME = VALUE: rotate-size"},
+        WrongLine{"Section", "[daemon]", "not NAME = VALUE: [daemon]"},
+        WrongLine{"Twice", "interface = eth1", "interface stands in line 3 already"},
+        WrongLine{"OnlyForTheCommandLine", "check-config = true", "unknown name: check-config"},
+        WrongLine{"Program", "notify = /nowhere", "notify = /nowhere: /nowhere: No such file or directory"},
+        WrongLine{"NoProgram", "notify = /etc/hosts",
+                  "notify = /etc/hosts: not an executable file: /etc/hosts"},
+        WrongLine{"SocketOfNobody", "status-socket = /run/x",
+                  "status-socket = /run/x: needs --status-group"}),
+    [](const auto& line) { return line.param.name; });
+
+TEST_F(OptionsTest, TheCommandLineIsNotBlamedOnTheFile) {
+    test::writeFile("/tmp/ternhad.conf", "local-ip = 127.0.0.1\nremote-ip = 127.0.0.2\ninterface = lo\n");
+    const auto result = ternhad({"--config", "/tmp/ternhad.conf", "--local-ip", "127.0.0.300"});
+    EXPECT_EQ(result.exitCode, 2);
+    EXPECT_THAT(result.error, StartsWith("--local-ip: not an IPv4 address: 127.0.0.300\n"));
+}
+
+TEST_F(OptionsTest, TheConfigurationIsCheckedWithoutAStart) {
+    test::writeFile("/tmp/notify", "#!/bin/sh\n");
+    ASSERT_EQ(chmod("/tmp/notify", 0777), 0);
+    test::writeFile("/tmp/ternhad.conf",
+                    "local-ip = 10.0.0.1\nremote-ip = 10.0.0.2\ninterface = eth9\ndead-after = 6\n"
+                    "notify = /tmp/notify\nstatus-socket = /run/ternha/status.sock\nstatus-group = daemon\n");
+    const auto result = ternhad({"--config", "/tmp/ternhad.conf", "--check-config", "--interface", "lo"});
+    EXPECT_EQ(result.exitCode, 0);
+    EXPECT_EQ(result.output,
+              "local-ip = 10.0.0.1\nremote-ip = 10.0.0.2\ninterface = lo\nsocket = /run/ternha/control.sock\n"
+              "check-interval = 1\ndead-after = 6\nheartbeat-interval = 10\nlog-interval = 10\n"
+              "snapshot-interval = 3600\nrotate-size = 1048576\nnotify = /tmp/notify\n"
+              "status-socket = /run/ternha/status.sock\nstatus-group = daemon\n");
+    EXPECT_EQ(result.error,
+              "ternhad: interface lo does not have the address 10.0.0.1\n"
+              "ternhad: notify program /tmp/notify can be changed by others than root\n");
+    EXPECT_THAT(ternhad({"--config", "/tmp/ternhad.conf", "--check-config"}).error,
+                HasSubstr("interface eth9 does not exist: its packet rate is unknown\n"));
     EXPECT_FALSE(test::exists("/tmp/ha"));
 }
 
@@ -118,9 +188,10 @@ TEST_F(OptionsTest, TheBroadcastAddressOfAnInterfaceIsNoPeer) {
 TEST_F(OptionsTest, HelpAndVersionAreNoErrors) {
     const auto help = ternhad({"--help"});
     EXPECT_EQ(help.exitCode, 0);
-    for (const char* option : {"--local-ip", "--remote-ip", "--interface", "--socket", "--check-interval",
-                               "--dead-after", "--heartbeat-interval", "--log-interval",
-                               "--snapshot-interval", "--rotate-size", "--config", "--version"}) {
+    for (const char* option :
+         {"--local-ip", "--remote-ip", "--interface", "--socket", "--check-interval", "--dead-after",
+          "--heartbeat-interval", "--log-interval", "--snapshot-interval", "--rotate-size", "--notify",
+          "--status-socket", "--status-group", "--check-config", "--config", "--version"}) {
         EXPECT_THAT(help.output, HasSubstr(option));
     }
     const auto version = ternhad({"--version"});

@@ -35,6 +35,20 @@ TEST_F(WatchedDaemonTest, TellsItsManagerThatItIsReadyAndThatItStops) {
     EXPECT_EQ(manager.told(), "");
 }
 
+TEST_F(WatchedDaemonTest, TellsItsManagerTheStateOfTheNode) {
+    test::writeFile("/sys/block/md0/md/sync_action", "resync\n");
+    test::Process daemon = start(1h);
+    std::string status;
+    EXPECT_TRUE(test::eventually(20s, [&] {
+        const std::string told = manager.told();
+        status = told.rfind("STATUS=", 0) == 0 ? told : status;
+        return status.find("peer dead since 20") != std::string::npos;
+    })) << status;
+    EXPECT_THAT(status, ::testing::EndsWith(", not-connected, resync"));
+    daemon.signal(SIGTERM);
+    EXPECT_TRUE(daemon.waitFor(10s).has_value());
+}
+
 TEST_F(WatchedDaemonTest, ShowsItsProgressAgainAndAgain) {
     test::Process daemon = start(4s);
     ASSERT_TRUE(hears("READY=1")) << daemon.error();

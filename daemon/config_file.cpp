@@ -1,0 +1,92 @@
+#include "config_file.h"
+
+#include <algorithm>
+#include <sstream>
+
+namespace ternhad {
+
+namespace {
+
+// A mistake in the file whose place the message tells already.
+class LocatedError : public CLI::ConfigError {
+ public:
+    LocatedError(const std::string& place, const std::string& reason)
+        : ConfigError("ConfigError", place + reason, CLI::ExitCodes::ConfigError) {}
+};
+
+bool isGiven(const std::string& option, const std::vector<std::string>& arguments) {
+    return std::any_of(arguments.begin(), arguments.end(), [&option](const std::string& argument) {
+        return argument == option || argument.rfind(option + '=', 0) == 0;
+    });
+}
+
+// Whether `text` speaks of the option, not of another one whose name is longer.
+bool names(const std::string& text, const std::string& option) {
+    const std::size_t place = text.find(option);
+    if (place == std::string::npos) {
+        return false;
+    }
+    const std::size_t end = place + option.size();
+    return end == text.size() ||
+           (std::isalnum(static_cast<unsigned char>(text[end])) == 0 && text[end] != '-');
+}
+
+}  // namespace
+
+std::string ConfigFile::path() const {
+    return _app.get_config_ptr()->as<std::string>();
+}
+
+void ConfigFile::scan(const std::string& text) const {
+    std::istringstream input(text);
+    std::string line;
+    for (int number = 1; std::getline(input, line); ++number) {
+        line = CLI::detail::trim_copy(line);
+        if (line.empty() || line.front() == '#' || line.front() == ';') {
+            continue;
+        }
+        const std::string place = path() + ':' + std::to_string(number) + ": ";
+        const std::size_t equals = line.find('=');
+        if (equals == std::string::npos || line.front() == '[') {
+            throw LocatedError(place, "not NAME = VALUE: " + line);
+        }
+        const std::string name = CLI::detail::trim_copy(line.substr(0, equals));
+        const CLI::Option* const option = _app.get_option_no_throw("--" + name);
+        if (name.empty() || option == nullptr || !option->get_configurable()) {
+            throw LocatedError(place, "unknown name: " + name);
+        }
+        const auto [known, isNew] = _lines.insert({name, {number, line}});
+        if (!isNew) {
+            throw LocatedError(place,
+                               name + " stands in line " + std::to_string(known->second.number) + " already");
+        }
+    }
+}
+
+std::vector<CLI::ConfigItem> ConfigFile::from_config(std::istream& input) const {
+    std::ostringstream text;
+    text << input.rdbuf();
+    scan(text.str());
+    std::istringstream again(text.str());
+    return ConfigINI::from_config(again);
+}
+
+std::string ConfigFile::located(const CLI::ParseError& error,
+                                const std::vector<std::string>& arguments) const {
+    std::string text = error.what();
+    if (dynamic_cast<const LocatedError*>(&error) != nullptr) {
+        return text;
+    }
+    for (const auto& [name, line] : _lines) {
+        const std::string option = "--" + name;
+        if (names(text, option) && !isGiven(option, arguments)) {
+            if (text.rfind(option + ": ", 0) == 0) {
+                text.erase(0, option.size() + 2);
+            }
+            return path() + ':' + std::to_string(line.number) + ": " + line.text + ": " + text;
+        }
+    }
+    return {};
+}
+
+}  // namespace ternhad

@@ -1,0 +1,65 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <mutex>
+#include <optional>
+#include <string>
+
+#include "wall_clock.h"
+
+namespace ternhad {
+
+// What the daemon has found out and the health record has no place for. Thread-safe.
+class Findings {
+ public:
+    struct Figure {
+        std::optional<double> value;
+        std::chrono::system_clock::time_point time;  // of the measurement
+    };
+
+    // The peer has replied to a liveness probe. Neither blocks nor allocates.
+    void peerReplied() noexcept { _lastReply = secondsOf(wallClock()); }
+
+    // Seconds since 1970, 0 before the first reply.
+    double lastReply() const noexcept { return _lastReply; }
+
+    void setPeerName(const std::string& name) {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        _peerName = name;
+    }
+    std::string peerName() const {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        return _peerName;
+    }
+
+    // Whether the peer's report could be read: without it the names of its disks are unknown.
+    void setPeerDisksKnown(bool areKnown) noexcept { _arePeerDisksKnown = areKnown; }
+    bool arePeerDisksKnown() const noexcept { return _arePeerDisksKnown; }
+
+    // Nothing: it is unknown from now on.
+    void setLatency(std::optional<double> milliseconds) { set(_latency, milliseconds); }
+    void setNonOkRate(std::optional<double> rate) { set(_nonOkRate, rate); }
+
+    Figure latency() const { return get(_latency); }
+    Figure nonOkRate() const { return get(_nonOkRate); }
+
+ private:
+    void set(Figure& figure, std::optional<double> value) {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        figure = {value, wallClock()};
+    }
+    Figure get(const Figure& figure) const {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        return figure;
+    }
+
+    std::atomic<double> _lastReply{0};
+    std::atomic<bool> _arePeerDisksKnown{false};
+    mutable std::mutex _mutex;  // guards the rest
+    std::string _peerName;
+    Figure _latency;
+    Figure _nonOkRate;
+};
+
+}  // namespace ternhad

@@ -1,0 +1,38 @@
+#pragma once
+
+#include <array>
+#include <cstddef>
+#include <optional>
+
+namespace ternhad {
+
+// What can change about the two nodes.
+enum class Flag { peerAlive, peerRebooting, peerResync, peerDiskErrors, drbdConnected, resync, diskErrors };
+constexpr std::size_t FLAGS = 7;
+
+// What a flag is called in events: itself, and what holds when it is set or clear.
+struct FlagName {
+    const char* name;
+    const char* set;
+    const char* clear;
+    bool isSetGood;
+};
+
+inline const FlagName& nameOf(Flag flag) {
+    static constexpr std::array<FlagName, FLAGS> NAMES = {{
+        {"peer", "peer-alive", "peer-dead", true},
+        {"peer-reboot", "peer-rebooting", "peer-not-rebooting", false},
+        {"peer-resync", "peer-resync", "peer-no-resync", false},
+        {"peer-disk-errors", "peer-disk-errors", "peer-no-disk-errors", false},
+        {"drbd", "connected", "not-connected", true},
+        {"resync", "resync", "no-resync", false},
+        {"disk-errors", "disk-errors", "no-disk-errors", false},
+    }};
+    return NAMES.at(static_cast<std::size_t>(flag));
+}
+
+inline const char* conditionOf(Flag flag, std::optional<bool> value) {
+    return !value ? "unknown" : *value ? nameOf(flag).set : nameOf(flag).clear;
+}
+
+}  // namespace ternhad

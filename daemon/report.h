@@ -1,0 +1,29 @@
+#pragma once
+
+#include <json/value.h>
+
+#include "health.h"
+#include "options.h"
+#include "transitions.h"
+
+namespace ternhad {
+
+// Makes the report, version 1, for clients of the control socket.
+class Reporter {
+ public:
+    Reporter(const Options& options, Health& health) : _options(options), _health(health) {}
+
+    Json::Value report() const;
+
+    // A line for each change, and its JSON.
+    static Json::Value event(const Transition& transition);
+
+ private:
+    Json::Value flag(Flag flag) const;
+
+    const Options& _options;
+    Health& _health;
+    double _started = secondsOf(wallClock());
+};
+
+}  // namespace ternhad

@@ -1,0 +1,22 @@
+#pragma once
+
+#include <chrono>
+#include <ctime>
+
+namespace ternhad {
+
+// The wall clock, asked of the kernel: the standard library's own fails after 2038 on 32-bit machines.
+inline std::chrono::system_clock::time_point wallClock() noexcept {
+    timespec now = {};
+    clock_gettime(CLOCK_REALTIME, &now);
+    return std::chrono::system_clock::time_point(
+        std::chrono::duration_cast<std::chrono::system_clock::duration>(
+            std::chrono::seconds(now.tv_sec) + std::chrono::nanoseconds(now.tv_nsec)));
+}
+
+// Seconds since 1970.
+inline double secondsOf(std::chrono::system_clock::time_point time) noexcept {
+    return std::chrono::duration<double>(time.time_since_epoch()).count();
+}
+
+}  // namespace ternhad

@@ -1,0 +1,260 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <filesystem>
+
+#include "recipes/programs.h"
+#include "ternhad/machine.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::HasSubstr;
+using ::testing::Not;
+using ::testing::StartsWith;
+
+constexpr char SYNC_ACTION[] = "/sys/block/md0/md/sync_action";
+constexpr char UP_TO_DATE[] = " 0: cs:Connected ro:Primary/Secondary ds:UpToDate/UpToDate C r-----\n";
+
+void writeProgram(const std::string& path, const std::string& text) {
+    test::writeFile(path, text);
+    ASSERT_EQ(chmod(path.c_str(), 0755), 0);
+}
+
+class RecipesTest : public ::testing::Test {
+ protected:
+    RecipesTest() { test::installPrograms(); }
+};
+
+// Two machines of the cluster with ternhad on both.
+class Cluster {
+ public:
+    Cluster() {
+        test::connect(a.node, a.address, b.node, b.address);
+        a.write("/proc/drbd", UP_TO_DATE);
+        b.write("/proc/drbd", UP_TO_DATE);
+        b.start();
+    }
+
+    bool start(const std::vector<std::string>& options = {}) {
+        a.start(options);
+        return test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); });
+    }
+
+    bool eventuallyContains(const std::string& file, const std::string& text) {
+        return test::eventually(60s, [&] {
+            return test::exists(a.node.path(file)) &&
+                   test::readFile(a.node.path(file)).find(text) != std::string::npos;
+        });
+    }
+
+    test::Machine a{"node-a", "10.0.0.1", "10.0.0.2"};
+    test::Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
+};
+
+TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhereThatIsSafe) {
+    writeProgram("/usr/local/sbin/ternha-role.recipe", test::recipe("/usr/local/sbin/ternha-role"));
+    writeProgram("/usr/local/sbin/ternha-role",
+                 "#!/bin/sh\n/usr/local/sbin/ternha-role.recipe \"$@\"\necho \"$3 $?\" >>/tmp/role\n");
+    writeProgram("/usr/sbin/drbdadm", "#!/bin/sh\necho \"$*\" >>/tmp/drbdadm\n");
+    Cluster cluster;
+    test::Machine& a = cluster.a;
+    // The service network: its only other member never answers.
+    ASSERT_EQ(a.node.run({"ip", "link", "add", "eth0", "type", "veth", "peer", "name", "cable"}).exitCode, 0);
+    for (const char* device : {"eth0", "cable"}) {
+        ASSERT_EQ(a.node.run({"ip", "link", "set", device, "up"}).exitCode, 0);
+    }
+    ASSERT_EQ(a.node.run({"ip", "address", "add", "192.0.2.1/24", "dev", "eth0"}).exitCode, 0);
+    a.write("/etc/keepalived/keepalived.conf", test::recipe("/etc/keepalived/keepalived.conf"));
+    ASSERT_TRUE(cluster.start());
+    const auto hasAddress = [&a](bool expected) {
+        return test::eventually(60s, [&] {
+            const auto addresses = a.node.run({"ip", "address", "show", "eth0"}).output;
+            return (addresses.find("192.0.2.10") != std::string::npos) == expected;
+        });
+    };
+
+    test::Process keepalived = a.node.start({"keepalived", "--dont-fork", "--log-console", "--vrrp",
+                                             "--pid=/run/k.pid", "--vrrp_pid=/run/v.pid"});
+    EXPECT_TRUE(hasAddress(true)) << keepalived.output() << keepalived.error();
+    EXPECT_TRUE(cluster.eventuallyContains("/tmp/drbdadm", "primary r0\n"));
+
+    a.write(SYNC_ACTION, "resync\n");
+    EXPECT_TRUE(hasAddress(false));
+    EXPECT_TRUE(cluster.eventuallyContains("/tmp/role", "FAULT 0\n"));
+    EXPECT_THAT(test::readFile(a.node.path("/tmp/drbdadm")),
+                ::testing::EndsWith("primary r0\nsecondary r0\n"));
+
+    // DRBD is down and the peer alive: it may be writing.
+    a.write("/proc/drbd", " 0: cs:WFConnection ro:Secondary/Unknown ds:UpToDate/DUnknown C r-----\n");
+    ASSERT_TRUE(test::eventually(20s, [&a] { return a.sees("isDRBDConnect", false); }));
+    a.write(SYNC_ACTION, "idle\n");
+    EXPECT_TRUE(hasAddress(true));
+    EXPECT_TRUE(cluster.eventuallyContains("/tmp/role", "MASTER 1\n"));
+    EXPECT_THAT(test::readFile(a.node.path("/tmp/drbdadm")), Not(::testing::EndsWith("primary r0\n")));
+
+    // Once it is dead, this node may.
+    a.write(SYNC_ACTION, "resync\n");
+    EXPECT_TRUE(hasAddress(false));
+    cluster.b.daemon->signal(SIGKILL);
+    ASSERT_TRUE(test::eventually(20s, [&a] { return a.sees("isRemoteAlive", false); }));
+    a.write(SYNC_ACTION, "idle\n");
+    EXPECT_TRUE(test::eventually(60s, [&a] {
+        const auto orders = test::lines(test::readFile(a.node.path("/tmp/drbdadm")));
+        return orders.back() == "primary r0";
+    }));
+    keepalived.signal(SIGTERM);
+    EXPECT_TRUE(keepalived.waitFor(20s).has_value());
+}
+
+class NrpeTest : public RecipesTest {
+ protected:
+    NrpeTest() {
+        test::appendFile("/etc/passwd", "nagios:x:990:990::/:/bin/sh\n");
+        test::appendFile("/etc/group", "nagios:x:990:\n");
+        test::appendFile("/etc/shadow", "nagios:*:1::::::\n");
+    }
+
+    // The answer of the node's NRPE with this configuration of the check.
+    static test::CommandResult ask(Cluster& cluster, const std::string& configuration) {
+        test::Machine& a = cluster.a;
+        a.write("/etc/hosts", "127.0.0.1 localhost node-a\n");
+        a.write("/etc/nagios/nrpe.d/ternha.cfg", configuration);
+        a.write("/etc/nagios/nrpe.cfg",
+                "server_port=5666\nserver_address=127.0.0.1\nnrpe_user=nagios\nnrpe_group=nagios\n"
+                "allowed_hosts=127.0.0.1\npid_file=/run/nrpe.pid\ninclude_dir=/etc/nagios/nrpe.d\n");
+        test::Process nrpe = a.node.start({"nrpe", "-n", "-f", "-c", "/etc/nagios/nrpe.cfg"});
+        test::CommandResult result;
+        EXPECT_TRUE(test::eventually(30s,
+                                     [&] {
+                                         result = a.node.run({"/usr/lib/nagios/plugins/check_nrpe", "-n",
+                                                              "-2", "-H", "127.0.0.1", "-c", "check_ternha"});
+                                         return result.output.rfind("TERNHA", 0) == 0;
+                                     }))
+            << result.output << result.error << nrpe.error();
+        nrpe.signal(SIGTERM);
+        nrpe.waitFor(10s);
+        return result;
+    }
+};
+
+TEST_F(NrpeTest, RunsTheCheckThroughSudo) {
+    Cluster cluster;
+    test::Machine& a = cluster.a;
+    a.write("/etc/sudoers", "@includedir /etc/sudoers.d\n");
+    a.write("/etc/sudoers.d/ternha", test::recipe("/etc/sudoers.d/ternha"));
+    ASSERT_EQ(chmod(a.node.path("/etc/sudoers").c_str(), 0440), 0);
+    ASSERT_EQ(chmod(a.node.path("/etc/sudoers.d/ternha").c_str(), 0440), 0);
+    EXPECT_EQ(a.node.run({"visudo", "--check"}).exitCode, 0);
+    ASSERT_TRUE(cluster.start());
+
+    const std::string configuration = test::recipe("/etc/nagios/nrpe.d/ternha.cfg");
+    const auto good = ask(cluster, configuration);
+    EXPECT_EQ(good.exitCode, 0);
+    EXPECT_THAT(good.output, StartsWith("TERNHA OK - peer alive"));
+
+    // Nothing else may be run.
+    EXPECT_NE(a.node
+                  .run({"setpriv", "--reuid", "990", "--regid", "990", "--clear-groups", "sudo", "-n",
+                        "/usr/sbin/ternhactl", "reboot-peer", "--yes"})
+                  .exitCode,
+              0);
+
+    a.daemon->signal(SIGTERM);
+    a.daemon->waitFor(10s);
+    const auto bad = ask(cluster, configuration);
+    EXPECT_EQ(bad.exitCode, 3);
+    EXPECT_THAT(bad.output, StartsWith("TERNHA UNKNOWN - ternhad does not answer"));
+}
+
+TEST_F(RecipesTest, PromtoolAcceptsMetricsAndRules) {
+    Cluster cluster;
+    ASSERT_TRUE(cluster.start());
+    const auto metrics = cluster.a.node.run(
+        {"/bin/sh", "-c",
+         "ternhactl metrics --output /tmp/ternha.prom && promtool check metrics </tmp/ternha.prom"});
+    EXPECT_EQ(metrics.exitCode, 0);
+    EXPECT_EQ(metrics.output + metrics.error, "");
+
+    std::filesystem::copy_file(PROJECT_DIR "/packaging/monitoring/ternha.rules.yml", "/tmp/ternha.rules.yml");
+    std::filesystem::copy_file(RULES_TEST, "/tmp/ternha.rules.test.yml");
+    for (const std::string mode :
+         {"check rules /tmp/ternha.rules.yml", "test rules /tmp/ternha.rules.test.yml"}) {
+        const auto result = test::run({"/bin/sh", "-c", "promtool " + mode});
+        EXPECT_EQ(result.exitCode, 0) << result.output << result.error;
+        EXPECT_THAT(result.output, HasSubstr("SUCCESS"));
+    }
+}
+
+constexpr char COROSYNC[] = R"(totem {
+    version: 2
+    cluster_name: ternha
+    transport: knet
+    crypto_cipher: none
+    crypto_hash: none
+}
+nodelist {
+    node {
+        ring0_addr: 127.0.0.1
+        name: node-a
+        nodeid: 1
+    }
+}
+quorum {
+    provider: corosync_votequorum
+    expected_votes: 1
+}
+logging {
+    to_stderr: yes
+    to_syslog: no
+}
+system {
+    allow_knet_handle_fallback: yes
+    sched_rr: no
+    move_to_root_cgroup: no
+}
+)";
+
+TEST_F(RecipesTest, PacemakerKnowsWhetherTheNodeIsFit) {
+    test::appendFile("/etc/passwd", "hacluster:x:991:991::/:/bin/sh\n");
+    test::appendFile("/etc/group", "haclient:x:991:\n");
+    writeProgram("/usr/local/sbin/ternha-attribute", test::recipe("/usr/local/sbin/ternha-attribute"));
+    Cluster cluster;
+    test::Machine& a = cluster.a;
+    a.write("/etc/corosync/corosync.conf", COROSYNC);
+    ASSERT_EQ(
+        a.node
+            .run({"/bin/sh", "-ec",
+                  "ln -s /run /var/run; mkdir -p /run/lock /run/crm /var/log/cluster /var/log/pacemaker "
+                  "/var/lib/corosync /var/lib/pacemaker/cib /var/lib/pacemaker/pengine "
+                  "/var/lib/pacemaker/cores /var/lib/pacemaker/blackbox; ln -s /run/lock /var/lock; "
+                  "chown -R hacluster:haclient /run/crm /var/log/pacemaker /var/lib/pacemaker"})
+            .exitCode,
+        0);
+    test::Process corosync = a.node.start({"corosync", "-f"});
+    test::Process pacemaker = a.node.start({"/bin/sh", "-c", "PCMK_logfile=none exec pacemakerd -f"});
+    ASSERT_TRUE(
+        test::eventually(120s,
+                         [&] {
+                             return a.node.run({"attrd_updater", "-n", "probe", "-U", "1"}).exitCode == 0;
+                         }))
+        << corosync.error() << pacemaker.error();
+
+    ASSERT_TRUE(cluster.start({"--notify", "/usr/local/sbin/ternha-attribute"}));
+    const auto isFit = [&a](const std::string& value) {
+        return test::eventually(60s, [&] {
+            return a.node.run({"attrd_updater", "-n", "ternha-fit", "-Q"})
+                       .output.find("value=\"" + value + '"') != std::string::npos;
+        });
+    };
+    EXPECT_TRUE(isFit("1"));
+    a.write(SYNC_ACTION, "resync\n");
+    EXPECT_TRUE(isFit("0"));
+    a.write(SYNC_ACTION, "idle\n");
+    EXPECT_TRUE(isFit("1"));
+    pacemaker.signal(SIGTERM);
+    EXPECT_TRUE(pacemaker.waitFor(60s).has_value());
+}
+
+}  // namespace
