@@ -56,7 +56,8 @@ std::string configurationText(const Options& options) {
 std::vector<std::string> warningsOf(const Options& options) {
     std::vector<std::string> warnings;
     if (if_nametoindex(options.interface.c_str()) == 0) {
-        warnings.push_back("interface " + options.interface + " does not exist: its packet rate is unknown");
+        warnings.push_back("there is no network interface " + options.interface +
+                           " (yet): its packet rate is unknown");
     } else if (options.isCheckOnly && !hasAddress(options.interface, options.localIp)) {
         warnings.push_back("interface " + options.interface + " does not have the address " +
                            options.localIp);

@@ -81,7 +81,6 @@ std::string checkInterfaceName(const std::string& name) {
     return {};
 }
 
-// Not by CLI::Range, to which "nan" is in every range.
 std::string checkProgram(const std::string& path) {
     struct stat info = {};
     if (path.empty() || path.front() != '/') {
@@ -97,6 +96,7 @@ std::string checkGroup(const std::string& name) {
     return getgrnam(name.c_str()) != nullptr ? "" : "no such group: " + name;
 }
 
+// Not by CLI::Range, to which "nan" is in every range.
 void addInterval(CLI::App& app, const std::string& name, Seconds& value, double least, double most,
                  const std::string& description) {
     const std::string range = "from " + CLI::detail::to_string(least) + " to " + CLI::detail::to_string(most);

@@ -159,7 +159,7 @@ TEST_F(DaemonTest, UsesABufferDirectoryOfItsOwn) {
 TEST_F(DaemonTest, WarnsOfAnInterfaceThatDoesNotExist) {
     test::Process daemon(test::daemonArguments("127.0.0.1", "127.0.0.2", "eth9"));
     EXPECT_TRUE(test::eventually(10s, isUp)) << daemon.error();
-    EXPECT_EQ(daemon.error(), "ternhad: warning: there is no network interface eth9 (yet)\n");
+    EXPECT_THAT(daemon.error(), HasSubstr("there is no network interface eth9 (yet)"));
     stop(daemon);
 }
 

@@ -171,7 +171,7 @@ TEST_F(OptionsTest, TheConfigurationIsCheckedWithoutAStart) {
               "ternhad: interface lo does not have the address 10.0.0.1\n"
               "ternhad: notify program /tmp/notify can be changed by others than root\n");
     EXPECT_THAT(ternhad({"--config", "/tmp/ternhad.conf", "--check-config"}).error,
-                HasSubstr("interface eth9 does not exist: its packet rate is unknown\n"));
+                HasSubstr("there is no network interface eth9 (yet): its packet rate is unknown\n"));
     EXPECT_FALSE(test::exists("/tmp/ha"));
 }
 
