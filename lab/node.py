@@ -109,12 +109,19 @@ class Node:
 
     def log(self) -> list[str]:
         """The lines of the daemon log: those on disk, then those that are still buffered."""
-        return self.run("cat /var/log/ha/ha.daemon.log /tmp/ha/ha.daemon.log 2>/dev/null || true").splitlines()
+        return self._read_log("")
 
     def full_log(self) -> list[str]:
         """The lines of the daemon log with those of its archives."""
-        archives = "for file in $(ls -r /var/log/ha/ha.daemon.log.*.xz 2>/dev/null); do xz -dc $file; done"
-        return self.run(f"{archives}; true").splitlines() + self.log()
+        return self._read_log("for file in $(ls -rv ha.daemon.log.*.xz 2>/dev/null); do xz -dc $file; done;")
+
+    def _read_log(self, archives: str) -> list[str]:
+        # Again when the daemon has moved lines meanwhile: they could be missing in what was read.
+        return self.run(
+            "cd /var/log/ha || exit 0; state() { stat --format=%i-%s ha.daemon.log 2>/dev/null; };"
+            f" while before=$(state); text=$({archives} cat ha.daemon.log /tmp/ha/ha.daemon.log 2>/dev/null);"
+            ' [ "$before" != "$(state)" ]; do :; done; printf "%s\n" "$text"'
+        ).splitlines()
 
     def has_logged(self, text: str) -> bool:
         return any(line.endswith(text) for line in self.log())
