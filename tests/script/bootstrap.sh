@@ -34,7 +34,7 @@ bootstrap_as 1000 test
 stub dpkg-query 'exit 1'
 bootstrap_as 1000 demo
 [ "$code$calls" = 1 ] || fail "without rights: exit code $code"
-says "apt-get install --no-install-recommends cmake g++ "
+says "apt-get install --no-install-recommends bubblewrap cmake g++ "
 
 # One library is there for the other architecture only, one for this one only; the index is fetched with errors.
 stub dpkg-query 'case $3 in
