@@ -10,18 +10,15 @@ namespace TERN::HA::Daemon {
 
 namespace {
 
-// The counters' titles, each with the index of its column. None under a title that is not known.
-std::map<std::string, long long> columnsOf(const char* title) {
+// Maps each counter's title to the index of its column.
+std::map<std::string, long long> columnsOf(const std::vector<std::string>& title) {
     std::map<std::string, long long> columns;
-    // Frozen: docs/compatibility.md#unknown-title
-    if (startsWith(title, "Iface")) {
-        long long index = 0;
-        for (const std::string& column : split(title)) {
-            if (startsWith(column, "RX") || startsWith(column, "TX")) {
-                columns.emplace(column, index);
-            }
-            ++index;
+    long long index = 0;
+    for (const std::string& column : title) {
+        if (startsWith(column, "RX") || startsWith(column, "TX")) {
+            columns.emplace(column, index);
         }
+        ++index;
     }
     return columns;
 }
@@ -34,22 +31,25 @@ InterfaceListing readInterfaceListing(std::FILE* stream, const std::string& ifna
     if (readLine(stream, line).empty()) {
         return {Outcome::NO_TITLE, {}, {}};
     }
+    // Frozen: docs/compatibility.md#unknown-title
+    const std::vector<std::string> title =
+        startsWith(line.data(), "Iface") ? split(line.data()) : std::vector<std::string>();
     // Frozen: docs/compatibility.md#unlisted-interface
-    InterfaceListing listing = {Outcome::READ, columnsOf(line.data()), {}};
+    InterfaceListing listing = {Outcome::READ, columnsOf(title), {}};
     bool isFound = false;
     while (!readLine(stream, line).empty()) {
         // Frozen: docs/compatibility.md#interface-prefix
         // A prefix suffices (eth1 finds eth10 as well); the first such line counts.
-        if (isFound || !startsWith(line.data(), ifname)) {
+        if (isFound || listing.counters.empty() || !startsWith(line.data(), ifname)) {
             continue;
         }
         isFound = true;
         const std::vector<std::string> tokens = split(line.data());
+        if (tokens.size() < title.size()) {
+            return {Outcome::LINE_TOO_SHORT, {}, {}};
+        }
         for (auto& [name, value] : listing.counters) {
             const auto index = static_cast<std::size_t>(value);
-            if (index >= tokens.size()) {
-                return {Outcome::LINE_TOO_SHORT, {}, {}};
-            }
             // Frozen: docs/compatibility.md#counter-bases
             value = std::strtoll(tokens[index].c_str(), nullptr, 0);
             if (value == LLONG_MAX || value == LLONG_MIN) {

@@ -63,11 +63,21 @@ TEST(InterfaceListingTest, FailsWithoutATitle) {
 }
 
 TEST(InterfaceListingTest, FailsOnALineThatIsTooShort) {
-    EXPECT_EQ(read(TITLE + std::string("eth1 1500 10 20\n")).outcome, Outcome::LINE_TOO_SHORT);
+    EXPECT_EQ(read(TITLE + std::string("eth1 1500 10 20 30\n")).outcome, Outcome::LINE_TOO_SHORT);
+}
+
+TEST(InterfaceListingTest, SkipsEveryLineUnderATitleWithoutCounters) {
+    const InterfaceListing listing = read("Iface MTU Flg\neth1 1500\n");
+    EXPECT_EQ(listing.outcome, Outcome::READ);
+    EXPECT_THAT(listing.counters, IsEmpty());
+}
+
+TEST(InterfaceListingTest, KnowsATitleByItsFirstCharacters) {
+    EXPECT_THAT(read(std::string(" ") + TITLE).counters, IsEmpty());
 }
 
 TEST(InterfaceListingTest, NamesTheCounterThatIsOutOfRange) {
-    const InterfaceListing listing = read(TITLE + std::string("eth1 1500 10 99999999999999999999 30\n"));
+    const InterfaceListing listing = read(TITLE + std::string("eth1 1500 10 99999999999999999999 30 BMRU\n"));
     EXPECT_EQ(listing.outcome, Outcome::OUT_OF_RANGE);
     EXPECT_EQ(listing.token, "99999999999999999999");
 }
