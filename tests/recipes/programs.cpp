@@ -41,7 +41,6 @@ void installPrograms() {
             layOver(entry.path());
         }
     }
-    layOver("/etc/pam.d");
     fs::copy_file(TERNHAD, "/usr/sbin/ternhad");
     fs::copy_file(TERNHACTL, "/usr/sbin/ternhactl");
 }

@@ -22,6 +22,26 @@ void writeProgram(const std::string& path, const std::string& text) {
     ASSERT_EQ(chmod(path.c_str(), 0755), 0);
 }
 
+// Gives the node an empty directory of its own below /etc, in place of the machine's.
+void makeEmpty(test::Machine& machine, const std::string& directory) {
+    ASSERT_EQ(machine.node.run({"/bin/sh", "-c", "rm -rf " + directory + " && mkdir " + directory}).exitCode,
+              0);
+}
+
+// Gives the node a user with a group of the same number; the machine may have another of that name.
+void addUser(test::Machine& machine, const std::string& user, const std::string& group,
+             const std::string& id) {
+    const std::string entry = ':' + id + ':' + id + "::/:/bin/sh";
+    ASSERT_EQ(
+        machine.node
+            .run({"/bin/sh", "-ec",
+                  "sed -i '/^" + user + ":/d' /etc/passwd /etc/shadow; sed -i '/^" + group +
+                      ":/d' /etc/group; echo '" + user + ":x" + entry + "' >>/etc/passwd; echo '" + group +
+                      ":x:" + id + ":' >>/etc/group; echo '" + user + ":*:1::::::' >>/etc/shadow"})
+            .exitCode,
+        0);
+}
+
 class RecipesTest : public ::testing::Test {
  protected:
     RecipesTest() { test::installPrograms(); }
@@ -66,6 +86,7 @@ TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhereThatIsSafe) {
         ASSERT_EQ(a.node.run({"ip", "link", "set", device, "up"}).exitCode, 0);
     }
     ASSERT_EQ(a.node.run({"ip", "address", "add", "192.0.2.1/24", "dev", "eth0"}).exitCode, 0);
+    makeEmpty(a, "/etc/keepalived");
     a.write("/etc/keepalived/keepalived.conf", test::recipe("/etc/keepalived/keepalived.conf"));
     ASSERT_TRUE(cluster.start());
     const auto hasAddress = [&a](bool expected) {
@@ -110,16 +131,11 @@ TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhereThatIsSafe) {
 
 class NrpeTest : public RecipesTest {
  protected:
-    NrpeTest() {
-        test::appendFile("/etc/passwd", "nagios:x:990:990::/:/bin/sh\n");
-        test::appendFile("/etc/group", "nagios:x:990:\n");
-        test::appendFile("/etc/shadow", "nagios:*:1::::::\n");
-    }
-
     // The answer of the node's NRPE with this configuration of the check.
     static test::CommandResult ask(Cluster& cluster, const std::string& configuration) {
         test::Machine& a = cluster.a;
         a.write("/etc/hosts", "127.0.0.1 localhost node-a\n");
+        makeEmpty(a, "/etc/nagios");
         a.write("/etc/nagios/nrpe.d/ternha.cfg", configuration);
         a.write("/etc/nagios/nrpe.cfg",
                 "server_port=5666\nserver_address=127.0.0.1\nnrpe_user=nagios\nnrpe_group=nagios\n"
@@ -139,27 +155,36 @@ class NrpeTest : public RecipesTest {
     }
 };
 
-TEST_F(NrpeTest, RunsTheCheckThroughSudo) {
+TEST_F(NrpeTest, SudoLetsNagiosRunTheCheckAndNothingElse) {
     Cluster cluster;
     test::Machine& a = cluster.a;
-    a.write("/etc/sudoers", "@includedir /etc/sudoers.d\n");
+    addUser(a, "nagios", "nagios", "990");
+    makeEmpty(a, "/etc/sudoers.d");
+    a.write("/etc/sudoers", "root ALL=(ALL) ALL\n@includedir /etc/sudoers.d\n");
     a.write("/etc/sudoers.d/ternha", test::recipe("/etc/sudoers.d/ternha"));
     ASSERT_EQ(chmod(a.node.path("/etc/sudoers").c_str(), 0440), 0);
     ASSERT_EQ(chmod(a.node.path("/etc/sudoers.d/ternha").c_str(), 0440), 0);
     EXPECT_EQ(a.node.run({"visudo", "--check"}).exitCode, 0);
-    ASSERT_TRUE(cluster.start());
-
     const std::string configuration = test::recipe("/etc/nagios/nrpe.d/ternha.cfg");
+    EXPECT_EQ(configuration, "command[check_ternha]=/usr/bin/sudo -n /usr/sbin/ternhactl check\n");
+    const auto mayRun = [&a](const std::string& command) {
+        return a.node.run({"/bin/sh", "-c", "sudo -l -U nagios " + command}).exitCode == 0;
+    };
+    EXPECT_TRUE(mayRun("/usr/sbin/ternhactl check"));
+    EXPECT_FALSE(mayRun("/usr/sbin/ternhactl reboot-peer --yes"));
+    EXPECT_FALSE(mayRun("/bin/sh"));
+}
+
+TEST_F(NrpeTest, RunsTheCheckOnTheStatusSocket) {
+    Cluster cluster;
+    test::Machine& a = cluster.a;
+    addUser(a, "nagios", "nagios", "990");
+    ASSERT_EQ(a.node.run({"mkdir", "-m", "711", "/run/ternha"}).exitCode, 0);
+    ASSERT_TRUE(cluster.start({"--status-socket", "/run/ternha/status.sock", "--status-group", "nagios"}));
+    const std::string configuration = test::recipe("/etc/nagios/nrpe.d/ternha-status.cfg");
     const auto good = ask(cluster, configuration);
     EXPECT_EQ(good.exitCode, 0);
     EXPECT_THAT(good.output, StartsWith("TERNHA OK - peer alive"));
-
-    // Nothing else may be run.
-    EXPECT_NE(a.node
-                  .run({"setpriv", "--reuid", "990", "--regid", "990", "--clear-groups", "sudo", "-n",
-                        "/usr/sbin/ternhactl", "reboot-peer", "--yes"})
-                  .exitCode,
-              0);
 
     a.daemon->signal(SIGTERM);
     a.daemon->waitFor(10s);
@@ -217,11 +242,11 @@ system {
 )";
 
 TEST_F(RecipesTest, PacemakerKnowsWhetherTheNodeIsFit) {
-    test::appendFile("/etc/passwd", "hacluster:x:991:991::/:/bin/sh\n");
-    test::appendFile("/etc/group", "haclient:x:991:\n");
     writeProgram("/usr/local/sbin/ternha-attribute", test::recipe("/usr/local/sbin/ternha-attribute"));
     Cluster cluster;
     test::Machine& a = cluster.a;
+    addUser(a, "hacluster", "haclient", "991");
+    makeEmpty(a, "/etc/corosync");
     a.write("/etc/corosync/corosync.conf", COROSYNC);
     ASSERT_EQ(
         a.node
