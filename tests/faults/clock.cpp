@@ -6,7 +6,7 @@
 #include <atomic>
 #include <utility>
 
-#include "support/real_function.h"
+#include "faults/real_function.h"
 
 namespace {
 

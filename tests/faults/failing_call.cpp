@@ -16,7 +16,7 @@
 #include <cstring>
 #include <utility>
 
-#include "support/real_function.h"
+#include "faults/real_function.h"
 
 namespace {
 

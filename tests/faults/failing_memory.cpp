@@ -7,7 +7,7 @@
 #include <cstring>
 #include <new>
 
-#include "support/real_function.h"
+#include "faults/real_function.h"
 
 namespace {
 

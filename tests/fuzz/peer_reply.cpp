@@ -9,7 +9,7 @@
 
 #include "checker.h"
 #include "fuzz/fuzz.h"
-#include "support/real_function.h"
+#include "faults/real_function.h"
 
 namespace {
 

@@ -9,6 +9,13 @@
 
 namespace test {
 
+/// Throws std::system_error with an error number, by default the current one, unless `done`.
+inline void check(bool done, const std::string& what, int error = errno) {
+    if (!done) {
+        throw std::system_error(error, std::generic_category(), what);
+    }
+}
+
 /// Owns a file descriptor.
 class Descriptor {
  public:
@@ -16,25 +23,20 @@ class Descriptor {
 
     /// Takes over the result of a system call; throws std::system_error with the current errno when it is -1.
     Descriptor(int descriptor, const std::string& what) : _descriptor(descriptor) {
-        if (descriptor == -1) {
-            throw std::system_error(errno, std::generic_category(), what);
-        }
+        check(descriptor != -1, what);
     }
     Descriptor(Descriptor&& other) noexcept : _descriptor(std::exchange(other._descriptor, -1)) {}
     Descriptor& operator=(Descriptor&& other) noexcept {
         std::swap(_descriptor, other._descriptor);
         return *this;
     }
-    Descriptor(const Descriptor&) = delete;
-    Descriptor& operator=(const Descriptor&) = delete;
     ~Descriptor() { reset(); }
 
     int get() const { return _descriptor; }
 
     void reset() {
         if (_descriptor != -1) {
-            close(_descriptor);
-            _descriptor = -1;
+            close(std::exchange(_descriptor, -1));
         }
     }
 

@@ -1,10 +1,10 @@
 #include "support/files.h"
 
-#include <cerrno>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
-#include <system_error>
+
+#include "support/descriptor.h"
 
 namespace fs = std::filesystem;
 
@@ -15,9 +15,7 @@ void put(const std::string& path, const std::string& text, std::ios::openmode mo
     makeDirectories(fs::path(path).parent_path());
     std::ofstream file(path, std::ios::binary | mode);
     file << text << std::flush;
-    if (!file) {
-        throw std::system_error(errno, std::generic_category(), "cannot write " + path);
-    }
+    check(file.good(), "cannot write " + path);
 }
 
 }  // namespace
@@ -32,9 +30,7 @@ void appendFile(const std::string& path, const std::string& text) {
 
 std::string readFile(const std::string& path) {
     const std::ifstream file(path, std::ios::binary);
-    if (!file) {
-        throw std::system_error(errno, std::generic_category(), "cannot read " + path);
-    }
+    check(file.good(), "cannot read " + path);
     std::ostringstream content;
     content << file.rdbuf();
     return content.str();

@@ -5,8 +5,8 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <stdexcept>
 
+#include "support/sandbox_check.h"
 #include "support/wait.h"
 
 using namespace std::chrono_literals;
@@ -21,22 +21,18 @@ pid_t awaitReady(Process& holder) {
     eventually(30s, [&] { return holder.output().find('\n') != std::string::npos || holder.waitFor(0ms); });
     const std::string output = holder.output();
     const std::string word = "ready ";
-    if (output.compare(0, word.size(), word) != 0) {
-        throw std::runtime_error("cannot make a node: " + holder.error());
-    }
+    check(output.compare(0, word.size(), word) == 0, "cannot make a node: " + holder.error(), ECHILD);
     return std::stoi(output.substr(word.size()));
 }
 
 void require(const CommandResult& result) {
-    if (result.exitCode != 0) {
-        throw std::runtime_error("ip failed: " + result.error);
-    }
+    check(result.exitCode == 0, "ip failed: " + result.error, ECHILD);
 }
 
 }  // namespace
 
 Node::Node(const std::string& name)
-    : _holder({TERNHA_SANDBOX, "--node", name}),
+    : _holder({SANDBOX, "--node", name}),
       _pid(awaitReady(_holder)),
       _process(static_cast<int>(syscall(SYS_pidfd_open, _pid, 0)), "cannot open the node's process") {}
 

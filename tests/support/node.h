@@ -14,7 +14,7 @@ namespace test {
 /// A machine of its own inside the sandbox: own root made as the sandbox's is (empty /tmp, /var and /run, the
 /// fixtures of /proc and /sys, the machine's programs), own network with only a loopback interface, own host
 /// name and processes. Everything in it ends with its object; a Process of it goes before. Failures throw
-/// std::system_error or std::runtime_error.
+/// std::system_error.
 class Node {
  public:
     /// Makes the node; `name` is its host name.

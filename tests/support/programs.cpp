@@ -10,10 +10,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <cstdio>
 #include <filesystem>
-#include <system_error>
 #include <utility>
 
 #include "support/files.h"
@@ -21,14 +19,6 @@
 
 namespace test {
 namespace {
-
-constexpr mode_t EXECUTABLE = 0755;
-
-void check(bool done, const std::string& what, int error = errno) {
-    if (!done) {
-        throw std::system_error(error, std::generic_category(), what);
-    }
-}
 
 void cover(const std::string& path, const std::string& by) {
     const std::string program = std::filesystem::canonical(path);
@@ -124,7 +114,7 @@ void restoreProgram(const std::string& path) {
 
 void createProgram(const std::string& path, const std::string& script) {
     writeFile(path, script.compare(0, 2, "#!") == 0 ? script : "#!/bin/sh\n" + script);
-    check(chmod(path.c_str(), EXECUTABLE) == 0, "cannot make " + path + " executable");
+    check(chmod(path.c_str(), 0755) == 0, "cannot make " + path + " executable");
 }
 
 Process::Process(const std::vector<std::string>& argv, int node)

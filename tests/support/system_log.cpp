@@ -7,7 +7,6 @@
 #include <unistd.h>
 
 #include <regex>
-#include <stdexcept>
 
 #include "support/wait.h"
 
@@ -28,15 +27,11 @@ SystemLog::Entry parseEntry(std::string datagram) {
 Descriptor boundSocket(const std::string& path) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
-    if (path.size() >= sizeof address.sun_path) {
-        throw std::invalid_argument("too long for a socket: " + path);
-    }
-    path.copy(address.sun_path, path.size());
+    check(path.copy(address.sun_path, sizeof address.sun_path - 1) == path.size(), "too long: " + path);
     Descriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0), "cannot make a socket");
     unlink(path.c_str());
-    if (bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == -1) {
-        throw std::system_error(errno, std::generic_category(), "cannot bind " + path);
-    }
+    check(bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0,
+          "cannot bind " + path);
     chmod(path.c_str(), 0666);
     return socket;
 }
