@@ -1,7 +1,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/resource.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 
 #include <algorithm>
@@ -9,6 +11,7 @@
 #include <filesystem>
 #include <thread>
 
+#include "support/descriptor.h"
 #include "support/udp.h"
 #include "ternhad/daemon.h"
 
@@ -272,6 +275,49 @@ TEST_F(SickMachineTest, AStoppedDaemonDoesNotDeclareThePeerDead) {
     }
     EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
     expectEndInTime();
+}
+
+TEST_F(SickMachineTest, StepsOfTheWallClockChangeNothing) {
+    start({"--dead-after", "0.6"});
+    for (int i = 0; i < 5; ++i) {
+        test::writeFile("/tmp/stepped-clock", "");
+        EXPECT_FALSE(test::eventually(500ms, [] { return !isPeerAlive(); }));
+        test::removeTree("/tmp/stepped-clock");
+        EXPECT_FALSE(test::eventually(500ms, [] { return !isPeerAlive(); }));
+    }
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
+    peer.end();
+    test::writeFile("/tmp/stepped-clock", "");
+    EXPECT_TRUE(test::eventually(5s, [] { return !isPeerAlive(); }));
+    expectEndInTime();
+}
+
+// One connection that carries `request`.
+std::string exchange(const std::string& request, std::chrono::seconds limit) {
+    const test::Descriptor fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0), "cannot make a socket");
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    std::string(test::CONTROL_SOCKET).copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
+    const timeval timeout = {limit.count(), 0};
+    setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout);
+    EXPECT_EQ(connect(fd.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    EXPECT_EQ(send(fd.get(), request.data(), request.size(), 0), static_cast<ssize_t>(request.size()));
+    std::string reply(4096, '\0');
+    reply.resize(
+        static_cast<std::size_t>(std::max(recv(fd.get(), reply.data(), reply.size(), 0), ssize_t{0})));
+    return reply;
+}
+
+TEST_F(SickMachineTest, AnOrderBlocksOnlyItsOwnClientAndASecondOneIsRefused) {
+    start();
+    std::thread order([] { exchange(R"({"act":"R"})", 60s); });
+    EXPECT_TRUE(test::eventually(
+        20s, [] { return exchange(R"({"act":"r"})", 2s).find("true") != std::string::npos; }));
+    EXPECT_EQ(exchange(R"({"act":"R"})", 5s),
+              "refused: an earlier order to reboot the peer is still being carried out");
+    EXPECT_TRUE(isPeerAlive());
+    daemon->signal(SIGKILL);
+    order.join();
 }
 
 }  // namespace

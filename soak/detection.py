@@ -1,0 +1,112 @@
+"""How long each failure of the peer takes to be detected: ternhad, keepalived and corosync on the same nodes."""
+
+import random
+import signal
+import statistics
+import time
+
+from nodes import Daemon, eventually
+from rivals import Corosync, Keepalived
+
+# Name: ternhad's options, keepalived's interval, corosync's token (0: its default).
+SETTINGS = {
+    "default": ([], 1, 0),
+    "fast": (["--dead-after", "0.5", "--check-interval", "0.1"], 0.1, 500),
+}
+LIMIT = 60  # seconds
+
+
+class Watchers:
+    """The programs of both nodes with one setting. Those of node a watch node b."""
+
+    def __init__(self, cluster, setting, rivals=True):
+        options, interval, token = SETTINGS[setting]
+        self.cluster = cluster
+        self.on_a = {"ternhad": Daemon(cluster.a, "b", options)}
+        self.on_b = {"ternhad": Daemon(cluster.b, "a", options)}
+        if rivals:
+            self.on_a |= {"keepalived": Keepalived(cluster.a, interval, 100),
+                          "corosync": Corosync(cluster.a, token)}
+            self.on_b |= {"keepalived": Keepalived(cluster.b, interval, 200),
+                          "corosync": Corosync(cluster.b, token)}
+
+    def start(self, nodes="ab"):
+        for node, watchers in (("a", self.on_a), ("b", self.on_b)):
+            if node in nodes:
+                for watcher in watchers.values():
+                    watcher.start()
+
+    def wait_until_alive(self):
+        if not eventually(LIMIT, lambda: all(watcher.sees_peer() for watcher in self.on_a.values()), 0.1):
+            missing = [name for name, watcher in self.on_a.items() if not watcher.sees_peer()]
+            raise RuntimeError(f"no peer is seen by {missing}")
+
+    def detect(self, since, limit=LIMIT):
+        """Seconds from `since` until each program on node a has seen its peer's failure; None: never."""
+        times = dict.fromkeys(self.on_a)
+        while None in times.values() and time.monotonic() - since < limit:
+            for name, watcher in self.on_a.items():
+                if times[name] is None and watcher.sees_peer() is False:
+                    times[name] = time.monotonic() - since
+            time.sleep(0.003)
+        return times
+
+    def end(self):
+        for watchers in (self.on_a, self.on_b):
+            for watcher in watchers.values():
+                watcher.end()
+
+
+def cut(watchers):
+    watchers.cluster.set_link(watchers.cluster.b, False)
+    yield
+    watchers.cluster.set_link(watchers.cluster.b, True)
+
+
+def killed(watchers):
+    watchers.cluster.b.signal(signal.SIGKILL)
+    yield
+    watchers.cluster.b.kill()
+    watchers.start("b")
+
+
+def stopped(watchers):
+    watchers.cluster.b.signal(signal.SIGSTOP)
+    yield
+    watchers.cluster.b.signal(signal.SIGCONT)
+
+
+def vanished(watchers):
+    cluster = watchers.cluster
+    cluster.unplug(cluster.b)
+    yield
+    cluster.b.kill()
+    cluster.plug(cluster.b)
+    watchers.start("b")
+
+
+FAILURES = {"cut link": cut, "killed": killed, "stopped": stopped, "vanished": vanished}
+
+
+def measure(cluster, times, settings, rivals):
+    """Prints the table."""
+    print(f"seconds until detected, {times} times each: minimum, median, maximum\n")
+    for setting in settings:
+        watchers = Watchers(cluster, setting, rivals)
+        watchers.start()
+        print(f"{setting + ':':12}" + "".join(f"{name:>24}" for name in watchers.on_a))
+        for name, failure in FAILURES.items():
+            results = {program: [] for program in watchers.on_a}
+            for _ in range(times):
+                watchers.wait_until_alive()
+                time.sleep(random.uniform(2, 4))  # at any phase of the probes
+                steps = failure(watchers)
+                begin = time.monotonic()
+                next(steps)
+                for program, seconds in watchers.detect(begin).items():
+                    results[program].append(LIMIT if seconds is None else seconds)
+                next(steps, None)
+            row = [f"{min(r):.2f} {statistics.median(r):.2f} {max(r):.2f}" for r in results.values()]
+            print(f"{name:12}" + "".join(f"{cell:>24}" for cell in row), flush=True)
+        watchers.end()
+        print()

@@ -1,0 +1,180 @@
+"""Two nodes of one machine, and a third host: namespaces of their own, joined by a bridge."""
+
+import ctypes
+import json
+import os
+import shutil
+import signal
+import socket
+import subprocess
+import time
+from pathlib import Path
+
+PROGRAMS = "/mnt"  # in each node
+ADDRESSES = {"a": "10.77.0.1", "b": "10.77.0.2", "c": "10.77.0.3"}
+
+libc = ctypes.CDLL(None)
+
+
+def die_with_parent():
+    libc.prctl(1, signal.SIGKILL)
+
+
+def run(*argv):
+    subprocess.run([str(argument) for argument in argv], check=True, stdout=subprocess.DEVNULL)
+
+
+def eventually(limit, predicate, step=0.01):
+    """Whether `predicate` holds within `limit` seconds."""
+    end = time.monotonic() + limit
+    while not predicate():
+        if time.monotonic() >= end:
+            return False
+        time.sleep(step)
+    return True
+
+
+class Node:
+    """Network, processes, host name, /tmp, /run, /var/log and /dev/shm of its own. `build` has the programs."""
+
+    def __init__(self, name, build=None):
+        self.name = name
+        self.address = ADDRESSES.get(name)
+        self.processes = {}
+        setup = "echo ready; exec sleep infinity"
+        if build:
+            files = [build / "daemon/ternhad", *(build / "src").glob("libternhadaemon.so.?"),
+                     *(build / "platform").glob("libterncore.so.?")]
+            setup = f"""mount -t tmpfs -o size=64m none {PROGRAMS}
+                cp -L {' '.join(map(str, files))} {PROGRAMS}
+                for d in /tmp /run /var/log /var/lib /dev/shm; do mount -t tmpfs -o size=64m none $d; done
+                mkdir -p /run/corosync /var/lib/corosync /var/log/corosync
+                test ! -e /proc/sysrq-trigger || mount --bind /dev/null /proc/sysrq-trigger
+                hostname node-{name}; echo node-{name} > /tmp/.ha.hostname.original
+                ip link set lo up; {setup}"""
+        self.holder = subprocess.Popen(
+            ["unshare", "--net", "--mount", "--uts", "--ipc", "--propagation", "private", "sh", "-ec", setup],
+            stdout=subprocess.PIPE, preexec_fn=die_with_parent)
+        if self.holder.stdout.readline() != b"ready\n":
+            raise RuntimeError(f"cannot make node {name}")
+
+    def path(self, inside):
+        return Path(f"/proc/{self.holder.pid}/root{inside}")
+
+    def command(self, *argv):
+        return ["nsenter", f"--target={self.holder.pid}", "--net", "--mount", "--uts", "--ipc",
+                *[str(argument) for argument in argv]]
+
+    def run(self, *argv):
+        run(*self.command(*argv))
+
+    def start(self, name, *argv, **options):
+        """A process of the node, to be known as `name`."""
+        process = subprocess.Popen(self.command(*argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
+                                   preexec_fn=die_with_parent, start_new_session=True, **options)
+        self.processes[name] = process
+        return process
+
+    def pid(self, name):
+        return self.processes[name].pid
+
+    def signal(self, number, names=None):
+        for name in list(self.processes) if names is None else names:
+            os.killpg(self.pid(name), number)
+
+    def kill(self, names=None):
+        for name in list(self.processes) if names is None else names:
+            process = self.processes.pop(name)
+            if process.poll() is None:
+                os.killpg(process.pid, signal.SIGKILL)
+            process.wait()
+            process.stderr.close()
+
+    def end(self):
+        self.kill()
+        self.holder.kill()
+        self.holder.wait()
+        self.holder.stdout.close()
+
+
+class Cluster:
+    """Nodes a and b, host c, and the bridge between them in a namespace of its own."""
+
+    def __init__(self, build):
+        self.switch = Node("switch")
+        self.switch.run("ip", "link", "add", "bridge", "type", "bridge")
+        self.switch.run("ip", "link", "set", "bridge", "up")
+        self.a, self.b, self.c = (Node(name, build) for name in "abc")
+        for node in (self.a, self.b, self.c):
+            self.plug(node)
+
+    def plug(self, node):
+        port = f"port-{node.name}"
+        run("ip", "link", "add", port, "netns", self.switch.holder.pid, "type", "veth", "peer", "name", "eth1",
+            "netns", node.holder.pid)
+        self.switch.run("ip", "link", "set", port, "master", "bridge", "up")
+        node.run("ip", "address", "add", f"{node.address}/24", "dev", "eth1")
+        node.run("ip", "link", "set", "eth1", "up")
+
+    def unplug(self, node):
+        self.switch.run("ip", "link", "delete", f"port-{node.name}")
+
+    def set_link(self, node, is_up):
+        self.switch.run("ip", "link", "set", f"port-{node.name}", "up" if is_up else "down")
+
+    def end(self):
+        for node in (self.a, self.b, self.c, self.switch):
+            node.end()
+
+
+class Daemon:
+    """A node's ternhad, with `options`."""
+
+    def __init__(self, node, peer, options):
+        self.node, self.peer, self.options = node, peer, options
+
+    def start(self):
+        self.node.start("ternhad", "env", f"LD_LIBRARY_PATH={PROGRAMS}", f"{PROGRAMS}/ternhad", "--local-ip",
+                        self.node.address, "--remote-ip", ADDRESSES[self.peer], "--interface", "eth1",
+                        *self.options)
+
+    def sees_peer(self):
+        """True, False, or None when that cannot be learnt: from its socket, or from its log."""
+        answer = self._answer()
+        return self._logged() if answer is None else answer
+
+    def _logged(self):
+        log = self.node.path("/tmp/ha/ha.daemon.log")
+        text = log.read_text(errors="replace") if log.exists() else ""
+        alive, dead = text.rfind("changed to alive"), text.rfind("changed to dead")
+        return None if alive == dead else alive > dead
+
+    def _answer(self):
+        with socket.socket(socket.AF_UNIX, socket.SOCK_STREAM) as client:
+            client.settimeout(0.1)
+            try:
+                client.connect(str(self.node.path("/run/ternha/control.sock")))
+                client.send(b'{"act":"I"}')
+                return json.loads(client.recv(4096))["isRemoteAlive"]
+            except (OSError, ValueError):
+                return None
+
+    def deaths(self):
+        """How often it has declared its peer dead."""
+        text = ""
+        for directory in ("/var/log/ha", "/tmp/ha"):
+            log = self.node.path(f"{directory}/ha.daemon.log")
+            if log.exists():
+                text += log.read_text(errors="replace")
+        return text.count("changed to dead")
+
+    def end(self):
+        if "ternhad" in self.node.processes:
+            self.node.kill(["ternhad"])
+        for directory in ("/var/log/ha", "/tmp/ha"):
+            shutil.rmtree(self.node.path(directory), ignore_errors=True)
+
+
+def require_root():
+    if os.geteuid() != 0:
+        raise SystemExit("pressure: needs root, for namespaces, limits and frozen file systems")

@@ -1,0 +1,270 @@
+"""Puts node a under pressure, and counts the false positives of both nodes and the delay of true ones."""
+
+import argparse
+import os
+import resource
+import signal
+import subprocess
+import sys
+import time
+from pathlib import Path
+
+from detection import Watchers, measure, vanished
+from nodes import PROGRAMS, Cluster, eventually, require_root
+
+BUSY = "while :; do :; done"
+FLOOD = """import socket, sys
+s = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
+while True:
+    try:
+        s.sendto(b"is_alive", (sys.argv[1], 7499))
+    except OSError:
+        pass"""
+FORKS = """import os, signal, sys, time
+sys.stdin.readline()
+signal.signal(signal.SIGCHLD, signal.SIG_IGN)
+while True:
+    try:
+        if os.fork() == 0:
+            time.sleep(0.5)
+            os._exit(0)
+    except OSError:
+        time.sleep(0.001)"""
+THRASH = """import sys
+sys.stdin.readline()
+with open("/tmp/thrash", "wb") as f: f.write(bytes(60 << 20))
+blocks = []
+while True:
+    with open("/tmp/thrash", "rb") as f:
+        while f.read(1 << 20): blocks = (blocks + [bytearray(1 << 20)])[-40:]"""
+
+
+class Control:
+    """A control group of node a, with the given controller and limits."""
+
+    def __init__(self, controller, limits):
+        self.path = Path(f"/sys/fs/cgroup/{controller}/ternha-pressure")
+        if not self.path.parent.exists():
+            self.path = Path("/sys/fs/cgroup/ternha-pressure")
+        self.path.mkdir(exist_ok=True)
+        for names, value in limits:
+            next(self.path / name for name in names if (self.path / name).exists()).write_text(str(value))
+
+    def add(self, pid):
+        (self.path / "cgroup.procs").write_text(str(pid))
+
+    def end(self):
+        parent = self.path.parent / "cgroup.procs"
+        for pid in (self.path / "cgroup.procs").read_text().split():
+            try:
+                parent.write_text(pid)
+            except OSError:
+                pass  # it has ended
+        eventually(10, lambda: not (self.path / "cgroup.procs").read_text())
+        self.path.rmdir()
+
+
+def nothing(_):
+    yield
+
+
+def busy(watchers):
+    """200 busy processes"""
+    watchers.cluster.a.start("hogs", "sh", "-c", f"for i in $(seq 200); do ({BUSY}) & done; wait")
+    yield
+
+
+def real_time(watchers):
+    """a SCHED_FIFO hog on each processor"""
+    for i in range(len(os.sched_getaffinity(0))):
+        watchers.cluster.a.start(f"hog {i}", "taskset", "-c", i, "chrt", "-f", "50", "sh", "-c", BUSY)
+    yield
+
+
+def fork_storm(watchers):
+    """fork storm at a limit of processes"""
+    node = watchers.cluster.a
+    group = Control("pids", [(["pids.max"], 80)])
+    for name in watchers.on_a:
+        group.add(node.pid(name))
+    node.start("hog", "python3", "-c", FORKS, stdin=subprocess.PIPE)
+    group.add(node.pid("hog"))
+    node.processes["hog"].stdin.write(b"\n")
+    node.processes["hog"].stdin.flush()
+    yield
+    node.kill(["hog"])
+    group.end()
+
+
+def descriptors(watchers):
+    """descriptors used up"""
+    pids = [watchers.cluster.a.pid(name) for name in watchers.on_a]
+    before = [resource.prlimit(pid, resource.RLIMIT_NOFILE) for pid in pids]
+    for pid, (_, hard) in zip(pids, before):
+        highest = max(int(fd.name) for fd in Path(f"/proc/{pid}/fd").iterdir())
+        resource.prlimit(pid, resource.RLIMIT_NOFILE, (highest + 1, hard))
+    yield
+    for pid, limits in zip(pids, before):
+        resource.prlimit(pid, resource.RLIMIT_NOFILE, limits)
+
+
+def memory(watchers):
+    """memory cgroup thrashed"""
+    node = watchers.cluster.a
+    group = Control("memory", [(["memory.limit_in_bytes", "memory.max"], 80 << 20)])
+    for name in watchers.on_a:
+        group.add(node.pid(name))
+    node.start("hog", "python3", "-c", THRASH, stdin=subprocess.PIPE)
+    Path(f"/proc/{node.pid('hog')}/oom_score_adj").write_text("1000")
+    group.add(node.pid("hog"))
+    node.processes["hog"].stdin.write(b"\n")
+    node.processes["hog"].stdin.flush()
+    yield
+    node.kill(["hog"])
+    group.end()
+
+
+def on_a_disk_of_its_own(watchers, directory, sicken, heal):
+    """Restarts node a's programs with `directory` on a small disk, and makes that sick."""
+    node = watchers.cluster.a
+    for watcher in watchers.on_a.values():
+        watcher.end()
+    image, mount = node.path("/mnt/disk"), node.path(directory)
+    with open(image, "wb") as file:
+        file.truncate(16 << 20)
+    node.run("mkfs.ext4", "-q", "/mnt/disk")
+    mount.mkdir(parents=True, exist_ok=True)
+    node.run("mount", "-o", "loop", "/mnt/disk", directory)
+    node.run("chmod", "700", directory)
+    watchers.start("a")
+    watchers.wait_until_alive()
+    node.run(*sicken)
+    yield
+    node.run(*heal)
+    for watcher in watchers.on_a.values():
+        watcher.end()
+    eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
+                                          stderr=subprocess.DEVNULL).returncode == 0, 0.2)
+    watchers.start("a")
+
+
+def frozen(directory):
+    def condition(watchers):
+        return on_a_disk_of_its_own(watchers, directory, ["fsfreeze", "-f", directory],
+                                    ["fsfreeze", "-u", directory])
+
+    return condition
+
+
+def full(directory):
+    def condition(watchers):
+        fill = ["sh", "-c", f"dd if=/dev/zero of={directory}/filler bs=64k 2>/dev/null || true"]
+        return on_a_disk_of_its_own(watchers, directory, fill, ["rm", "-f", f"{directory}/filler"])
+
+    return condition
+
+
+def flood(sender):
+    def condition(watchers):
+        getattr(watchers.cluster, sender).start("flood", "python3", "-c", FLOOD, watchers.cluster.a.address)
+        yield
+        if "flood" in getattr(watchers.cluster, sender).processes:
+            getattr(watchers.cluster, sender).kill(["flood"])
+
+    return condition
+
+
+def stop_for(seconds):
+    def condition(watchers):
+        names = list(watchers.on_a)
+        watchers.cluster.a.signal(signal.SIGSTOP, names)
+        time.sleep(seconds)  # the pressure itself
+        watchers.cluster.a.signal(signal.SIGCONT, names)
+        yield
+
+    return condition
+
+
+CONDITIONS = {
+    "none": nothing,
+    "200 busy processes": busy,
+    "SCHED_FIFO hogs": real_time,
+    "fork storm": fork_storm,
+    "no descriptors": descriptors,
+    "memory thrashed": memory,
+    "log disk frozen": frozen("/var/log/ha"),
+    "/tmp/ha frozen": frozen("/tmp/ha"),
+    "log disk full": full("/var/log/ha"),
+    "/tmp/ha full": full("/tmp/ha"),
+    "flood from the peer": flood("b"),
+    "flood from another": flood("c"),
+    "stopped for 2 s": stop_for(2),
+    "stopped for 5 s": stop_for(5),
+    "stopped for 60 s": stop_for(60),
+}
+SHORT = ["200 busy processes", "no descriptors", "/tmp/ha frozen", "flood from another", "stopped for 2 s"]
+
+
+def press(watchers, condition, seconds):
+    """Returns each program's false positives on both nodes, and the seconds until node b's end was seen."""
+    watchers.wait_until_alive()
+    # Node b is right when it declares a stopped node a dead.
+    observers = [watchers.on_a] if condition.startswith("stopped") else [watchers.on_a, watchers.on_b]
+    deaths = lambda: {name: sum(observer[name].deaths() for observer in observers) for name in watchers.on_a}
+    before = deaths()
+    steps = CONDITIONS[condition](watchers)
+    next(steps)
+    if "frozen" in condition or "full" in condition:
+        before = deaths()  # the programs were started again
+    time.sleep(seconds)
+    false_positives = {name: count - before[name] for name, count in deaths().items()}
+    watchers.wait_until_alive() if not any(false_positives.values()) else time.sleep(5)
+    failure = vanished(watchers)
+    begin = time.monotonic()
+    next(failure)
+    delays = watchers.detect(begin, limit=20)
+    next(steps, None)
+    next(failure, None)
+    for node in (watchers.cluster.a, watchers.cluster.c):
+        node.kill([name for name in node.processes if name not in watchers.on_a])
+    return false_positives, delays
+
+
+def main():
+    parser = argparse.ArgumentParser(prog="script/pressure", description=__doc__)
+    parser.add_argument("--build", type=Path, required=True, help=argparse.SUPPRESS)
+    parser.add_argument("--short", action="store_true", help="a minute: ternhad alone, fails on a false positive")
+    parser.add_argument("--seconds", type=float, default=300, help="that each pressure lasts (300)")
+    parser.add_argument("--condition", action="append", choices=CONDITIONS, help="instead of all")
+    parser.add_argument("--setting", action="append", choices=["default", "fast"], help="instead of both")
+    parser.add_argument("--detection", type=int, metavar="TIMES", help="measure detection without pressure instead")
+    parser.add_argument("--alone", action="store_true", help="without keepalived and corosync")
+    options = parser.parse_args()
+    require_root()
+    # Measures on time whatever the pressure; what it starts has the usual priority.
+    os.sched_setscheduler(0, os.SCHED_RR | os.SCHED_RESET_ON_FORK, os.sched_param(99))
+    settings = options.setting or (["fast"] if options.short else ["default", "fast"])
+    rivals = not (options.short or options.alone)
+    cluster = Cluster(options.build)
+    try:
+        if options.detection:
+            return measure(cluster, options.detection, settings, rivals)
+        wrong = 0
+        print("false positives, and seconds until a true failure is seen")
+        for setting in settings:
+            watchers = Watchers(cluster, setting, rivals)
+            watchers.start()
+            print(f"\n{setting + ':':22}" + "".join(f"{name:>16}" for name in watchers.on_a))
+            for condition in options.condition or (SHORT if options.short else CONDITIONS):
+                seconds = 5 if options.short else options.seconds
+                counts, delays = press(watchers, condition, seconds)
+                cells = [f"{counts[n]:>4} {'never' if delays[n] is None else format(delays[n], '.2f'):>6}" for n in counts]
+                print(f"{condition:22}" + "".join(f"{cell:>16}" for cell in cells), flush=True)
+                wrong += counts["ternhad"] + (delays["ternhad"] is None)
+            watchers.end()
+        return 1 if wrong else 0
+    finally:
+        cluster.end()
+
+
+sys.exit(main())
