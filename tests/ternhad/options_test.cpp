@@ -141,8 +141,8 @@ INSTANTIATE_TEST_SUITE_P(
         WrongLine{"Twice", "interface = eth1", "interface stands in line 3 already"},
         WrongLine{"OnlyForTheCommandLine", "check-config = true", "unknown name: check-config"},
         WrongLine{"Program", "notify = /nowhere", "notify = /nowhere: /nowhere: No such file or directory"},
-        WrongLine{"NoProgram", "notify = /etc/hosts",
-                  "notify = /etc/hosts: not an executable file: /etc/hosts"},
+        WrongLine{"NoProgram", "notify = /tmp/ternhad.conf",
+                  "notify = /tmp/ternhad.conf: not an executable file: /tmp/ternhad.conf"},
         WrongLine{"SocketOfNobody", "status-socket = /run/x",
                   "status-socket = /run/x: needs --status-group"}),
     [](const auto& line) { return line.param.name; });

@@ -145,7 +145,8 @@ TEST_F(ReportingTest, BeforeTheFirstReplyThePeerIsUnknownNotDead) {
 
 TEST_F(ReportingTest, AnInterfaceThatIsNotThereOrDownHasNoRate) {
     auto daemon = start({}, "eth9");
-    EXPECT_THAT(daemon.error(), HasSubstr("there is no network interface eth9 (yet): its packet rate is unknown\n"));
+    EXPECT_THAT(daemon.error(),
+                HasSubstr("there is no network interface eth9 (yet): its packet rate is unknown\n"));
     EXPECT_TRUE(report()["link"]["nonOkRate"]["value"].isNull());
     EXPECT_THAT(control("status").output, HasSubstr("non-OK packets    unknown\n"));
     for (const std::string command :
