@@ -164,6 +164,12 @@ TEST_F(InterfaceTest, AColumnThatComesTwiceCountsOnce) {
     EXPECT_FLOAT_EQ(sample(), 0.4F);
 }
 
+TEST_F(InterfaceTest, AnInterfaceMayHaveAShortName) {
+    drbdIF("x");
+    print("Iface RX-OK RX-ERR\nx 60 40");
+    EXPECT_FLOAT_EQ(sample(), 0.4F);
+}
+
 TEST_F(InterfaceTest, WordsAreWhatAnyBlanksPart) {
     print("Iface\tRX-OK \v RX-ERR\f\r\neth1\t60\r40\v");
     EXPECT_FLOAT_EQ(sample(), 0.4F);
