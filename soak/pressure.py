@@ -7,6 +7,7 @@ import signal
 import subprocess
 import sys
 import time
+from contextlib import closing
 from pathlib import Path
 
 from detection import Watchers, measure, vanished
@@ -101,8 +102,9 @@ def descriptors(watchers):
     pids = [watchers.cluster.a.pid(name) for name in watchers.on_a]
     before = [resource.prlimit(pid, resource.RLIMIT_NOFILE) for pid in pids]
     for pid, (_, hard) in zip(pids, before):
-        highest = max(int(fd.name) for fd in Path(f"/proc/{pid}/fd").iterdir())
-        resource.prlimit(pid, resource.RLIMIT_NOFILE, (highest + 1, hard))
+        used = {int(fd.name) for fd in Path(f"/proc/{pid}/fd").iterdir()}
+        free = next(number for number in range(len(used) + 1) if number not in used)
+        resource.prlimit(pid, resource.RLIMIT_NOFILE, (free, hard))
     yield
     for pid, limits in zip(pids, before):
         resource.prlimit(pid, resource.RLIMIT_NOFILE, limits)
@@ -139,8 +141,10 @@ def on_a_disk_of_its_own(watchers, directory, sicken, heal):
     watchers.start("a")
     watchers.wait_until_alive()
     node.run(*sicken)
-    yield
-    node.run(*heal)
+    try:
+        yield
+    finally:
+        node.run(*heal)  # a frozen disk would outlive its namespace, with all that waits for it
     for watcher in watchers.on_a.values():
         watcher.end()
     eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
@@ -211,8 +215,12 @@ def press(watchers, condition, seconds):
     # Node b is right when it declares a stopped node a dead.
     observers = [watchers.on_a] if condition.startswith("stopped") else [watchers.on_a, watchers.on_b]
     deaths = lambda: {name: sum(observer[name].deaths() for observer in observers) for name in watchers.on_a}
+    with closing(CONDITIONS[condition](watchers)) as steps:
+        return measure_under(watchers, condition, seconds, steps, deaths)
+
+
+def measure_under(watchers, condition, seconds, steps, deaths):
     before = deaths()
-    steps = CONDITIONS[condition](watchers)
     next(steps)
     if "frozen" in condition or "full" in condition:
         before = deaths()  # the programs were started again
