@@ -1,6 +1,6 @@
 #include "control_server.h"
 
-#include <json/json.h>
+#include <json/value.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -10,9 +10,9 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <memory>
 #include <utility>
 
+#include "client_request.h"
 #include "passes.h"
 
 namespace ternhad {
@@ -25,7 +25,6 @@ constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the soc
 constexpr std::size_t MOST_CLIENTS = 16;
 constexpr int BACKLOG = 100;
 constexpr mode_t SHARED_MODE = 0660;
-constexpr std::size_t REQUEST_SIZE = 2096;
 constexpr char RESTORING[] = "make the vanished control socket again";
 constexpr char ACCEPTING[] = "accept control clients";
 constexpr char ORDER = 'R';  // the actions
@@ -37,32 +36,6 @@ sockaddr_un addressOf(const std::string& path) {
     address.sun_family = AF_UNIX;
     path.copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
     return address;
-}
-
-// The first character of the action that the request asks for, as the library reads it; the request, which
-// has come to `fd`, stays there to be served. 0 when there is none.
-char actionOf(int fd) {
-    std::array<char, REQUEST_SIZE> text;
-    const ssize_t size = recv(fd, text.data(), text.size(), MSG_PEEK);
-    Json::Value request;
-    std::string errors;
-    const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
-    const bool isRead = size > 0 && reader->parse(text.data(), text.data() + size, &request, &errors) &&
-                        request.isObject() && request["act"].isString();
-    return isRead ? request["act"].asString()[0] : '\0';
-}
-
-// A request that is left unread would reset the connection, and with it a reply.
-void discardRequest(int fd) {
-    std::array<char, REQUEST_SIZE> text;
-    (void)!recv(fd, text.data(), text.size(), 0);
-}
-
-// Not JSON: a client that only looks for a reply takes it for a failure.
-void refuse(int fd, const char* reason) {
-    discardRequest(fd);
-    const std::string text = std::string("refused: ") + reason;
-    send(fd, text.data(), text.size(), MSG_NOSIGNAL);
 }
 
 }  // namespace

@@ -335,7 +335,7 @@ def reboot_peer(lab: Lab, checks: Checks):
     order, rebooting, record = lab.a.run(
         "ternhactl reboot-peer --yes | tail -n 1; ternhactl rebooting || true; ternhactl status --json", 45
     ).splitlines()
-    checks.equal("the order is carried out", "The peer counts as rebooting until it answers again.", order)
+    checks.equal("the order is carried out", "The peer went down. It counts as rebooting until it answers again.", order)
     checks.equal("node-a says rebooting", "yes", rebooting)
     checks.equal("and dead", False, parse_status(record)["isRemoteAlive"])
     checks.that("node-a has logged it", lab.a.has_logged(" Remote offline"), "Remote offline", lab.a.log()[-5:])

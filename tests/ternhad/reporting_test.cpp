@@ -236,6 +236,21 @@ TEST_F(ReportingTest, FollowersSeeEachChangeAndWaitersTheirCondition) {
     EXPECT_THAT(follower.error(), HasSubstr("the connection was closed"));
 }
 
+TEST_F(ReportingTest, ARequestThatIsNestedTooDeepIsRefused) {
+    auto daemon = start();
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    std::string(test::CONTROL_SOCKET).copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
+    const test::Descriptor client(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0), "cannot make a socket");
+    ASSERT_EQ(connect(client.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    const std::string request(2000, '[');
+    ASSERT_EQ(send(client.get(), request.data(), request.size(), 0), 2000);
+    char reply = 0;
+    EXPECT_EQ(recv(client.get(), &reply, 1, 0), 0);
+    EXPECT_EQ(daemon.error().find("a step failed"), std::string::npos) << daemon.error();
+    EXPECT_FALSE(test::statusAt().isNull());
+}
+
 TEST_F(ReportingTest, AFollowerThatDoesNotReadDelaysNobody) {
     test::writeFile("/sys/block/md0/md/sync_action", "idle\n");
     auto daemon = start();
