@@ -34,7 +34,7 @@ struct CheckDeleter {
 
 }  // namespace
 
-class PeerServer::Socket : public HASocketCommServer {
+class PeerServer::Socket final : public HASocketCommServer {
  public:
     explicit Socket(const std::string& address) : HASocketCommServer(address) {
         if (!HasError()) {

@@ -48,7 +48,7 @@ bool isMoreExpected() {
 
 // The socket of one probe after another, each from a port of its own: a reply belongs to its probe by port,
 // and one that comes later than the next probe reaches nobody.
-class Prober::Socket : public HASocketCommClient {
+class Prober::Socket final : public HASocketCommClient {
  public:
     explicit Socket(const std::string& address) : HASocketCommClient(address, NO_TIMEOUT) {
         if (!HasError()) {
