@@ -19,7 +19,7 @@ from node import Channel
 
 ROOT = Path(__file__).resolve().parents[1]
 CACHE = ROOT / "build/lab"
-BUILD = CACHE / "arm"
+BUILD = ROOT / "build/arm"  # of the tests, if they have been built
 TARGETS = ["ternhad", "ternhactl", "ternha-lab-tool"]
 
 
@@ -81,8 +81,10 @@ def run_lab(keep: bool) -> int:
 
 
 def build_programs():
-    options = ["-D", "TERNHA_BUILD_TESTS=OFF", "-D", "TERNHA_BUILD_LAB=ON"]
-    configure = ["cmake", "--preset", "arm", "-B", BUILD, *options]
+    options = ["-D", "TERNHA_BUILD_LAB=ON"]
+    if not (BUILD / "CMakeCache.txt").exists():
+        options += ["-D", "TERNHA_BUILD_TESTS=OFF"]
+    configure = ["cmake", "--preset", "arm", *options]
     for command in (configure, ["cmake", "--build", BUILD, "--target", *TARGETS]):
         result = subprocess.run(command, cwd=ROOT, capture_output=True, text=True, check=False)
         if result.returncode != 0:

@@ -44,7 +44,7 @@ bool hasCallSite(const std::string& message);
 /// Matches exactly FILE + ":" + a decimal number + " " + MESSAGE.
 MATCHER_P2(LogLine, file, message,
            std::string(negation ? "is not" : "is") + " \"" + file + ":<number> " + message + "\"") {
-    const std::string line = arg;
+    const std::string& line = arg;
     const std::string start = std::string(file) + ":";
     const std::size_t blank = line.find(' ');
     return hasCallSite(line) && line.compare(0, start.size(), start) == 0 &&
