@@ -29,7 +29,7 @@ for directory in /usr/*; do
     layer=$layers/${directory#/usr/}
     mkdir -p "$layer/upper" "$layer/work"
     lower=$directory
-    [ ! -d "$sysroot$directory" ] || lower=$directory:$sysroot$directory
+    [ -z "$sysroot" ] || [ ! -d "$sysroot$directory" ] || lower=$directory:$sysroot$directory
     mount -t overlay overlay -o "lowerdir=$lower,upperdir=$layer/upper,workdir=$layer/work" "$directory"
 done
 
@@ -90,5 +90,5 @@ in_dpkg --remove "${installed[@]}"
 [ -f /etc/ternha/ternhad.conf ] || fail "the configuration did not survive a removal"
 [ -d /var/log/ha ] || fail "the logs did not survive a removal"
 in_dpkg --purge "${installed[@]}"
-rmdir /run/ternha # by hand what the service manager does
+rm -r /run/ternha # by hand what the service manager does, the lock included
 diff <(echo "$before") <(changes) || fail "something is left behind"
