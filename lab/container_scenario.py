@@ -12,6 +12,7 @@ from service_scenes import RETURN_LIMIT, hung_thread, kill, reload, stop, unknow
 PORT = 7499
 ALIVE = {"isRemoteAlive": True}
 ABSENT = ("/proc/drbd", "/sys/block/md*", "/sys/class/ata_port/ata*")  # in a container, from the kernel's files
+PRIVATE_PROC = "BindPaths=/run/proc:/proc"
 FIREWALL = "nft list chain inet ternha input"
 
 
@@ -22,7 +23,8 @@ def run(pair: Pair, checks: Checks):
     firewall(pair, checks)
     kill(pair, checks, ALIVE)
     unknown_request(pair, checks, ALIVE)
-    hung_thread(pair, checks, ALIVE)
+    private_proc(pair.b, "mkfifo drbd")
+    hung_thread(pair, checks, ALIVE, PRIVATE_PROC)
     reload(pair, checks)
     reboot_trigger(pair, checks)
     stop(pair, checks, ALIVE)
@@ -105,14 +107,20 @@ def packets(node: Node, verdict: str) -> int:
     return int(found.group(1)) if found else -1
 
 
+def private_proc(node: Node, command: str):
+    """Makes the directory that PRIVATE_PROC gives the service for /proc: the kernel's files under their names, and
+    what the command adds."""
+    node.run(
+        "mkdir -p /run/kernel-proc && mount --bind /proc /run/kernel-proc && rm -rf /run/proc && mkdir /run/proc"
+        " && cd /run/proc && for file in self meminfo mounts net stat sys uptime; do"
+        f" ln -s /run/kernel-proc/$file .; done && {command}"
+    )
+
+
 def reboot_trigger(pair: Pair, checks: Checks):
     checks.scene("node-a asks node-b to reboot")
-    # A private /proc holds a plain file in the trigger's place, and the kernel's files under their names.
-    pair.b.run(
-        "mkdir -p /run/proc /run/kernel-proc && mount --bind /proc /run/kernel-proc && touch /run/proc/sysrq-trigger"
-        " && for file in self meminfo mounts net stat sys uptime; do ln -s /run/kernel-proc/$file /run/proc/; done"
-    )
-    service.override(pair.b, "BindPaths=/run/proc:/proc")
+    private_proc(pair.b, "touch sysrq-trigger")
+    service.override(pair.b, PRIVATE_PROC)
     pair.b.run("systemctl restart ternhad")
     checks.within(RETURN_LIMIT, "both say alive", pair.statuses, [ALIVE] * 2)
     request = pair.a.channel.start("ternhactl reboot-peer --yes")
