@@ -442,18 +442,20 @@ TEST_F(MemoryTest, HandlingAControlRequest) {
     Status status;
     MonitordSocket server(test::LOCAL_SOCKET, 0);
     server.setStatus(&status);
-    for (const std::string action : {"I", "r", "an unknown one, longer than a string holds by itself"}) {
+    for (const auto& [action, result] :
+         {std::pair("I", "yes 10"), std::pair("r", "yes 1"),
+          std::pair("an unknown one, longer than a string holds by itself", "no 0")}) {
         Json::Value request;
         request["act"] = action;
-        const bool isKnown = action.size() == 1;
+        Json::Value reply;
         expectWhole({action,
-                     [] {},
-                     [&] {
-                         Json::Value reply;
-                         return yesNo(server.serverHandle(request, reply));
+                     [&reply] { reply = Json::Value(); },
+                     [&server, &request, &reply] {
+                         const bool isAnswered = server.serverHandle(request, reply);
+                         return yesNo(isAnswered) + " " + std::to_string(reply.size());
                      },
-                     yesNo(isKnown),
-                     {"no"}});
+                     result,
+                     {"no 0"}});
     }
 }
 
@@ -491,18 +493,23 @@ TEST_F(MemoryTest, AskingOverTheControlSocket) {
     std::optional<test::HandlerSocket> client;
     const Json::Value request("question");
     Json::Value reply;
-    Operation exchange{"clientSend",
-                       [&client, &reply] {
-                           client.emplace(test::HandlerSocket::Handler(), test::LOCAL_SOCKET, 5);
-                           reply = "as it was";
-                       },
-                       [&client, &request, &reply] { return yesNo(client->clientSend(request, reply)); },
-                       "yes",
-                       {"no"},
-                       [&client, &reply] { return yesNo(client->hasError()) + " " + reply.asString(); },
-                       "no an answer that is longer than a string holds by itself",
-                       {"yes as it was"}};
-    expectWhole(exchange);
+    std::size_t lines = 0;
+    expectWhole(
+        {"clientSend",
+         [&] {
+             client.emplace(test::HandlerSocket::Handler(), test::LOCAL_SOCKET, 5);
+             reply = Json::Value();
+             lines = systemLog->texts().size();
+         },
+         [&client, &request, &reply] {
+             const bool isAnswered = client->clientSend(request, reply);
+             return yesNo(isAnswered) + (reply.isNull() ? " null" : " reply");
+         },
+         "yes reply",
+         {"no null"},
+         [&] { return yesNo(client->hasError()) + " " + std::to_string(systemLog->texts().size() - lines); },
+         "no 0",
+         {"yes 1"}});
 }
 
 TEST_F(MemoryTest, AskingOverTheControlSocketWhetherThePeerReboots) {
@@ -518,6 +525,14 @@ TEST_F(MemoryTest, AskingOverTheControlSocketWhetherThePeerReboots) {
                  [&client] { return yesNo(client->isRebootRemote()); },
                  "yes",
                  {"no"}});
+}
+
+TEST_F(MemoryTest, AskingOverTheControlSocketWithoutAServer) {
+    std::optional<MonitordSocket> client;
+    const auto prepare = [&client] { client.emplace("/tmp/nowhere", 5); };
+    Json::Value status;
+    expectWhole({"rebootRemote", prepare, [&client] { return yesNo(client->rebootRemote()); }, "no"});
+    expectWhole({"getServerData", prepare, [&] { return yesNo(client->getServerData(status)); }, "no"});
 }
 
 // ---- The reboot ----
