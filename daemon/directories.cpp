@@ -61,7 +61,7 @@ bool hasOnlyOurFiles(const char* path) {
         const std::string name = path + ("/" + printable(entry.path().filename()));
         struct stat info = {};
         if (lstat(entry.path().c_str(), &info) != 0) {
-            continue;  // it has gone
+            continue;  // removed meanwhile
         }
         if (!S_ISREG(info.st_mode) && !S_ISDIR(info.st_mode)) {
             return complain(name, "neither a file nor a directory");

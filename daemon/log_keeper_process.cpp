@@ -82,7 +82,7 @@ int keepLogs(std::int64_t rotateSize) {
             continue;
         }
         if (size <= 0) {
-            return 0;  // the daemon has gone
+            return 0;  // the daemon closed its end
         }
         const auto kind = static_cast<LogRequest>(request[0]);
         if (kind == LogRequest::snapshot) {

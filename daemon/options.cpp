@@ -116,10 +116,9 @@ void addInterval(CLI::App& app, const std::string& name, Seconds& value, double 
 
 std::optional<int> parseOptions(int argc, const char* const* argv, Options& options) {
     CLI::App app(
-        "High-availability daemon of one node: watches its peer over the replication link, answers the "
-        "peer's "
-        "questions and serves the control socket. Runs in the foreground until SIGTERM; SIGHUP moves and "
-        "rotates the logs.",
+        "High-availability daemon of one node: watches its peer over the replication link, replies to the "
+        "peer's requests and serves the control socket. Runs in the foreground until SIGTERM; SIGHUP moves "
+        "and rotates the logs.",
         "ternhad");
     app.set_version_flag("--version", std::string("ternhad ") + TERNHA_VERSION);
     app.set_config("--config", "", "Read options from this file, a line NAME = VALUE each");

@@ -22,7 +22,7 @@ Json::Value textOrNull(const std::string& text) {
     return text.empty() ? Json::Value() : Json::Value(text);
 }
 
-// The name as the peer is told, else the machine's.
+// The name as it is sent to the peer, else the machine's.
 std::string nodeName(const Health& health) {
     std::string name = printable(health.hostname());
     if (name.empty()) {

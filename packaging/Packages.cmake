@@ -60,8 +60,8 @@ set(CPACK_DEBIAN_PLATFORM_PACKAGE_CONTROL_EXTRA ${CMAKE_CURRENT_BINARY_DIR}/trig
 
 set(CPACK_COMPONENT_DAEMON_DESCRIPTION
     [[high-availability daemon of a two-node storage cluster
-The daemon watches its peer over the replication link, answers the peer's
-questions and serves a control socket; ternhactl asks and orders it. A
+The daemon watches its peer over the replication link, replies to the peer's
+requests and serves a control socket; ternhactl is its control tool. A
 generator of packet filter rules keeps everybody but the peer from its port.]])
 set(CPACK_DEBIAN_DAEMON_PACKAGE_SECTION admin)
 set(CPACK_DEBIAN_DAEMON_PACKAGE_DEPENDS "${library_package} (>= ${PROJECT_VERSION})")

@@ -104,7 +104,7 @@ bool DaemonLocalSocket::hasError() {
 
 bool DaemonLocalSocket::serverBind() {
     const Address address(_path);
-    unlink(static_cast<const char*>(address.name.sun_path));  // left by a server that has gone
+    unlink(static_cast<const char*>(address.name.sun_path));  // left by an earlier server
     if (bind(_fd, address.get(), address.size) == -1) {
         syslog(LOG_ERR, "%s:%d Failed to bind socket %s: %m", __FILE_NAME__, __LINE__, _path.c_str());
         _hasError = true;

@@ -53,7 +53,7 @@ class RawClient {
     // `flags` are added to the type of the socket. Throws std::system_error when it cannot connect.
     explicit RawClient(const std::string& path = LOCAL_SOCKET, int flags = 0);
 
-    // Sends; false when the server has gone.
+    // Sends; false when the server has closed its end.
     bool send(const std::string& bytes) const;
 
     // What comes until the server closes the connection.

@@ -453,7 +453,7 @@ TEST_F(TernhactlTest, StopsWaitingForAConditionInTime) {
         const int connection = server.accept();
         server.send(connection, "{\"version\":1}\n");
         char end = 0;
-        EXPECT_EQ(recv(connection, &end, 1, 0), 0);  // until the client has gone
+        EXPECT_EQ(recv(connection, &end, 1, 0), 0);  // until the client closes
         close(connection);
     });
     const auto result = shell("ternhactl wait peer-alive --timeout 0.3");
