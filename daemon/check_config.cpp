@@ -5,6 +5,7 @@
 #include <net/if.h>
 #include <sys/stat.h>
 
+#include <cstring>
 #include <sstream>
 
 namespace ternhad {
@@ -23,8 +24,9 @@ bool hasAddress(const std::string& interface, const std::string& address) {
     for (const ifaddrs* entry = addresses; entry != nullptr; entry = entry->ifa_next) {
         if (entry->ifa_addr != nullptr && entry->ifa_addr->sa_family == AF_INET &&
             interface == entry->ifa_name) {
-            const auto* found = reinterpret_cast<const sockaddr_in*>(entry->ifa_addr);
-            isFound = isFound || found->sin_addr.s_addr == wanted.s_addr;
+            sockaddr_in found = {};
+            std::memcpy(&found, entry->ifa_addr, sizeof found);  // which may not be aligned for it
+            isFound = isFound || found.sin_addr.s_addr == wanted.s_addr;
         }
     }
     freeifaddrs(addresses);
