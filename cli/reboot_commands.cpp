@@ -42,6 +42,10 @@ ExitCode rebootPeer(const Settings& settings) {
         std::cout << "The peer was already dead: nobody knows whether it heard the order.\n";
         return ExitCode::No;
     }
+    if (!before.peerAlive.value) {
+        std::cout << "The peer has not been probed yet: nobody knows whether it heard the order.\n";
+        return ExitCode::No;
+    }
     if (!Report(fetchReport(settings)).peerAlive.is(false)) {
         std::cout << "The peer still answers: it was not rebooted.\n";
         return ExitCode::No;

@@ -63,6 +63,12 @@ Verdict verdict(const Report& report, const LocalState& local) {
         }
         append(warnings, local.unlinked);
     }
+    if (report.peerAlive.is(true) && (!report.peerResync.value || !report.peerDiskErrors.value)) {
+        unknown.emplace_back("peer's RAID and disks not known yet");
+    }
+    if (!report.resync.value || !report.diskErrors.value) {
+        unknown.emplace_back("this node not checked yet");
+    }
     const std::array<std::pair<bool, const char*>, 5> unwise = {{
         {report.peerRebooting.is(true), "peer being rebooted"},
         {report.peerResync.is(true) && !report.isStale(), "peer resynchronises RAID"},
@@ -113,6 +119,11 @@ Verdict verdictOfNode(const Report& report, const LocalState& local) {
     } else if (!report.resync.value || !report.diskErrors.value) {
         result.level = Verdict::Level::Unknown;
         result.reasons = {"this node not checked yet"};
+    } else if (!local.hasDrbd || !local.unsupportedDrbd.empty()) {
+        result.level = Verdict::Level::Unknown;
+        result.reasons = {local.hasDrbd
+                              ? "replica unknown: DRBD " + local.unsupportedDrbd + " is not supported, 8.4 is"
+                              : "replica unknown: no /proc/drbd"};
     } else {
         result.reasons = {"this node could serve alone"};
     }

@@ -40,15 +40,24 @@ sockaddr_un addressOf(const std::string& path) {
 
 }  // namespace
 
-ControlServer::Endpoint::Endpoint(const std::string& path, const Reporter& reporter)
-    : MonitordSocket(path, CLIENT_TIMEOUT), _reporter(reporter) {}
+ControlServer::Endpoint::Endpoint(const std::string& path, const Reporter& reporter, Health* orders)
+    : MonitordSocket(path, CLIENT_TIMEOUT), _reporter(reporter), _orders(orders) {}
 
 bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Value& reply) {
-    if (request.isObject() && request["act"].isString() && request["act"].asString()[0] == REPORT) {
+    const char action = request.isObject() && request["act"].isString() ? request["act"].asString()[0] : '\0';
+    if (action == REPORT) {
         reply = _reporter.report();
         return true;
     }
-    return MonitordSocket::serverHandle(request, reply);
+    if (action == ORDER && _orders == nullptr) {
+        return false;
+    }
+    const bool isServed = MonitordSocket::serverHandle(request, reply);
+    if (action == ORDER && _orders->isPeerAlive()) {
+        // It replies to each probe, so that no other thread would say that it is not being rebooted.
+        _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
+    }
+    return isServed;
 }
 
 ControlServer::ControlServer(const std::string& path, Access access, Health& health, const Reporter& reporter,
@@ -59,8 +68,8 @@ ControlServer::ControlServer(const std::string& path, Access access, Health& hea
       _streams(streams),
       _events(events),
       _shutdown(shutdown),
-      _requests(path, reporter),
-      _orders(path, reporter) {
+      _requests(path, reporter, nullptr),
+      _orders(path, reporter, &health) {
     _requests.setStatus(&health.status());
     _orders.setStatus(&health.status());
     _clients.reserve(MOST_CLIENTS);
@@ -252,10 +261,6 @@ void ControlServer::carryOutOrder() {
         return;
     }
     const bool isAlive = _health.isPeerAlive();
-    if (isAlive) {
-        // It replies to each probe, so that no other thread would say that it is not being rebooted.
-        _health.status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
-    }
     TERNHAD_LOG(_events, std::string("Reboot of the peer: ") + (isAlive    ? "it still answers, not rebooted"
                                                                 : wasAlive ? "it went down"
                                                                            : "it was already dead"));

@@ -50,9 +50,11 @@ class ControlServer {
  private:
     class Endpoint : public TERN::HA::Daemon::MonitordSocket {
      public:
-        Endpoint(const std::string& path, const Reporter& reporter);
+        // With `orders` it takes orders to reboot the peer, and clears there the mark of one that disobeyed.
+        Endpoint(const std::string& path, const Reporter& reporter, Health* orders);
 
-        // As documented for the base, and the report.
+        // As documented for the base, and the report. Refuses an order that it does not take, whatever was
+        // seen of the request before.
         bool serverHandle(const Json::Value& request, Json::Value& reply) override;
 
         // Serves the request that has come to `fd`.
@@ -60,6 +62,7 @@ class ControlServer {
 
      private:
         const Reporter& _reporter;
+        Health* _orders;
     };
 
     // One that has not sent its request yet.

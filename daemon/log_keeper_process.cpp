@@ -23,7 +23,12 @@ using TERN::HA::Daemon::recordLog;
 
 namespace {
 
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+// The memory of a sanitizer counts, too, and is more than any limit.
+constexpr rlim_t SNAPSHOT_MEMORY = RLIM_INFINITY;
+#else
 constexpr rlim_t SNAPSHOT_MEMORY = 64UL << 20;  // bytes
+#endif
 
 // Moves a log to disk and archives it when it has grown.
 class Mover {

@@ -53,9 +53,13 @@ bool isBroadcast(const std::string& address) {
     }
     const std::unique_ptr<ifaddrs, decltype(&freeifaddrs)> owner(list, freeifaddrs);
     for (const ifaddrs* entry = list; entry != nullptr; entry = entry->ifa_next) {
-        const auto* broadcast = reinterpret_cast<const sockaddr_in*>(entry->ifa_broadaddr);
-        if ((entry->ifa_flags & IFF_BROADCAST) != 0 && broadcast != nullptr &&
-            broadcast->sin_family == AF_INET && broadcast->sin_addr.s_addr == wanted.s_addr) {
+        if ((entry->ifa_flags & IFF_BROADCAST) == 0 || entry->ifa_broadaddr == nullptr ||
+            entry->ifa_broadaddr->sa_family != AF_INET) {
+            continue;
+        }
+        sockaddr_in broadcast = {};
+        std::memcpy(&broadcast, entry->ifa_broadaddr, sizeof broadcast);  // which may not be aligned for it
+        if (broadcast.sin_addr.s_addr == wanted.s_addr) {
             return true;
         }
     }
