@@ -8,8 +8,8 @@
 #include <array>
 
 #include "checker.h"
-#include "fuzz/fuzz.h"
 #include "faults/real_function.h"
+#include "fuzz/fuzz.h"
 
 namespace {
 

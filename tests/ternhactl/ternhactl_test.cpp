@@ -311,7 +311,8 @@ TEST_F(TernhactlTest, ShowsUnknownForFieldsThatAreMissingOrOfWrongTypes) {
     const auto result = shell("ternhactl check");
     answer.join();
     EXPECT_EQ(result.output,
-              "TERNHA UNKNOWN - peer not probed yet, DRBD not checked yet, this node not checked yet | latency=U;;;0 nonok=U;;;0;100\n");
+              "TERNHA UNKNOWN - peer not probed yet, DRBD not checked yet, this node not checked yet | "
+              "latency=U;;;0 nonok=U;;;0;100\n");
     EXPECT_EQ(result.exitCode, 3);
 }
 
