@@ -285,8 +285,9 @@ TEST_F(DaemonTest, ReadsItsConfigurationAndTheCommandLineWins) {
     test::Process daemon({TERNHAD, "--config", "/tmp/ternhad.conf", "--remote-ip", "127.0.0.2"});
     EXPECT_TRUE(test::eventually(10s, [] { return !test::statusAt("/run/other/control.sock").isNull(); }))
         << daemon.error();
-    EXPECT_THAT(test::daemonLogMessages(),
-                Contains(test::LogLine("daemon.cpp", "Started on 127.0.0.1, peer 127.0.0.2")));
+    const auto isStarted = Contains(test::LogLine("daemon.cpp", "Started on 127.0.0.1, peer 127.0.0.2"));
+    EXPECT_TRUE(test::eventually(
+        10s, [&] { return ::testing::Matches(isStarted)(test::messages(test::wholeLog())); }));
     stop(daemon);
 }
 
@@ -546,7 +547,8 @@ TEST_F(DaemonTest, ALostAnswerIsNoDeath) {
             return question == "is_alive" && questions++ % 8 != 0 ? "" : "alive";
         },
         [&] { return questions > 24; });
-    EXPECT_THAT(test::wholeLog(), HasSubstr("changed to alive"));
+    EXPECT_TRUE(
+        test::eventually(10s, [] { return test::wholeLog().find("changed to alive") != std::string::npos; }));
     EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
     stop(daemon);
 }
