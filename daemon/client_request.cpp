@@ -30,7 +30,7 @@ char actionOf(int fd) try {
 
 void discardRequest(int fd) {
     std::array<char, REQUEST_SIZE> text;
-    (void)!recv(fd, text.data(), text.size(), 0);
+    (void)recv(fd, text.data(), text.size(), 0);
 }
 
 void refuse(int fd, const char* reason) {

@@ -25,7 +25,7 @@ Event::~Event() {
 void Event::set() noexcept {
     const std::uint64_t one = 1;
     // Fails only when the flag is set 2^64 - 2 times over.
-    (void)!write(_fd, &one, sizeof one);
+    [[maybe_unused]] const ssize_t written = write(_fd, &one, sizeof one);
 }
 
 bool Event::take() noexcept {

@@ -11,7 +11,7 @@ from contextlib import closing
 from pathlib import Path
 
 from detection import Watchers, measure, vanished
-from nodes import PROGRAMS, Cluster, eventually, require_root
+from nodes import Cluster, eventually, require_root
 
 BUSY = "while :; do :; done"
 FLOOD = """import socket, sys

@@ -1,8 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <cstring>
-
 #include "checker.h"
 #include "support/sandbox.h"
 #include "terncore.h"
@@ -24,7 +22,7 @@ std::string name;
 // The dynamic linker takes this one before that of the platform library.
 int TERNDiskGetDevnamebyAtaPort(char* buffer, int size, const char* port) {
     calls.push_back({port, size, std::string(buffer, static_cast<std::size_t>(size))});
-    std::memcpy(buffer, name.data(), name.size());
+    name.copy(buffer, name.size());
     return result;
 }
 

@@ -21,13 +21,11 @@
 
 namespace {
 
+using namespace std::string_literals;
 using TERN::HA::Daemon::DaemonLog;
 using ::testing::Each;
 using ::testing::ElementsAre;
-using ::testing::MatchesRegex;
-using ::testing::Not;
 using ::testing::SizeIs;
-using ::testing::StartsWith;
 
 constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";
 constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
@@ -165,7 +163,7 @@ TEST_F(DaemonLogTest, LinesOfOneSecondLookAtTheZoneOnce) {
 
 TEST_F(DaemonLogTest, AnyTextIsKeptByteForByte) {
     const test::FixedTime now(1794730821);
-    const std::string text("\n{}\n\0\xff%s\r\n", 11);
+    const std::string text = "\n{}\n\0\xff%s\r\n"s;
     log.set(text);
     EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T08:20:21+00:00 " + text + "\n");
 }

@@ -26,7 +26,6 @@ using TERN::HA::Daemon::MonitordSocket;
 using TERN::HA::Daemon::Status;
 using ::testing::EndsWith;
 using ::testing::HasSubstr;
-using ::testing::StartsWith;
 
 constexpr char SOCKET[] = "/run/ternha/control.sock";
 

@@ -17,7 +17,6 @@
 namespace {
 
 using namespace std::chrono_literals;
-using ::testing::Contains;
 using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::Not;
