@@ -8,6 +8,7 @@
 
 #include <atomic>
 #include <csignal>
+#include <mutex>
 #include <sstream>
 #include <thread>
 
@@ -28,6 +29,8 @@ using ::testing::EndsWith;
 using ::testing::HasSubstr;
 
 constexpr char SOCKET[] = "/run/ternha/control.sock";
+
+std::mutex reportMutex;  // guards the report that a test changes while its server runs
 
 // A daemon's end of the control socket, answering from a record that the test sets. With a report it is a
 // daemon of this version, without one an older daemon.
@@ -55,6 +58,7 @@ class ControlServer {
         explicit Socket(const Json::Value* report) : MonitordSocket(SOCKET, 0), _report(report) {}
 
         bool serverHandle(const Json::Value& request, Json::Value& reply) override {
+            const std::lock_guard<std::mutex> lock(reportMutex);
             if (request["act"] == "S" && _report != nullptr && !_report->isNull()) {
                 reply = *_report;
                 return true;
@@ -153,8 +157,10 @@ TEST_P(Transcript, PrintsWhatItSays) {
         if (command.empty() && line.rfind("state ", 0) == 0) {
             std::istringstream(line.substr(6)) >> json;
             setState(status, json);
+            const std::lock_guard<std::mutex> lock(reportMutex);
             report = Json::Value();
         } else if (command.empty() && line.rfind("report ", 0) == 0) {
+            const std::lock_guard<std::mutex> lock(reportMutex);
             std::istringstream(line.substr(7)) >> report;
         } else if (command.empty() && line.rfind("disks ", 0) == 0) {
             test::writeFile("/tmp/ha/info_hd.remote", line.substr(6));
