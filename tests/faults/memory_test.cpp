@@ -58,6 +58,12 @@ std::string yesNo(bool value) {
     return value ? "yes" : "no";
 }
 
+// Final, because the class has no virtual destructor.
+class Client final : public MonitordSocket {
+ public:
+    using MonitordSocket::MonitordSocket;
+};
+
 class MemoryTest : public test::SandboxTest {
  protected:
     void SetUp() override {
@@ -519,7 +525,7 @@ TEST_F(MemoryTest, AskingOverTheControlSocketWhetherThePeerReboots) {
     });
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
-    std::optional<MonitordSocket> client;
+    std::optional<Client> client;
     expectWhole({"isRebootRemote",
                  [&client] { client.emplace(test::LOCAL_SOCKET, 5); },
                  [&client] { return yesNo(client->isRebootRemote()); },
@@ -528,7 +534,7 @@ TEST_F(MemoryTest, AskingOverTheControlSocketWhetherThePeerReboots) {
 }
 
 TEST_F(MemoryTest, AskingOverTheControlSocketWithoutAServer) {
-    std::optional<MonitordSocket> client;
+    std::optional<Client> client;
     const auto prepare = [&client] { client.emplace("/tmp/nowhere", 5); };
     Json::Value status;
     expectWhole({"rebootRemote", prepare, [&client] { return yesNo(client->rebootRemote()); }, "no"});
