@@ -164,7 +164,7 @@ TEST_F(ReportingTest, KernelFilesThatAreMissingAreLoggedOnceAndSeenWhenTheyAppea
     const auto rounds = [](int wanted) {
         // A round of the checks reads the directories; the record of processes does not.
         test::UdpSocket("127.0.0.3").send("is_alive", "127.0.0.1", 7499);
-        return test::eventually(20s, [=, n = 0]() mutable { return report().isObject() && ++n >= wanted; });
+        return test::eventually(60s, [=, n = 0]() mutable { return report().isObject() && ++n >= wanted; });
     };
     EXPECT_TRUE(test::eventually(10s, [] {
         return test::wholeLog().find("No ATA ports that tell of error handling: no ") != std::string::npos;
