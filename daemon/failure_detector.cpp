@@ -70,15 +70,15 @@ void FailureDetector::probeNotSent() noexcept {
     _isBlocked = true;
 }
 
-void FailureDetector::replyReceived(std::size_t number) noexcept {
-    if (!_probes[number].isAwaited) {
+void FailureDetector::replyReceived(std::size_t probe) noexcept {
+    if (!_probes[probe].isAwaited) {
         return;
     }
-    const Time proof = _probes[number].sent;
+    const Time proof = _probes[probe].sent;
     _lastProof = _isProven ? std::max(_lastProof, proof) : proof;
     _isProven = true;
-    for (Probe& probe : _probes) {
-        probe.isAwaited = probe.isAwaited && probe.sent > proof;  // earlier ones can prove nothing any more
+    for (Probe& other : _probes) {
+        other.isAwaited = other.isAwaited && other.sent > proof;  // earlier ones can prove nothing any more
     }
 }
 

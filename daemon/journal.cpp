@@ -24,7 +24,7 @@ void writeJournal(Level level, const std::string& text) {
         isJournal() ? '<' + std::to_string(static_cast<int>(level)) + '>' : "ternhad: ";
     const std::string line = prefix + text + '\n';
     // In one piece; without a reader there is nobody to tell.
-    (void)!write(STDERR_FILENO, line.data(), line.size());
+    [[maybe_unused]] const ssize_t written = write(STDERR_FILENO, line.data(), line.size());
 }
 
 }  // namespace ternhad

@@ -62,7 +62,7 @@ class Prober::Socket final : public HASocketCommClient {
     bool renew() const {
         sockaddr none = {};
         none.sa_family = AF_UNSPEC;
-        connect(sockFd, &none, sizeof none);
+        (void)connect(sockFd, &none, sizeof none);
         discardOldReplies();
         return connect(sockFd, reinterpret_cast<const sockaddr*>(&peerAddr), sizeof peerAddr) == 0;
     }

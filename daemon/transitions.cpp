@@ -34,7 +34,7 @@ Transitions::State Transitions::state(Flag flag) const noexcept {
 Transitions::Reader::Reader(Transitions& transitions) : _transitions(transitions), _position(0) {
     const std::lock_guard<std::mutex> lock(transitions._mutex);
     _position = transitions._count;
-    const auto place = std::find(transitions._readers.begin(), transitions._readers.end(), nullptr);
+    auto* const place = std::find(transitions._readers.begin(), transitions._readers.end(), nullptr);
     if (place == transitions._readers.end()) {
         throw std::logic_error("too many readers of transitions");
     }

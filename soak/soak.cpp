@@ -56,10 +56,7 @@ struct Side {
     }
 
     // The daemon's process, as this namespace numbers it.
-    std::string proc() {
-        const std::string task = "/.kernel/proc/" + std::to_string(machine.daemon->pid());
-        return task;
-    }
+    std::string proc() { return "/.kernel/proc/" + std::to_string(machine.daemon->pid()); }
 
     Machine machine;
     bool isRunning = false;

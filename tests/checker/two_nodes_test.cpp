@@ -14,7 +14,6 @@ using namespace std::chrono_literals;
 using TERN::HA::Daemon::GetRemoteHostname;
 using TERN::HA::Daemon::IsRemoteAlive;
 using TERN::HA::Daemon::Status;
-using ::testing::ElementsAre;
 
 namespace {
 

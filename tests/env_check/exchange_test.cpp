@@ -23,10 +23,8 @@ using test::UdpSocket;
 using ::testing::AllOf;
 using ::testing::Each;
 using ::testing::ElementsAre;
-using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using ::testing::SizeIs;
-using ::testing::StartsWith;
 
 namespace {
 

@@ -57,7 +57,7 @@ bool fails(const char* function) {
 #define INTERPOSE(RESULT, NAME, KEY, FAILURE, PARAMETERS, ARGUMENTS, SPECIFIER) \
     RESULT NAME PARAMETERS SPECIFIER {                                          \
         static auto* const real = test::realFunction<RESULT PARAMETERS>(#NAME); \
-        return fails(KEY) ? FAILURE : real ARGUMENTS;                           \
+        return fails(KEY) ? (FAILURE) : real ARGUMENTS;                         \
     }
 
 // clang-format off

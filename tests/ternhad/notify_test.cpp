@@ -10,7 +10,6 @@
 namespace {
 
 using namespace std::chrono_literals;
-using ::testing::HasSubstr;
 using ::testing::MatchesRegex;
 
 constexpr char PROGRAM[] = "/tmp/on-change";
