@@ -11,7 +11,6 @@ namespace ternhad {
 
 namespace {
 
-constexpr auto FOREVER = std::chrono::hours(24);
 
 std::string timeText(std::chrono::system_clock::time_point time) {
     const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
@@ -39,7 +38,7 @@ void Announcer::run() {
                 notifyStatus(summary());
             }
         });
-    } while (_shutdown.sleepUntil(Clock::now() + FOREVER, {&_reader.event()}));
+    } while (_shutdown.waitFor(_reader.event()));
 }
 
 void Announcer::announce(const Transition& transition) {

@@ -56,6 +56,10 @@ bool Shutdown::sleepUntil(Clock::time_point time, std::initializer_list<const Ev
     return !isRequested();
 }
 
+bool Shutdown::waitFor(const Event& event) const noexcept {
+    return sleepUntil(Clock::now() + std::chrono::hours(24), {&event});
+}
+
 Clock::time_point nextRound(Clock::time_point round, std::chrono::duration<double> interval) noexcept {
     return std::max(round + std::chrono::duration_cast<Clock::duration>(interval), Clock::now());
 }

@@ -45,6 +45,9 @@ class Shutdown {
     // Sleeps until `time`, or until one of `others` is set. False when the daemon ends.
     bool sleepUntil(Clock::time_point time, std::initializer_list<const Event*> others = {}) const noexcept;
 
+    // Sleeps until `event` is set, a day at most. False when the daemon ends.
+    bool waitFor(const Event& event) const noexcept;
+
  private:
     Event _event;
     std::atomic<bool> _isRequested{false};

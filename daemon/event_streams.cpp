@@ -14,7 +14,7 @@ namespace ternhad {
 
 namespace {
 
-constexpr std::size_t MOST_CLIENTS = 16;
+constexpr std::size_t MOST_FOLLOWERS = 16;
 
 std::string lineOf(const Json::Value& value) {
     Json::StreamWriterBuilder builder;
@@ -35,7 +35,7 @@ EventStreams::~EventStreams() {
 
 bool EventStreams::add(int fd) {
     const std::lock_guard<std::mutex> lock(_mutex);
-    if (_count == MOST_CLIENTS) {
+    if (_count == MOST_FOLLOWERS) {
         return false;
     }
     _new.push_back(fd);

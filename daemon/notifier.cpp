@@ -18,7 +18,6 @@ namespace {
 
 constexpr auto LIMIT = std::chrono::seconds(30);
 constexpr auto STEP = std::chrono::milliseconds(50);
-constexpr auto FOREVER = std::chrono::hours(24);
 
 // The daemon's environment, without its manager's means, and the change.
 std::vector<std::string> environmentOf(const Transition& transition, const std::string& peer) {
@@ -71,7 +70,7 @@ void Notifier::run() {
                 notify(*transition);
             }
         });
-    } while (_shutdown.sleepUntil(Clock::now() + FOREVER, {&_reader.event()}));
+    } while (_shutdown.waitFor(_reader.event()));
 }
 
 void Notifier::notify(const Transition& transition) {

@@ -19,7 +19,7 @@ namespace ternhad {
 namespace {
 
 constexpr auto LONGEST_WAIT = std::chrono::seconds(30);
-constexpr int MOST_AT_ONCE = 64;  // requests served before the clock is looked at
+constexpr int MOST_REQUESTS = 64;  // requests served before the clock is looked at
 constexpr char REPLYING[] = "reply to the peer";
 
 struct CheckDeleter {
@@ -71,7 +71,7 @@ void PeerServer::serve(Socket& socket) noexcept {
         reply(socket, "");
     }
     std::string request;
-    for (int count = 0; count < MOST_AT_ONCE; ++count) {
+    for (int count = 0; count < MOST_REQUESTS; ++count) {
         try {
             if (socket.Recv(request) < 0) {
                 return;

@@ -20,7 +20,7 @@ using TERN::HA::Daemon::IsRemoteAlive;
 namespace {
 
 constexpr unsigned int NO_TIMEOUT = 0;
-constexpr int MOST_AT_ONCE = 64;  // datagrams read from one socket before the others have their turn
+constexpr int MOST_REPLIES = 64;  // datagrams read from one socket before the others have their turn
 constexpr char SENDING[] = "send liveness probes";
 
 // True when a probe did not leave this node because this node lacks something. Everything else that keeps one
@@ -150,7 +150,7 @@ void Prober::receive(FailureDetector& detector) noexcept {
     std::string reply;
     for (std::size_t i = 0; i < _sockets.size(); ++i) {
         try {
-            for (int count = 0; count < MOST_AT_ONCE && detector.isAwaited(i); ++count) {
+            for (int count = 0; count < MOST_REPLIES && detector.isAwaited(i); ++count) {
                 reply.clear();
                 if (_sockets[i]->Recv(reply) < 0 && !isMoreExpected()) {
                     break;

@@ -15,7 +15,6 @@ namespace ternhad {
 namespace {
 
 constexpr auto DEADLINE = std::chrono::seconds(5);
-constexpr auto FOREVER = std::chrono::hours(24);
 
 // A check has no data members.
 Reboot* theReboot = nullptr;
@@ -24,7 +23,7 @@ const Health* theHealth = nullptr;
 }  // namespace
 
 void Reboot::flush() {
-    while (_shutdown.sleepUntil(Clock::now() + FOREVER, {&_ordered})) {
+    while (_shutdown.waitFor(_ordered)) {
         if (!_ordered.take()) {
             continue;
         }

@@ -23,12 +23,11 @@ namespace {
 
 using namespace std::string_literals;
 using TERN::HA::Daemon::DaemonLog;
+using test::BUFFER;
+using test::LOG;
 using ::testing::Each;
 using ::testing::ElementsAre;
 using ::testing::SizeIs;
-
-constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";
-constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
 
 class DaemonLogTest : public test::SandboxTest {
  protected:

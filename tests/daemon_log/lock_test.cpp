@@ -15,9 +15,8 @@ namespace {
 
 using namespace std::chrono_literals;
 using TERN::HA::Daemon::DaemonLog;
+using test::LOG;
 using ::testing::ElementsAre;
-
-constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
 
 // A rotation that is stuck in its compressor holds the log's mutex until release().
 class StuckLogTest : public test::SandboxTest {

@@ -10,9 +10,8 @@
 namespace {
 
 using TERN::HA::Daemon::DaemonLog;
+using test::LOG;
 using ::testing::ElementsAre;
-
-constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
 
 std::string archive(int number) {
     return std::string(LOG) + "." + std::to_string(number);

@@ -9,9 +9,8 @@
 namespace {
 
 using TERN::HA::Daemon::DaemonLog;
+using test::LOG;
 using ::testing::ElementsAre;
-
-constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
 
 // File systems that take nothing any more, for a while.
 class LogTroubleTest : public test::SandboxTest {

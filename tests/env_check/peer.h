@@ -14,6 +14,7 @@ namespace test {
 
 constexpr std::uint16_t kPeerPort = 7499;
 constexpr const char* kPeerAddress = "127.0.0.2";
+constexpr const char* kServer = "127.0.0.2";  ///< where a server under test serves
 
 /// Stands in for the other node: gives the same answer to everyone who asks kPeerAddress.
 class FakePeer {

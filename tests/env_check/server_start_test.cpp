@@ -19,6 +19,7 @@ using TERN::HA::Daemon::Status;
 using test::arrived;
 using test::isBound;
 using test::kPeerPort;
+using test::kServer;
 using test::LogLine;
 using test::UdpSocket;
 using ::testing::ElementsAre;
@@ -26,7 +27,6 @@ using ::testing::IsEmpty;
 
 namespace {
 
-constexpr const char* kServer = "127.0.0.2";
 
 // The socket of a server stays open until the process ends, and so these tests do not look at descriptors.
 class ServerStartTest : public ::testing::Test {

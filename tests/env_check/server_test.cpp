@@ -24,6 +24,7 @@ using TERN::HA::Daemon::Status;
 using test::arrived;
 using test::isBound;
 using test::kPeerPort;
+using test::kServer;
 using test::UdpSocket;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
@@ -31,7 +32,6 @@ using ::testing::KilledBySignal;
 
 namespace {
 
-constexpr const char* kServer = "127.0.0.2";
 constexpr std::size_t kNameLimit = 63;
 
 class Undefined : public EnvCheck {};

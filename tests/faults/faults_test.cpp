@@ -31,11 +31,11 @@
 namespace {
 
 using namespace TERN::HA::Daemon;
+using test::LOG;
 using test::LogLine;
 using ::testing::ElementsAreArray;
 using ::testing::Matcher;
 
-constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
 constexpr char TRIGGER[] = "/proc/sysrq-trigger";
 
 // What an operation with one failing call leaves.

@@ -35,9 +35,9 @@
 namespace {
 
 using namespace TERN::HA::Daemon;
+using test::BUFFER;
+using test::LOG;
 
-constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
-constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";
 constexpr char TRIGGER[] = "/proc/sysrq-trigger";
 constexpr char OUT_OF_MEMORY[] = "out of memory";
 

@@ -21,6 +21,10 @@ class SandboxTest : public ::testing::Test {
     std::map<std::string, std::string> _descriptors;
 };
 
+/// Where the daemon log's lines go, and where they are buffered until they are moved there.
+inline constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
+inline constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";
+
 /// The content of the buffer file of the daemon log (the record log), /tmp/ha/ha.daemon.log (.record); empty
 /// when there is none.
 std::string bufferText();
