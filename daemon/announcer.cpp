@@ -11,7 +11,6 @@ namespace ternhad {
 
 namespace {
 
-
 std::string timeText(std::chrono::system_clock::time_point time) {
     const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
     std::tm fields = {};

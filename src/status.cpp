@@ -80,6 +80,7 @@ NodeState Status::getRemoteNodeState() const {
 }
 
 bool Status::setRemoteAlive(bool alive) {
+    // Frozen: docs/compatibility.md#logged-before-set
     if (isRemoteNodeState(NodeAlive) != alive) {
         HA_LOG(std::string("Remote server status changed to ") + (alive ? "alive" : "dead"));
     }

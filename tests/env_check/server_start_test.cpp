@@ -27,7 +27,6 @@ using ::testing::IsEmpty;
 
 namespace {
 
-
 // The socket of a server stays open until the process ends, and so these tests do not look at descriptors.
 class ServerStartTest : public ::testing::Test {
  protected:

@@ -2,18 +2,32 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
+#include <atomic>
+#include <string>
 #include <thread>
 
+#include "support/files.h"
 #include "support/json.h"
 #include "support/sandbox.h"
+#include "support/wait.h"
 
 namespace {
 
+using namespace std::chrono_literals;
 using namespace TERN::HA::Daemon;
+using test::LogLine;
 using test::parsed;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
+
+// Whether a thread of this process waits in the kernel.
+bool isAsleep(pid_t thread) {
+    const std::string stat = test::readFile("/.kernel/proc/self/task/" + std::to_string(thread) + "/stat");
+    return stat.find(") S ") != std::string::npos;
+}
 
 class StatusTest : public test::SandboxTest {
  protected:
@@ -85,8 +99,23 @@ TEST_F(StatusTest, OnlyAChangeOfLifeIsLogged) {
     EXPECT_TRUE(status.setRemoteAlive(false));
     EXPECT_TRUE(status.setRemoteAlive(false));
     EXPECT_THAT(test::daemonLogMessages(),
-                ElementsAre(test::LogLine("status.cpp", "Remote server status changed to alive"),
-                            test::LogLine("status.cpp", "Remote server status changed to dead")));
+                ElementsAre(LogLine("status.cpp", "Remote server status changed to alive"),
+                            LogLine("status.cpp", "Remote server status changed to dead")));
+}
+
+TEST_F(StatusTest, AChangeOfLifeIsLoggedBeforeItIsRecorded) {
+    ASSERT_EQ(mkfifo(test::BUFFER, 0600), 0);  // the writer of a FIFO waits for its reader
+    std::atomic<pid_t> thread{0};
+    std::thread change([&] {
+        thread = gettid();
+        status.setRemoteAlive(true);
+    });
+    ASSERT_TRUE(test::eventually(10s, [&] { return thread != 0 && isAsleep(thread); }));
+    EXPECT_FALSE(status.isRemoteAlive());
+    EXPECT_THAT(test::messages(test::readFile(test::BUFFER)),
+                ElementsAre(LogLine("status.cpp", "Remote server status changed to alive")));
+    change.join();
+    EXPECT_TRUE(status.isRemoteAlive());
 }
 
 TEST_F(StatusTest, LifeSetsAndClearsItsBitAlone) {
