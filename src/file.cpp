@@ -22,16 +22,15 @@ ssize_t File::read(char* buffer, std::size_t size) const {
     return TEMP_FAILURE_RETRY(::read(_fd, buffer, size));
 }
 
-bool File::write(const char* data, std::size_t size) const {
+void File::write(const char* data, std::size_t size) const {
     while (size > 0) {
         const ssize_t count = TEMP_FAILURE_RETRY(::write(_fd, data, size));
         if (count == -1) {
-            return false;
+            return;
         }
         data += count;
         size -= static_cast<std::size_t>(count);
     }
-    return true;
 }
 
 bool File::isRegular() const {

@@ -24,8 +24,8 @@ class File {
     // failure.
     ssize_t read(char* buffer, std::size_t size) const;
 
-    // Writes all of `data`: one write(2), more only where the kernel took part of it. False on failure.
-    bool write(const char* data, std::size_t size) const;
+    // Writes `data`: one write(2), more only where the kernel took part of it. What it does not take is lost.
+    void write(const char* data, std::size_t size) const;
 
     // A regular file; of root or of this process's user.
     bool isRegular() const;
