@@ -2,6 +2,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <fstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -65,10 +66,40 @@ TEST_F(LocalHostnameTest, AFifoIsNotWaitedFor) {
     EXPECT_EQ(getLocalHostname(), "");
 }
 
+TEST_F(LocalHostnameTest, AFifoIsNotRead) {
+    ASSERT_EQ(mkfifo(kHostname, 0600), 0);
+    std::fstream writer(kHostname, std::ios::in | std::ios::out);
+    writer << "node-a" << std::flush;
+    EXPECT_EQ(getLocalHostname(), "");
+}
+
 TEST_F(LocalHostnameTest, ALinkIsNotFollowed) {
     writeFile("/tmp/secret", "secret");
     ASSERT_EQ(symlink("/tmp/secret", kHostname), 0);
     EXPECT_EQ(getLocalHostname(), "");
+}
+
+// What an ordinary user of the machine reads. In a sandbox of one, no other user is known: it stays root.
+std::string hostnameAsUser(uid_t user) {
+    [[maybe_unused]] const int result = seteuid(user);
+    std::string name = getLocalHostname();
+    EXPECT_EQ(seteuid(0), 0);
+    return name;
+}
+
+TEST_F(LocalHostnameTest, AUserTakesAFileOfRoot) {
+    writeFile(kHostname, "node-a");
+    ASSERT_EQ(chmod(kHostname, 0644), 0);
+    EXPECT_EQ(hostnameAsUser(1000), "node-a");
+}
+
+TEST_F(LocalHostnameTest, AUserTakesAFileOfItsOwn) {
+    writeFile(kHostname, "node-a");
+    if (chown(kHostname, 1000, 1000) == 0) {
+        EXPECT_EQ(hostnameAsUser(1000), "node-a");
+    } else {
+        EXPECT_EQ(getLocalHostname(), "node-a");
+    }
 }
 
 TEST_F(LocalHostnameTest, AFileOfAnotherUserIsNotTaken) {

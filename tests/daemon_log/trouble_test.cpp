@@ -1,13 +1,25 @@
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/ioctl.h>
 #include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <atomic>
+#include <csignal>
+#include <string>
+#include <thread>
 
 #include "daemon_log.h"
 #include "support/files.h"
 #include "support/sandbox.h"
+#include "support/wait.h"
 
 namespace {
 
+using namespace std::chrono_literals;
 using TERN::HA::Daemon::DaemonLog;
 using test::LOG;
 using ::testing::ElementsAre;
@@ -105,6 +117,41 @@ TEST_F(LogTroubleTest, WorksAgainWhenTheDirectoriesAreMadeAgain) {
     log.set("kept");
     log.writeLogToDisk();
     EXPECT_THAT(test::messages(test::readFile(LOG)), ElementsAre("kept"));
+}
+
+std::atomic<bool> isInterrupted{false};
+
+TEST_F(LogTroubleTest, ALineWhoseWriteIsInterruptedIsContinued) {
+    // A signal ends the write of a line that does not fit into a pipe after a part of it.
+    ASSERT_EQ(mkfifo(test::BUFFER, 0600), 0);
+    const int pipe = open(test::BUFFER, O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    ASSERT_NE(pipe, -1);
+    const int capacity = fcntl(pipe, F_GETPIPE_SZ);
+    std::string text;
+    for (int i = 0; static_cast<int>(text.size()) < 2 * capacity; ++i) {
+        text += std::to_string(i) + ' ';
+    }
+    std::signal(SIGUSR2, [](int) { isInterrupted = true; });
+    std::atomic<pid_t> id{0};
+    std::thread writer([&] {
+        id = gettid();
+        log.set(text);
+    });
+    ASSERT_TRUE(test::eventually(10s, [&] {
+        int filled = 0;
+        return ioctl(pipe, FIONREAD, &filled) == 0 && filled == capacity && test::isAsleep(id);
+    }));
+    ASSERT_EQ(pthread_kill(writer.native_handle(), SIGUSR2), 0);
+    ASSERT_TRUE(test::eventually(10s, [&] { return isInterrupted && test::isAsleep(id); }));
+    ASSERT_EQ(fcntl(pipe, F_SETFL, 0), 0);
+    std::string written;
+    std::array<char, 4096> part;
+    for (ssize_t count = 0; (count = read(pipe, part.data(), part.size())) > 0;) {
+        written.append(part.data(), static_cast<std::size_t>(count));
+    }
+    writer.join();
+    close(pipe);
+    EXPECT_THAT(test::messages(written), ElementsAre(text));
 }
 
 TEST_F(LogTroubleTest, ADirectoryInTheBuffersPlaceCostsTheLinesOfThatTime) {

@@ -23,12 +23,6 @@ using test::parsed;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-// Whether a thread of this process waits in the kernel.
-bool isAsleep(pid_t thread) {
-    const std::string stat = test::readFile("/.kernel/proc/self/task/" + std::to_string(thread) + "/stat");
-    return stat.find(") S ") != std::string::npos;
-}
-
 class StatusTest : public test::SandboxTest {
  protected:
     Status status;
@@ -110,7 +104,7 @@ TEST_F(StatusTest, AChangeOfLifeIsLoggedBeforeItIsRecorded) {
         thread = gettid();
         status.setRemoteAlive(true);
     });
-    ASSERT_TRUE(test::eventually(10s, [&] { return thread != 0 && isAsleep(thread); }));
+    ASSERT_TRUE(test::eventually(10s, [&] { return thread != 0 && test::isAsleep(thread); }));
     EXPECT_FALSE(status.isRemoteAlive());
     EXPECT_THAT(test::messages(test::readFile(test::BUFFER)),
                 ElementsAre(LogLine("status.cpp", "Remote server status changed to alive")));

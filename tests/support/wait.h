@@ -1,7 +1,12 @@
 #pragma once
 
+#include <sys/types.h>
+
 #include <chrono>
+#include <string>
 #include <thread>
+
+#include "support/files.h"
 
 namespace test {
 
@@ -18,6 +23,12 @@ bool eventually(std::chrono::milliseconds deadline, Predicate&& predicate) {
         std::this_thread::sleep_for(INTERVAL);
     }
     return true;
+}
+
+/// Whether a thread of this process waits in the kernel.
+inline bool isAsleep(pid_t thread) {
+    const std::string stat = readFile("/.kernel/proc/self/task/" + std::to_string(thread) + "/stat");
+    return stat.find(") S ") != std::string::npos;
 }
 
 /// Measures on the monotonic clock from its construction on.

@@ -2,6 +2,8 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <fstream>
+
 #include "support/files.h"
 #include "support/sandbox.h"
 #include "util.h"
@@ -84,6 +86,13 @@ class StrangeTableTest : public DiskNamesTest {
 
 TEST_F(StrangeTableTest, AFifoIsNotWaitedFor) {
     ASSERT_EQ(mkfifo(TABLE, 0600), 0);
+    expectUseless();
+}
+
+TEST_F(StrangeTableTest, AFifoIsNotRead) {
+    ASSERT_EQ(mkfifo(TABLE, 0600), 0);
+    std::fstream writer(TABLE, std::ios::in | std::ios::out);
+    writer << THREE_DISKS << std::flush;
     expectUseless();
 }
 
