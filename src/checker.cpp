@@ -430,9 +430,8 @@ std::string getLocalHostname() {
     static std::string cache;
     const std::lock_guard<std::mutex> lock(mutex);
     if (cache.empty()) {
-        std::string content;
-        readSmallFile("/tmp/.ha.hostname.original", HOSTNAME_LIMIT, Owner::trusted, content);
-        cache.swap(content);  // the whole name or none, also when memory runs out
+        // The whole name or none, also when memory runs out.
+        cache = readSmallFile("/tmp/.ha.hostname.original", HOSTNAME_LIMIT, Owner::trusted);
     }
     return cache;
 }

@@ -67,14 +67,14 @@ bool readFile(const char* path, std::string& content) {
     return true;
 }
 
-bool readSmallFile(const char* path, std::size_t limit, Owner owner, std::string& content) {
+std::string readSmallFile(const char* path, std::size_t limit, Owner owner) {
     const bool mustBeTrusted = owner == Owner::trusted;
     const File file(path, O_RDONLY | O_NONBLOCK | (mustBeTrusted ? O_NOFOLLOW : 0));
-    if (!file.isOpen() || !file.isRegular() || (mustBeTrusted && !file.isTrusted())) {
-        return false;
+    std::string content;
+    if (file.isOpen() && file.isRegular() && (file.isTrusted() || !mustBeTrusted)) {
+        readAll(file, limit, content);
     }
-    readAll(file, limit, content);
-    return true;
+    return content;
 }
 
 }  // namespace TERN::HA::Daemon

@@ -40,10 +40,10 @@ bool readFile(const char* path, std::string& content);
 
 enum class Owner { any, trusted };
 
-// The same for a path where something else than a small file may stand. Opens without waiting, and takes at
-// most `limit` bytes. False, too, for what is no regular file. Owner::trusted: where other users can write to
-// the directory; false, too, for a symbolic link and for what belongs neither to root nor to this process's
-// user.
-bool readSmallFile(const char* path, std::size_t limit, Owner owner, std::string& content);
+// The content of a small file, where something else may stand in its place: opens without waiting, and takes
+// at most `limit` bytes. Empty for what cannot be opened or is no regular file. Owner::trusted, where other
+// users can write to the directory: empty, too, for a symbolic link and for what belongs neither to root nor
+// to this process's user.
+std::string readSmallFile(const char* path, std::size_t limit, Owner owner);
 
 }  // namespace TERN::HA::Daemon

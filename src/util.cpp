@@ -22,10 +22,8 @@ Json::Value readDiskTable() {
     if (!PLATFileExist(DISK_TABLE)) {
         return table;
     }
-    std::string text;
-    const bool isRead =
-        readSmallFile(DISK_TABLE, DISK_TABLE_LIMIT + 1, Owner::any, text) && text.size() <= DISK_TABLE_LIMIT;
-    if (!isRead || !parseJson(text, table)) {
+    const std::string text = readSmallFile(DISK_TABLE, DISK_TABLE_LIMIT + 1, Owner::any);
+    if (text.size() > DISK_TABLE_LIMIT || !parseJson(text, table)) {
         HA_LOG(std::string("Failed to read HD info json: ") + DISK_TABLE);
     }
     return table.isObject() ? table : Json::Value();
