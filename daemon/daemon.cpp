@@ -50,7 +50,7 @@ bool complain(const std::string& what, int error) {
 Daemon::Daemon(const Options& options, InstanceLock& lock)
     : _options(options),
       _lock(lock),
-      _health(_events, std::chrono::duration_cast<Clock::duration>(options.deadAfter)),
+      _health(_events),
       _logKeeper(options, _health, _events),
       _reboot(_events, _shutdown),
       _peerServer(_health, _events, _reboot, _shutdown, _progress),

@@ -30,6 +30,10 @@ bool makeDirectory(const std::string& path) {
     if (error) {
         return complain(parent, error.message());
     }
+    struct stat info = {};
+    if (lstat(path.c_str(), &info) == 0) {
+        return true;  // mkdir would wait for a frozen disk before it looks
+    }
     if (mkdir(path.c_str(), PRIVATE_DIR) != 0 && errno != EEXIST) {
         return complain(path, std::strerror(errno));
     }

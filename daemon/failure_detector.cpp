@@ -38,7 +38,8 @@ void FailureDetector::discount(Duration time) noexcept {
 }
 
 FailureDetector::Time FailureDetector::wakeUpTime() const noexcept {
-    return isPeerAlive() ? std::min(probeTime(), _lastProof + _deadAfter) : probeTime();
+    // While blocked, no time counts that could be up.
+    return _isBlocked || isPeerDead() ? probeTime() : std::min(probeTime(), _lastProof + _deadAfter);
 }
 
 FailureDetector::Time FailureDetector::probeTime() const noexcept {
@@ -52,7 +53,7 @@ FailureDetector::Time FailureDetector::probeTime() const noexcept {
             missed = std::min(missed, probe.sent + _missedAfter);
         }
     }
-    if (!isPeerAlive()) {
+    if (isPeerDead()) {
         return regular;
     }
     return missed <= _now ? std::max(missed, _lastAttempt + _fastInterval) : std::min(regular, missed);

@@ -11,7 +11,8 @@ namespace ternhad {
 //
 // The peer is dead when it has not been proven alive for `deadAfter`. A reply proves that it was alive when
 // the probe that it answers was sent. Time in which this process did not run, or could not send for reasons
-// of its own, does not count.
+// of its own, does not count. Before the first reply the peer is neither alive nor, until the time is up,
+// dead.
 class FailureDetector {
  public:
     using Clock = std::chrono::steady_clock;
@@ -46,7 +47,8 @@ class FailureDetector {
     void replyReceived(std::size_t probe) noexcept;
 
     // The decision as of the last wakeUp() and the replies since.
-    bool isPeerAlive() const noexcept { return _isProven && _now - _lastProof < _deadAfter; }
+    bool isPeerAlive() const noexcept { return _isProven && !isPeerDead(); }
+    bool isPeerDead() const noexcept { return _now - _lastProof >= _deadAfter; }
 
  private:
     struct Probe {
@@ -65,7 +67,7 @@ class FailureDetector {
     std::size_t _next = 0;
     Time _now;
     Time _lastAttempt;
-    Time _lastProof;
+    Time _lastProof;  // of life; the beginning, before the first one
     bool _isProven = false;
     bool _isBlocked = false;  // the last attempt to send failed
 };

@@ -16,15 +16,14 @@ namespace ternhad {
 // trace. Thread-safe.
 class Health {
  public:
-    // `deadAfter`: see Transitions.
-    Health(Events& events, Clock::duration deadAfter) : _events(events), _transitions(deadAfter) {}
+    explicit Health(Events& events) : _events(events) {}
 
     TERN::HA::Daemon::Status& status() noexcept { return _status; }
 
     bool isPeerAlive() const noexcept { return _status.isRemoteAlive(); }
 
-    // The outcome of the liveness probes, as Status::setRemoteAlive stores it. Waits for nothing but the
-    // record's lock, under which nobody waits.
+    // The outcome of the liveness probes, as Status::setRemoteAlive stores it; do not call before there is
+    // one. Waits for nothing but the record's lock, under which nobody waits.
     void setPeerAlive(bool isAlive) noexcept;
 
     // Any other flag.

@@ -16,6 +16,7 @@
 #include <cstring>
 #include <iostream>
 #include <memory>
+#include <utility>
 #include <vector>
 
 #include "config_file.h"
@@ -180,9 +181,11 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
         if (options.localIp == options.remoteIp) {
             throw CLI::ValidationError("--remote-ip", "the same address as --local-ip");
         }
-        if (isBroadcast(options.remoteIp)) {
-            throw CLI::ValidationError("--remote-ip",
-                                       "the broadcast address of a network: " + options.remoteIp);
+        for (const auto& [name, address] :
+             {std::pair{"--local-ip", options.localIp}, std::pair{"--remote-ip", options.remoteIp}}) {
+            if (isBroadcast(address)) {
+                throw CLI::ValidationError(name, "the broadcast address of a network: " + address);
+            }
         }
         if (options.checkInterval * 3 > options.deadAfter + ROUNDING) {
             throw CLI::ValidationError("--check-interval", "above a third of --dead-after");

@@ -57,7 +57,7 @@ void PeerServer::run() noexcept {
         return;
     }
     _started.set_value(0);
-    raisePriority();
+    raisePriority(Priority::replies);
     while (!_shutdown.isRequested()) {
         serve(socket);
         _progress.made(Progress::peerServer);
@@ -114,8 +114,10 @@ void PeerServer::reportTrouble(int error) noexcept {
 }
 
 void PeerServer::wait(const Socket& socket) const noexcept {
+    // A flush that ends after its order was given up wakes nobody.
+    const int flushed = _reboot.isOrdered() ? _reboot.flushed().fd() : -1;
     std::array<pollfd, 3> waits = {
-        {{socket.fd(), POLLIN, 0}, {_shutdown.event().fd(), POLLIN, 0}, {_reboot.flushed().fd(), POLLIN, 0}}};
+        {{socket.fd(), POLLIN, 0}, {_shutdown.event().fd(), POLLIN, 0}, {flushed, POLLIN, 0}}};
     const auto limit = Clock::now() + LONGEST_WAIT;
     const timespec rest = timeUntil(_reboot.isOrdered() ? _reboot.deadline() : limit);
     ppoll(waits.data(), waits.size(), &rest, nullptr);

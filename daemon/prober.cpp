@@ -104,12 +104,14 @@ void Prober::run() noexcept {
         }
     }
     _started.set_value(0);
-    raisePriority();
+    raisePriority(Priority::probes);
     while (!_shutdown.isRequested()) {
         // First the time, then the replies: what has come by that time is seen before anything is decided.
         detector.wakeUp(Clock::now());
         receive(detector);
-        _health.setPeerAlive(detector.isPeerAlive());
+        if (detector.isPeerAlive() || detector.isPeerDead()) {
+            _health.setPeerAlive(detector.isPeerAlive());
+        }
         if (detector.isProbeDue()) {
             probe(detector);
         }

@@ -81,9 +81,9 @@ bool isolateDescriptors() noexcept {
 #endif
 }
 
-void raisePriority() noexcept {
+void raisePriority(Priority priority) noexcept {
     sched_param parameters = {};
-    parameters.sched_priority = sched_get_priority_max(SCHED_RR);
+    parameters.sched_priority = sched_get_priority_max(SCHED_RR) - static_cast<int>(priority);
     pthread_setschedparam(pthread_self(), SCHED_RR, &parameters);
 }
 

@@ -36,7 +36,9 @@ class Threads {
 // where this is not permitted.
 bool isolateDescriptors() noexcept;
 
-// Puts the calling thread before all that are not real-time threads, as far as this is permitted.
-void raisePriority() noexcept;
+// Puts the calling thread before all that are not real-time threads, as far as this is permitted. Probes come
+// before replies, of which anybody on the link may request any number.
+enum class Priority { probes, replies };
+void raisePriority(Priority priority) noexcept;
 
 }  // namespace ternhad

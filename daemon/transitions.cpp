@@ -11,7 +11,7 @@ void Transitions::found(Flag flag, bool value) noexcept {
     const std::lock_guard<std::mutex> lock(_mutex);
     State& state = _states.at(static_cast<std::size_t>(flag));
     const bool isFirst = !state.value;
-    if (state.value == value || (isFirst && flag == Flag::peerAlive && !value && Clock::now() < _end)) {
+    if (state.value == value) {
         return;
     }
     const Time now = wallClock();

@@ -33,9 +33,7 @@ class Transitions {
         std::uint64_t changes = 0;  // after the first check
     };
 
-    // Before the first reply the peer is dead only after `deadAfter`; until then it is unknown.
-    explicit Transitions(Clock::duration deadAfter) : _end(Clock::now() + deadAfter) {}
-
+    Transitions() = default;
     Transitions(const Transitions&) = delete;
     Transitions& operator=(const Transitions&) = delete;
 
@@ -77,7 +75,6 @@ class Transitions {
     std::array<Transition, CAPACITY> _latest;
     std::uint64_t _count = 0;
     std::array<Reader*, MOST_READERS> _readers = {};
-    Clock::time_point _end;  // of the time in which a peer without a reply is unknown
 };
 
 }  // namespace ternhad

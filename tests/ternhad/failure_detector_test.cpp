@@ -48,6 +48,7 @@ class FailureDetectorTest : public ::testing::Test {
             died = now - start;
         }
         wasAlive = detector.isPeerAlive();
+        ++wakeUps;
         if (!detector.isProbeDue()) {
             return;
         }
@@ -76,14 +77,44 @@ class FailureDetectorTest : public ::testing::Test {
     Duration died = Duration::max();
     bool isReplying = true;
     bool wasAlive = false;
+    int wakeUps = 0;
     Sending sending = Sending::works;
 };
 
-TEST_F(FailureDetectorTest, PeerIsDeadBeforeItsFirstReply) {
+TEST_F(FailureDetectorTest, PeerWithoutAReplyIsUnknownUntilTheTimeIsUp) {
     isReplying = false;
-    runUntil(10s);
+    runUntil(2999ms);
     EXPECT_FALSE(detector.isPeerAlive());
-    EXPECT_EQ(probes.size(), 11U);
+    EXPECT_FALSE(detector.isPeerDead());
+    runUntil(3s);
+    EXPECT_FALSE(detector.isPeerAlive());
+    EXPECT_TRUE(detector.isPeerDead());
+}
+
+TEST_F(FailureDetectorTest, TimeInWhichTheProcessWasStoppedDoesNotCountBeforeTheFirstReply) {
+    isReplying = false;
+    runUntil(500ms);
+    now += 60s;
+    wakeUp();
+    EXPECT_FALSE(detector.isPeerDead());
+    runUntil(63100ms);
+    EXPECT_TRUE(detector.isPeerDead());
+}
+
+TEST_F(FailureDetectorTest, ProbesThatCannotLeaveAreNotMissedBeforeTheFirstReply) {
+    sending = Sending::fails;
+    runUntil(100s);
+    EXPECT_FALSE(detector.isPeerDead());
+    sending = Sending::works;
+    isReplying = false;
+    runUntil(104s);
+    EXPECT_TRUE(detector.isPeerDead());
+}
+
+TEST_F(FailureDetectorTest, ALostFirstProbeIsFollowedByFrequentOnes) {
+    isReplying = false;
+    runUntil(1s);
+    EXPECT_EQ(probes, (std::vector<Duration>{0s, 300ms, 450ms, 600ms, 750ms, 900ms}));
 }
 
 TEST_F(FailureDetectorTest, FirstReplyMakesThePeerAlive) {
@@ -204,6 +235,20 @@ TEST_F(FailureDetectorTest, ProbesThatCannotLeaveAreNotMissed) {
     isReplying = false;
     runUntil(110s);
     EXPECT_LE(died, 103s);
+}
+
+TEST_F(FailureDetectorTest, ProbesThatCannotLeaveJustBeforeTheTimeIsUpCostNoWakeUpsOfTheirOwn) {
+    runUntil(2500ms);
+    isReplying = false;
+    runUntil(4999ms);  // a millisecond is left
+    now = start + 4999900us;
+    wakeUp();
+    sending = Sending::fails;
+    detector.probeNotSent();
+    wakeUps = 0;
+    runUntil(6s);
+    EXPECT_LE(wakeUps, 8);  // one for each attempt
+    EXPECT_EQ(died, Duration::max());
 }
 
 TEST_F(FailureDetectorTest, AnotherProbeIsTriedSoonAfterOneThatCouldNotLeave) {

@@ -72,6 +72,18 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{"BroadcastAddress",
                    {"--local-ip", "127.0.0.1", "--remote-ip", "255.255.255.255", "--interface", "lo"},
                    "--remote-ip: not the address of one node: 255.255.255.255"},
+        WrongUsage{"AnyAddressOfThePeer",
+                   {"--local-ip", "127.0.0.1", "--remote-ip", "0.0.0.0", "--interface", "lo"},
+                   "--remote-ip: not the address of one node: 0.0.0.0"},
+        WrongUsage{"OwnMulticastAddress",
+                   {"--local-ip", "239.255.255.255", "--remote-ip", "127.0.0.2", "--interface", "lo"},
+                   "--local-ip: not the address of one node: 239.255.255.255"},
+        WrongUsage{"OwnBroadcastAddress",
+                   {"--local-ip", "255.255.255.255", "--remote-ip", "127.0.0.2", "--interface", "lo"},
+                   "--local-ip: not the address of one node: 255.255.255.255"},
+        WrongUsage{"NoAddress",
+                   {"--local-ip", "", "--remote-ip", "127.0.0.2", "--interface", "lo"},
+                   "--local-ip: not an IPv4 address: "},
         WrongUsage{"InterfaceWithAControlCharacter",
                    {"--local-ip", "127.0.0.1", "--remote-ip", "127.0.0.2", "--interface", "l\x1bo"},
                    "--interface: not the name of a network interface: l?o"},
@@ -87,7 +99,17 @@ INSTANTIATE_TEST_SUITE_P(
                    "--socket: longer than 107 characters"},
         WrongUsage{"NoInterval", plus({"--check-interval", "0"}), "--check-interval: not in the range"},
         WrongUsage{"IntervalThatIsNoNumber", plus({"--check-interval", "nan"}), "--check-interval: not in"},
+        WrongUsage{"DeadAfterThatIsNoNumber", plus({"--dead-after", "-nan"}), "--dead-after: not in"},
+        WrongUsage{"HeartbeatThatIsNoNumber", plus({"--heartbeat-interval", "nan"}),
+                   "--heartbeat-interval: not in"},
+        WrongUsage{"SnapshotsThatAreNoNumber", plus({"--snapshot-interval", "NaN"}),
+                   "--snapshot-interval: not in"},
+        WrongUsage{"LogsThatAreNoNumber", plus({"--log-interval", "nan"}), "--log-interval: not in"},
         WrongUsage{"InfiniteInterval", plus({"--log-interval", "inf"}), "--log-interval: not in the range"},
+        WrongUsage{"InfiniteDeadAfter", plus({"--dead-after", "infinity"}), "--dead-after: not in the range"},
+        WrongUsage{"IntervalBeyondAllNumbers", plus({"--snapshot-interval", "1e400"}),
+                   "--snapshot-interval: not in the range"},
+        WrongUsage{"RotateSizeThatIsNoNumber", plus({"--rotate-size", "nan"}), "--rotate-size: "},
         WrongUsage{"ShortDeadAfter", plus({"--dead-after", "0.1"}), "--dead-after: not in the range"},
         WrongUsage{"IntervalAboveAThirdOfDeadAfter", plus({"--check-interval", "1.1"}),
                    "--check-interval: above a third of --dead-after"},
@@ -175,14 +197,16 @@ TEST_F(OptionsTest, TheConfigurationIsCheckedWithoutAStart) {
     EXPECT_FALSE(test::exists("/tmp/ha"));
 }
 
-TEST_F(OptionsTest, TheBroadcastAddressOfAnInterfaceIsNoPeer) {
+TEST_F(OptionsTest, TheBroadcastAddressOfAnInterfaceIsNoNode) {
     ASSERT_EQ(test::run({"ip", "link", "add", "eth1", "type", "veth", "peer", "name", "eth2"}).exitCode, 0);
     ASSERT_EQ(test::run({"ip", "address", "add", "10.5.0.1/24", "broadcast", "+", "dev", "eth1"}).exitCode,
               0);
-    const auto result =
-        ternhad({"--local-ip", "10.5.0.1", "--remote-ip", "10.5.0.255", "--interface", "eth1"});
-    EXPECT_EQ(result.exitCode, 2);
-    EXPECT_THAT(result.error, HasSubstr("--remote-ip: the broadcast address of a network: 10.5.0.255"));
+    const auto peer = ternhad({"--local-ip", "10.5.0.1", "--remote-ip", "10.5.0.255", "--interface", "eth1"});
+    EXPECT_EQ(peer.exitCode, 2);
+    EXPECT_THAT(peer.error, HasSubstr("--remote-ip: the broadcast address of a network: 10.5.0.255"));
+    const auto own = ternhad({"--local-ip", "10.5.0.255", "--remote-ip", "10.5.0.2", "--interface", "eth1"});
+    EXPECT_EQ(own.exitCode, 2);
+    EXPECT_THAT(own.error, HasSubstr("--local-ip: the broadcast address of a network: 10.5.0.255"));
 }
 
 TEST_F(OptionsTest, HelpAndVersionAreNoErrors) {

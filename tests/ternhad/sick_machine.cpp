@@ -1,8 +1,10 @@
 #include <dlfcn.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstring>
 #include <ctime>
 
 // Preloaded into a daemon: while a file of this name exists, the call fails or does not return.
@@ -30,10 +32,21 @@ extern "C" int clock_gettime(clockid_t clock, timespec* time) noexcept {
     using Function = int (*)(clockid_t, timespec*);
     static const auto next = reinterpret_cast<Function>(dlsym(RTLD_NEXT, "clock_gettime"));
     const int result = next(clock, time);
-    if (clock == CLOCK_REALTIME && exists("/tmp/stepped-clock")) {
+    if ((clock == CLOCK_REALTIME && exists("/tmp/stepped-clock")) ||
+        (clock == CLOCK_MONOTONIC && exists("/tmp/an-hour-later"))) {
         time->tv_sec += 3600;
     }
     return result;
+}
+
+// A frozen file system lets nothing be made, not even what is there already. /run is in memory.
+extern "C" int mkdir(const char* path, mode_t mode) noexcept {
+    while (std::strncmp(path, "/run/", 5) != 0 && exists("/tmp/frozen-disks")) {
+        usleep(10000);
+    }
+    using Function = int (*)(const char*, mode_t);
+    static const auto next = reinterpret_cast<Function>(dlsym(RTLD_NEXT, "mkdir"));
+    return next(path, mode);
 }
 
 extern "C" void sync() noexcept {

@@ -1,14 +1,19 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <pthread.h>
+#include <sched.h>
+#include <sys/ptrace.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
 #include <filesystem>
+#include <sstream>
 #include <thread>
 
 #include "support/descriptor.h"
@@ -70,14 +75,22 @@ class SickMachineTest : public ::testing::Test {
     }
 
     void start(const std::vector<std::string>& more = {}) {
+        startAlone(more);
+        ASSERT_TRUE(test::eventually(20s, [] { return isPeerAlive(); })) << daemon->error();
+    }
+
+    // Without waiting for the peer to be seen.
+    void startAlone(const std::vector<std::string>& more = {}) {
         std::vector<std::string> command = {"/usr/bin/env", std::string("LD_PRELOAD=") + SICK_MACHINE};
         const auto arguments = test::daemonArguments("127.0.0.1", "127.0.0.2", "lo", more);
         command.insert(command.end(), arguments.begin(), arguments.end());
         daemon.emplace(command);
-        ASSERT_TRUE(test::eventually(20s, [] { return isPeerAlive(); })) << daemon->error();
     }
 
     static bool isPeerAlive() { return test::statusAt()["isRemoteAlive"].asBool(); }
+
+    // What the journal shows.
+    bool says(const std::string& text) const { return daemon->error().find(text) != std::string::npos; }
 
     // The daemon's replies to a request from another address of this machine.
     static bool replies(const std::string& request) {
@@ -147,6 +160,15 @@ TEST_F(SickMachineTest, ProbesThatCannotLeaveAreLoggedOnceAndAreNotThePeersDeath
     expectEndInTime();
 }
 
+TEST_F(SickMachineTest, ProbesThatCannotLeaveFromTheStartAreNotThePeersDeath) {
+    test::writeFile("/tmp/no-buffers", "");
+    startAlone({"--dead-after", "0.6"});
+    EXPECT_FALSE(test::eventually(3s, [this] { return says("peer-dead"); }));
+    test::removeTree("/tmp/no-buffers");
+    EXPECT_TRUE(test::eventually(20s, [this] { return says("peer-alive (was unknown)"); }));
+    expectEndInTime();
+}
+
 TEST_F(SickMachineTest, AFifoForTheHostNameHangsNobody) {
     ASSERT_EQ(mkfifo("/tmp/.ha.hostname.original", 0600), 0);
     start();
@@ -207,6 +229,45 @@ TEST_F(SickMachineTest, AnOrderThatTheKernelDoesNotTakeIsAnswered) {
     expectEndInTime();
 }
 
+// Seconds of processor time that a process has used.
+double processorTime(pid_t process) {
+    std::istringstream stat(test::readFile("/proc/" + std::to_string(process) + "/stat"));
+    stat.ignore(4096, ')');
+    std::string field;
+    for (int i = 3; i <= 13; ++i) {
+        stat >> field;
+    }
+    double user = 0;
+    double kernel = 0;
+    stat >> user >> kernel;
+    return (user + kernel) / static_cast<double>(sysconf(_SC_CLK_TCK));
+}
+
+TEST_F(SickMachineTest, AFlushThatEndsAfterItsOrderCostsNoProcessor) {
+    test::removeTree(TRIGGER);
+    test::makeDirectories(TRIGGER);
+    start();
+    test::writeFile("/tmp/hanging-sync", "");
+    orderReboot();
+    ASSERT_TRUE(test::eventually(20s, [] {
+        return test::wholeLog().find("Cannot reboot at the peer's order: Is a directory") !=
+               std::string::npos;
+    }));
+    test::removeTree("/tmp/hanging-sync");
+    const double before = processorTime(daemon->pid());
+    std::this_thread::sleep_for(3s);  // what is measured
+    EXPECT_LT(processorTime(daemon->pid()) - before, 1.5);
+    expectEndInTime();
+}
+
+TEST_F(SickMachineTest, FrozenDisksDoNotHinderARestart) {
+    start();
+    expectEndInTime();
+    test::writeFile("/tmp/frozen-disks", "");
+    start();
+    expectEndInTime();
+}
+
 TEST_F(SickMachineTest, AHangingLogDiskDelaysNeitherTheEndNorARestart) {
     start({"--log-interval", "0.1"});
     hang(LOG);
@@ -248,6 +309,44 @@ TEST_F(SickMachineTest, TheLogKeeperIsStartedAgainWhenItDies) {
     expectEndInTime();
 }
 
+// Holds a process as a hanging disk would: when it is killed, it is not gone until the object is.
+class Undying {
+ public:
+    explicit Undying(pid_t process) : _process(process) {
+        EXPECT_EQ(ptrace(PTRACE_SEIZE, process, nullptr, nullptr), 0);
+    }
+    ~Undying() { waitpid(_process, nullptr, __WALL); }
+
+    Undying(const Undying&) = delete;
+    Undying& operator=(const Undying&) = delete;
+
+ private:
+    pid_t _process;
+};
+
+TEST_F(SickMachineTest, ALogKeeperThatHangsIsReplacedAndLeftBehind) {
+    test::replaceProgram("/bin/xz", ": > /tmp/compressing; exec sleep 600");
+    start({"--log-interval", "3600", "--dead-after", "0.6"});
+    const pid_t keeper = childOf(daemon->pid());
+    ASSERT_GT(keeper, 0);
+    daemon->signal(SIGHUP);
+    ASSERT_TRUE(test::eventually(20s, [] { return test::exists("/tmp/compressing"); }));
+    const Undying undying(keeper);
+    test::restoreProgram("/bin/xz");
+    test::writeFile("/tmp/an-hour-later", "");
+    EXPECT_TRUE(test::eventually(20s, [&] {
+        daemon->signal(SIGHUP);
+        return test::wholeLog().find("The log keeper hangs, another takes its place") != std::string::npos;
+    }));
+    EXPECT_TRUE(test::eventually(20s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
+    EXPECT_EQ(kill(keeper, 0), 0) << "it is not left behind, but gone";
+    EXPECT_TRUE(isPeerAlive());
+    EXPECT_FALSE(says("peer-dead"));
+    test::removeTree("/tmp/an-hour-later");
+    expectEndInTime();
+    EXPECT_EQ(kill(keeper, 0), 0);
+}
+
 TEST_F(SickMachineTest, TheLogKeeperDiesWithTheDaemon) {
     start();
     const pid_t keeper = childOf(daemon->pid());
@@ -263,6 +362,41 @@ TEST_F(SickMachineTest, TheLogKeeperHoldsNoSocket) {
         std::error_code gone;
         EXPECT_THAT(std::filesystem::read_symlink(entry.path(), gone).string(), Not(HasSubstr("socket:")));
     }
+    expectEndInTime();
+}
+
+// The real-time priority of a process's thread; 0 for an ordinary one.
+int priorityOf(pid_t process, const std::string& thread) {
+    for (const auto& task :
+         std::filesystem::directory_iterator("/proc/" + std::to_string(process) + "/task")) {
+        if (test::readFile(task.path() / "comm") == thread + '\n') {
+            sched_param parameters = {};
+            sched_getparam(std::stoi(task.path().filename()), &parameters);
+            return parameters.sched_priority;
+        }
+    }
+    ADD_FAILURE() << "no thread " << thread;
+    return -1;
+}
+
+// Nobody but root may usually have a real-time priority.
+bool isPriorityPermitted(int priority) {
+    bool isPermitted = false;
+    std::thread([&] {
+        sched_param parameters = {};
+        parameters.sched_priority = priority;
+        isPermitted = pthread_setschedparam(pthread_self(), SCHED_RR, &parameters) == 0;
+    }).join();
+    return isPermitted;
+}
+
+TEST_F(SickMachineTest, ProbesComeBeforeRepliesAndRepliesBeforeAllElse) {
+    start();
+    const int highest = sched_get_priority_max(SCHED_RR);
+    const bool isPermitted = isPriorityPermitted(highest);
+    EXPECT_EQ(priorityOf(daemon->pid(), "probes"), isPermitted ? highest : 0);
+    EXPECT_EQ(priorityOf(daemon->pid(), "replies"), isPermitted ? highest - 1 : 0);
+    EXPECT_EQ(priorityOf(daemon->pid(), "clients"), 0);
     expectEndInTime();
 }
 
