@@ -3,8 +3,6 @@
 #include <json/value.h>
 #include <poll.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -23,20 +21,11 @@ constexpr unsigned int CLIENT_TIMEOUT = 0;  // a client's; this end does not use
 constexpr auto SILENCE_LIMIT = std::chrono::seconds(5);
 constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the socket file
 constexpr std::size_t MOST_CLIENTS = 16;
-constexpr int BACKLOG = 100;
-constexpr mode_t SHARED_MODE = 0660;
 constexpr char RESTORING[] = "make the vanished control socket again";
 constexpr char ACCEPTING[] = "accept control clients";
 constexpr char ORDER = 'R';  // the actions
 constexpr char REPORT = 'S';
 constexpr char EVENTS = 'E';
-
-sockaddr_un addressOf(const std::string& path) {
-    sockaddr_un address = {};
-    address.sun_family = AF_UNIX;
-    path.copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
-    return address;
-}
 
 }  // namespace
 
@@ -62,7 +51,7 @@ bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Val
 
 ControlServer::ControlServer(const std::string& path, Access access, Health& health, const Reporter& reporter,
                              EventStreams& streams, Events& events, const Shutdown& shutdown)
-    : _path(path),
+    : _listener(path),
       _access(access),
       _health(health),
       _streams(streams),
@@ -76,69 +65,16 @@ ControlServer::ControlServer(const std::string& path, Access access, Health& hea
 }
 
 ControlServer::~ControlServer() {
-    close();
     for (const Client& client : _clients) {
-        ::close(client.fd);
-    }
-}
-
-void ControlServer::close() {
-    if (_listener >= 0) {
-        ::close(_listener);
-        _listener = -1;
-    }
-}
-
-bool ControlServer::listen() {
-    close();
-    struct stat info = {};
-    if (lstat(_path.c_str(), &info) == 0) {
-        if (!S_ISSOCK(info.st_mode)) {
-            errno = EEXIST;
-            return false;
-        }
-        unlink(_path.c_str());
-    }
-    _listener = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-    const sockaddr_un address = addressOf(_path);
-    if (_listener < 0 || bind(_listener, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
-        ::listen(_listener, BACKLOG) != 0 || lstat(_path.c_str(), &info) != 0) {
-        return false;
-    }
-    if (_group && !share()) {
-        return false;
-    }
-    _device = info.st_dev;
-    _inode = info.st_ino;
-    return true;
-}
-
-bool ControlServer::shareWith(gid_t group) {
-    _group = group;
-    return share();
-}
-
-bool ControlServer::share() const {
-    return chown(_path.c_str(), static_cast<uid_t>(-1), *_group) == 0 &&
-           chmod(_path.c_str(), SHARED_MODE) == 0;
-}
-
-bool ControlServer::hasFile() const {
-    struct stat info = {};
-    return lstat(_path.c_str(), &info) == 0 && info.st_dev == _device && info.st_ino == _inode;
-}
-
-void ControlServer::removeFile() const {
-    if (hasFile()) {
-        unlink(_path.c_str());
+        close(client.fd);
     }
 }
 
 void ControlServer::restoreFile() {
-    if (hasFile()) {
+    if (_listener.hasFile()) {
         return;
     }
-    if (listen()) {
+    if (_listener.listen()) {
         TERNHAD_LOG(_events, "The control socket had vanished, it is there again");
         _isFileLost = false;
     } else if (!_isFileLost) {
@@ -173,7 +109,7 @@ void ControlServer::wait() const {
         end = std::min(end, client.deadline);
     }
     if (_clients.size() < MOST_CLIENTS && !_isFull) {
-        waits.at(count++) = {_listener, POLLIN, 0};
+        waits.at(count++) = {_listener.fd(), POLLIN, 0};
     }
     const timespec rest = timeUntil(end);
     ppoll(waits.data(), count, &rest, nullptr);
@@ -182,7 +118,7 @@ void ControlServer::wait() const {
 void ControlServer::acceptClients() {
     const bool wasFull = std::exchange(_isFull, false);
     while (_clients.size() < MOST_CLIENTS) {
-        const int fd = accept4(_listener, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
+        const int fd = accept4(_listener.fd(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
         if (fd < 0) {
             if (errno != EAGAIN && errno != EINTR && errno != ECONNABORTED) {
                 _isFull = true;  // back off for a round: the lack would recur immediately
@@ -217,7 +153,7 @@ bool ControlServer::serve(const Client& client) {
         }
         _requests.serve(client.fd);
     }
-    ::close(client.fd);
+    close(client.fd);
     return true;
 }
 
@@ -225,7 +161,7 @@ bool ControlServer::serve(const Client& client) {
 void ControlServer::follow(int fd) {
     if (!_streams.add(fd)) {
         refuse(fd, "too many clients follow the events");
-        ::close(fd);
+        close(fd);
     }
 }
 
@@ -239,7 +175,7 @@ void ControlServer::order(int fd) {
     } else {
         refuse(fd, "an earlier order to reboot the peer is still being carried out");
     }
-    ::close(fd);
+    close(fd);
 }
 
 void ControlServer::runOrders() {
@@ -247,7 +183,7 @@ void ControlServer::runOrders() {
     while (_shutdown.sleepUntil(Clock::now() + std::chrono::hours(24), {&_ordered})) {
         if (_ordered.take()) {
             passes.run([this] { carryOutOrder(); });
-            ::close(_orderer.exchange(-1));
+            close(_orderer.exchange(-1));
         }
     }
 }

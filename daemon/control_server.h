@@ -1,10 +1,7 @@
 #pragma once
 
-#include <sys/types.h>
-
 #include <atomic>
 #include <cstddef>
-#include <optional>
 #include <string>
 #include <vector>
 
@@ -13,6 +10,7 @@
 #include "event_streams.h"
 #include "events.h"
 #include "health.h"
+#include "listener.h"
 #include "progress.h"
 #include "report.h"
 
@@ -31,21 +29,14 @@ class ControlServer {
     ControlServer(const ControlServer&) = delete;
     ControlServer& operator=(const ControlServer&) = delete;
 
-    // Makes the socket file, in place of one that a former daemon has left, and listens. False, with errno,
-    // when that fails; EEXIST when something else than a socket has the name.
-    bool listen();
-
-    // Gives the socket file to a group, which may then connect. False with errno.
-    bool shareWith(gid_t group);
+    // The socket. Have it listen before the threads run.
+    Listener& listener() { return _listener; }
 
     // Body of the thread that serves clients. Tells `progress` of each pass, if given.
     void run(Progress* progress);
 
     // Body of the thread that carries out orders.
     void runOrders();
-
-    // Removes the socket file if it is still this server's.
-    void removeFile() const;
 
  private:
     class Endpoint : public TERN::HA::Daemon::MonitordSocket {
@@ -71,20 +62,16 @@ class ControlServer {
         Clock::time_point deadline;
     };
 
-    bool hasFile() const;
     void restoreFile();
-    void close();
     void wait() const;
     void acceptClients();
     bool serve(const Client& client);
-    bool share() const;
     void follow(int fd);
     void order(int fd);
     void carryOutOrder();
 
-    std::string _path;
+    Listener _listener;
     Access _access;
-    std::optional<gid_t> _group;
     Health& _health;
     EventStreams& _streams;
     Events& _events;
@@ -92,9 +79,6 @@ class ControlServer {
     Endpoint _requests;  // one for each thread
     Endpoint _orders;
 
-    int _listener = -1;
-    dev_t _device = 0;  // of the socket file
-    ino_t _inode = 0;
     std::vector<Client> _clients;
     bool _isFull = false;
     bool _isFileLost = false;

@@ -100,7 +100,7 @@ bool Daemon::startThreads() try {
     if (!startPeerThreads()) {
         return false;
     }
-    if (!_controlServer.listen()) {
+    if (!_controlServer.listener().listen()) {
         return complain("bind the control socket " + _options.socket, errno);
     }
     if (!startStatusServer()) {
@@ -129,7 +129,7 @@ bool Daemon::startStatusServer() {
     }
     _statusServer.emplace(_options.statusSocket, ControlServer::Access::reading, _health, _reporter, _streams,
                           _events, _shutdown);
-    if (!_statusServer->listen() || !_statusServer->shareWith(_options.statusGroupId)) {
+    if (!_statusServer->listener().listen() || !_statusServer->listener().shareWith(_options.statusGroupId)) {
         return false;
     }
     _threads.start("readers", [this] { _statusServer->run(nullptr); });
@@ -200,9 +200,9 @@ int Daemon::stop() {
     _events.end();
     const bool isWritten = _eventThread.join(now + EVENTS_LIMIT);
     _logKeeper.finish(now + LOGS_LIMIT);
-    _controlServer.removeFile();
+    _controlServer.listener().removeFile();
     if (_statusServer) {
-        _statusServer->removeFile();
+        _statusServer->listener().removeFile();
     }
     if (!haveEnded || !isWritten) {
         _exit(_shutdown.exitCode());  // without what hangs

@@ -1,0 +1,78 @@
+#include "listener.h"
+
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace ternhad {
+
+namespace {
+
+constexpr int BACKLOG = 100;
+constexpr mode_t SHARED_MODE = 0660;
+
+sockaddr_un addressOf(const std::string& path) {
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    path.copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
+    return address;
+}
+
+}  // namespace
+
+bool Listener::listen() {
+    close();
+    struct stat info = {};
+    if (lstat(_path.c_str(), &info) == 0) {
+        if (!S_ISSOCK(info.st_mode)) {
+            errno = EEXIST;
+            return false;
+        }
+        unlink(_path.c_str());
+    }
+    _fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    const sockaddr_un address = addressOf(_path);
+    if (_fd < 0 || bind(_fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
+        ::listen(_fd, BACKLOG) != 0 || lstat(_path.c_str(), &info) != 0) {
+        return false;
+    }
+    if (_group && !share()) {
+        return false;
+    }
+    _device = info.st_dev;
+    _inode = info.st_ino;
+    return true;
+}
+
+bool Listener::shareWith(gid_t group) {
+    _group = group;
+    return share();
+}
+
+bool Listener::share() const {
+    return chown(_path.c_str(), static_cast<uid_t>(-1), *_group) == 0 &&
+           chmod(_path.c_str(), SHARED_MODE) == 0;
+}
+
+bool Listener::hasFile() const {
+    struct stat info = {};
+    return lstat(_path.c_str(), &info) == 0 && info.st_dev == _device && info.st_ino == _inode;
+}
+
+void Listener::removeFile() const {
+    if (hasFile()) {
+        unlink(_path.c_str());
+    }
+}
+
+void Listener::close() {
+    if (_fd >= 0) {
+        ::close(_fd);
+        _fd = -1;
+    }
+}
+
+}  // namespace ternhad
