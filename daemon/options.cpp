@@ -43,8 +43,14 @@ std::string checkAddress(const std::string& text) {
     return {};
 }
 
-// The interfaces that have `address` as the broadcast address of their network reach more than one node by
-// it.
+in_addr_t valueOf(const sockaddr* address) {
+    sockaddr_in copy = {};
+    std::memcpy(&copy, address, sizeof copy);  // which may not be aligned for it
+    return ntohl(copy.sin_addr.s_addr);
+}
+
+// True for the highest address of a network that this machine is in: the kernel sends what goes there to all.
+// Not by ifa_broadaddr, which is the other end's address where an interface has one.
 bool isBroadcast(const std::string& address) {
     in_addr wanted = {};
     inet_pton(AF_INET, address.c_str(), &wanted);
@@ -54,13 +60,13 @@ bool isBroadcast(const std::string& address) {
     }
     const std::unique_ptr<ifaddrs, decltype(&freeifaddrs)> owner(list, freeifaddrs);
     for (const ifaddrs* entry = list; entry != nullptr; entry = entry->ifa_next) {
-        if ((entry->ifa_flags & IFF_BROADCAST) == 0 || entry->ifa_broadaddr == nullptr ||
-            entry->ifa_broadaddr->sa_family != AF_INET) {
+        if (entry->ifa_addr == nullptr || entry->ifa_addr->sa_family != AF_INET ||
+            entry->ifa_netmask == nullptr) {
             continue;
         }
-        sockaddr_in broadcast = {};
-        std::memcpy(&broadcast, entry->ifa_broadaddr, sizeof broadcast);  // which may not be aligned for it
-        if (broadcast.sin_addr.s_addr == wanted.s_addr) {
+        const in_addr_t hosts = ~valueOf(entry->ifa_netmask);
+        // A network of one or two addresses has none for all of them.
+        if (hosts > 1 && ntohl(wanted.s_addr) == (valueOf(entry->ifa_addr) | hosts)) {
             return true;
         }
     }

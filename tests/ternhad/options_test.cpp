@@ -209,6 +209,15 @@ TEST_F(OptionsTest, TheBroadcastAddressOfAnInterfaceIsNoNode) {
     EXPECT_THAT(own.error, HasSubstr("--local-ip: the broadcast address of a network: 10.5.0.255"));
 }
 
+TEST_F(OptionsTest, TheOtherEndOfAPointToPointLinkIsAPeer) {
+    ASSERT_EQ(test::run({"ip", "link", "add", "eth1", "type", "veth", "peer", "name", "eth2"}).exitCode, 0);
+    ASSERT_EQ(test::run({"ip", "address", "add", "10.5.0.1", "peer", "10.5.0.2", "dev", "eth1"}).exitCode, 0);
+    EXPECT_EQ(ternhad({"--local-ip", "10.5.0.1", "--remote-ip", "10.5.0.2", "--interface", "eth1",
+                       "--check-config"})
+                  .exitCode,
+              0);
+}
+
 TEST_F(OptionsTest, HelpAndVersionAreNoErrors) {
     const auto help = ternhad({"--help"});
     EXPECT_EQ(help.exitCode, 0);
