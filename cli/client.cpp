@@ -18,6 +18,8 @@ namespace ternhactl {
 namespace {
 
 constexpr char REFUSAL[] = "refused: ";  // a reason follows
+constexpr char NOT_TERNHADS[] = "the reply is not ternhad's";
+constexpr std::size_t LONGEST_REPLY = 256 * 1024;
 constexpr char NO_REPLY[] = "the connection was closed without a reply";
 
 [[noreturn]] void failWithError() {
@@ -37,7 +39,7 @@ Json::Value parse(const std::string& text) {
     } catch (const Json::Exception&) {
         // Nested past the parser's limit.
     }
-    throw NoAnswer("the reply is not ternhad's");
+    throw NoAnswer(NOT_TERNHADS);
 }
 
 int connectedSocket(const Settings& settings, const Deadline& deadline) {
@@ -100,6 +102,9 @@ Connection::Input Connection::receive(Clock::time_point deadline) {
                 failWithError();
             }
             _buffer.append(part.data(), static_cast<std::size_t>(count));
+            if (_buffer.size() > LONGEST_REPLY) {
+                throw NoAnswer(NOT_TERNHADS);  // it may never end, nor leave a moment in which the time is up
+            }
             return count > 0 ? Input::Data : Input::End;
         }
         if (ready < 0 && errno != EINTR) {

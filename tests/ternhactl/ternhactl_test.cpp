@@ -1,14 +1,17 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <json/json.h>
+#include <poll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
 #include <csignal>
 #include <mutex>
+#include <ostream>
 #include <sstream>
 #include <thread>
 
@@ -87,6 +90,11 @@ class RawServer {
     }
 
     ~RawServer() { close(_fd); }
+
+    bool isWaitedFor() const {
+        pollfd state = {_fd, POLLIN, 0};
+        return poll(&state, 1, 0) > 0;
+    }
 
     // Takes the next client's request.
     int accept() const {
@@ -244,6 +252,75 @@ TEST_F(TernhactlTest, GivesUpInTimeOnHalfAReply) {
     EXPECT_LT(stopwatch.elapsed(), 1900ms);
     close(connection);
 }
+
+// A daemon that sends each of its clients `part` again and again, and never ends a reply.
+class EndlessServer {
+ public:
+    explicit EndlessServer(std::string part, std::chrono::milliseconds pause)
+        : _thread([this, part = std::move(part), pause] { run(part, pause); }) {}
+
+    ~EndlessServer() {
+        _isStopping = true;
+        _thread.join();
+    }
+
+    EndlessServer(const EndlessServer&) = delete;
+    EndlessServer& operator=(const EndlessServer&) = delete;
+
+ private:
+    void run(const std::string& part, std::chrono::milliseconds pause) const {
+        std::vector<int> clients;
+        while (!_isStopping) {
+            while (_server.isWaitedFor()) {
+                clients.push_back(_server.accept());
+            }
+            for (const int client : clients) {
+                ::send(client, part.data(), part.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
+            }
+            std::this_thread::sleep_for(pause);
+        }
+        for (const int client : clients) {
+            close(client);
+        }
+    }
+
+    RawServer _server;
+    std::atomic<bool> _isStopping{false};
+    std::thread _thread;
+};
+
+struct EndlessReply {
+    const char* name;
+    std::string part;
+    std::chrono::milliseconds pause;
+};
+
+void PrintTo(const EndlessReply& reply, std::ostream* stream) {
+    *stream << reply.name;
+}
+
+class EndlessReplyTest : public TernhactlTest, public ::testing::WithParamInterface<EndlessReply> {};
+
+TEST_P(EndlessReplyTest, DoesNotKeepAnyCommandBeyondItsTimeout) {
+    const EndlessServer server(GetParam().part, GetParam().pause);
+    std::vector<test::Process> commands;
+    for (const std::string command : {"status", "status --json", "disks", "check", "metrics", "rebooting",
+                                      "wait peer-alive", "events", "reboot-peer --yes"}) {
+        commands.emplace_back(std::vector<std::string>{
+            "/bin/bash", "-c", "exec " TERNHACTL_DIR "/ternhactl --timeout 1 " + command});
+    }
+    for (test::Process& command : commands) {
+        const auto status = command.waitFor(10s);
+        ASSERT_TRUE(status.has_value());
+        EXPECT_EQ(WEXITSTATUS(*status), 3);
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Replies, EndlessReplyTest,
+                         ::testing::Values(EndlessReply{"None", "", 20ms},
+                                           EndlessReply{"SlowBytes", " ", 100ms},
+                                           EndlessReply{"Flood", std::string(65536, ' '), 0ms}),
+                         [](const auto& reply) { return reply.param.name; });
 
 TEST_F(TernhactlTest, TellsWhyTheDaemonDoesNotAnswer) {
     const auto reason = [](const std::string& command) {
