@@ -1,0 +1,181 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/ptrace.h>
+#include <sys/resource.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <sstream>
+#include <thread>
+
+#include "ternhad/sick_machine.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::HasSubstr;
+using ::testing::Not;
+
+// The calls of the daemon fail or hang as files tell, see sick_machine.cpp.
+class FailingCallsTest : public test::SickMachineTest {
+ protected:
+    void SetUp() override {
+        SickMachineTest::SetUp();
+        prefix = {"/usr/bin/env", std::string("LD_PRELOAD=") + SICK_MACHINE};
+    }
+};
+
+// Not with sanitizers either, which need descriptors of their own.
+TEST_F(FailingCallsTest, LackOfDescriptorsIsNeitherThePeersDeathNorItsDiskErrors) {
+    start();
+    // Any new descriptor takes the lowest free number.
+    rlim_t free = 0;
+    const std::string descriptors = "/proc/" + std::to_string(daemon->pid()) + "/fd/";
+    while (std::filesystem::is_symlink(descriptors + std::to_string(free))) {
+        ++free;
+    }
+    rlimit usual = {};
+    ASSERT_EQ(prlimit(daemon->pid(), RLIMIT_NOFILE, nullptr, &usual), 0);
+    const rlimit none = {free, usual.rlim_max};
+    ASSERT_EQ(prlimit(daemon->pid(), RLIMIT_NOFILE, &none, nullptr), 0);
+    EXPECT_FALSE(test::eventually(6s, [] {
+        const std::string log = test::wholeLog();
+        return log.find("changed to dead") != std::string::npos;
+    }));
+    ASSERT_EQ(prlimit(daemon->pid(), RLIMIT_NOFILE, &usual, nullptr), 0);
+    EXPECT_TRUE(test::eventually(20s, [] { return isPeerAlive(); }));
+    // Disk errors of the peer would have been recorded.
+    EXPECT_THAT(test::wholeLog("", "ha.daemon.record"), Not(HasSubstr("\"isRemoteDiskErrHandling\":true")));
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
+    expectEndInTime();
+}
+
+TEST_F(FailingCallsTest, ProbesThatCannotLeaveAreLoggedOnceAndAreNotThePeersDeath) {
+    start({"--dead-after", "0.6"});
+    test::writeFile("/tmp/no-buffers", "");
+    EXPECT_TRUE(test::eventually(20s, [] {
+        return test::wholeLog().find("Cannot send liveness probes: No buffer space available\n") !=
+               std::string::npos;
+    }));
+    EXPECT_FALSE(test::eventually(3s, [] { return !isPeerAlive(); }));
+    test::removeTree("/tmp/no-buffers");
+    EXPECT_TRUE(test::eventually(
+        20s, [] { return test::wholeLog().find("Can again send liveness probes\n") != std::string::npos; }));
+    const std::string log = test::wholeLog();
+    EXPECT_EQ(log.find("Cannot send"), log.rfind("Cannot send"));
+    EXPECT_THAT(log, Not(HasSubstr("changed to dead")));
+    peer.reset();
+    EXPECT_TRUE(test::eventually(20s, [] { return !isPeerAlive(); }));
+    expectEndInTime();
+}
+
+TEST_F(FailingCallsTest, ProbesThatCannotLeaveFromTheStartAreNotThePeersDeath) {
+    test::writeFile("/tmp/no-buffers", "");
+    startAlone({"--dead-after", "0.6"});
+    EXPECT_FALSE(test::eventually(3s, [this] { return says("peer-dead"); }));
+    test::removeTree("/tmp/no-buffers");
+    EXPECT_TRUE(test::eventually(20s, [this] { return says("peer-alive (was unknown)"); }));
+    expectEndInTime();
+}
+
+TEST_F(FailingCallsTest, AHangingSyncHindersNoReboot) {
+    start();
+    test::writeFile("/tmp/hanging-sync", "");
+    orderReboot();
+    EXPECT_TRUE(test::eventually(20s, isRebooted));
+}
+
+// Seconds of processor time that a process has used.
+double processorTime(pid_t process) {
+    std::istringstream stat(test::readFile("/proc/" + std::to_string(process) + "/stat"));
+    stat.ignore(4096, ')');
+    std::string field;
+    for (int i = 3; i <= 13; ++i) {
+        stat >> field;
+    }
+    double user = 0;
+    double kernel = 0;
+    stat >> user >> kernel;
+    return (user + kernel) / static_cast<double>(sysconf(_SC_CLK_TCK));
+}
+
+TEST_F(FailingCallsTest, AFlushThatEndsAfterItsOrderCostsNoProcessor) {
+    test::removeTree(test::TRIGGER);
+    test::makeDirectories(test::TRIGGER);
+    start();
+    test::writeFile("/tmp/hanging-sync", "");
+    orderReboot();
+    ASSERT_TRUE(test::eventually(20s, [] {
+        return test::wholeLog().find("Cannot reboot at the peer's order: Is a directory") !=
+               std::string::npos;
+    }));
+    test::removeTree("/tmp/hanging-sync");
+    const double before = processorTime(daemon->pid());
+    std::this_thread::sleep_for(3s);  // what is measured
+    EXPECT_LT(processorTime(daemon->pid()) - before, 1.5);
+    expectEndInTime();
+}
+
+TEST_F(FailingCallsTest, FrozenDisksDoNotHinderARestart) {
+    start();
+    expectEndInTime();
+    test::writeFile("/tmp/frozen-disks", "");
+    start();
+    expectEndInTime();
+}
+
+TEST_F(FailingCallsTest, StepsOfTheWallClockChangeNothing) {
+    start({"--dead-after", "0.6"});
+    for (int i = 0; i < 5; ++i) {
+        test::writeFile("/tmp/stepped-clock", "");
+        EXPECT_FALSE(test::eventually(500ms, [] { return !isPeerAlive(); }));
+        test::removeTree("/tmp/stepped-clock");
+        EXPECT_FALSE(test::eventually(500ms, [] { return !isPeerAlive(); }));
+    }
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
+    peer.reset();
+    test::writeFile("/tmp/stepped-clock", "");
+    EXPECT_TRUE(test::eventually(5s, [] { return !isPeerAlive(); }));
+    expectEndInTime();
+}
+
+// Holds a process as a hanging disk would: when it is killed, it is not gone until the object is.
+class Undying {
+ public:
+    explicit Undying(pid_t process) : _process(process) {
+        EXPECT_EQ(ptrace(PTRACE_SEIZE, process, nullptr, nullptr), 0);
+    }
+    ~Undying() { waitpid(_process, nullptr, __WALL); }
+
+    Undying(const Undying&) = delete;
+    Undying& operator=(const Undying&) = delete;
+
+ private:
+    pid_t _process;
+};
+
+TEST_F(FailingCallsTest, ALogKeeperThatHangsIsReplacedAndLeftBehind) {
+    test::replaceProgram("/bin/xz", ": > /tmp/compressing; exec sleep 600");
+    start({"--log-interval", "3600", "--dead-after", "0.6"});
+    const pid_t keeper = test::childOf(daemon->pid());
+    ASSERT_GT(keeper, 0);
+    daemon->signal(SIGHUP);
+    ASSERT_TRUE(test::eventually(20s, [] { return test::exists("/tmp/compressing"); }));
+    const Undying undying(keeper);
+    test::restoreProgram("/bin/xz");
+    test::writeFile("/tmp/an-hour-later", "");
+    EXPECT_TRUE(test::eventually(20s, [&] {
+        daemon->signal(SIGHUP);
+        return test::wholeLog().find("The log keeper hangs, another takes its place") != std::string::npos;
+    }));
+    EXPECT_TRUE(test::eventually(20s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
+    EXPECT_EQ(kill(keeper, 0), 0) << "it is not left behind, but gone";
+    EXPECT_TRUE(isPeerAlive());
+    EXPECT_FALSE(says("peer-dead"));
+    test::removeTree("/tmp/an-hour-later");
+    expectEndInTime();
+    EXPECT_EQ(kill(keeper, 0), 0);
+}
+
+}  // namespace

@@ -1,0 +1,69 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <filesystem>
+
+#include "ternhad/sick_machine.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::HasSubstr;
+using ::testing::Not;
+using LogKeeperTest = test::SickMachineTest;
+
+TEST_F(LogKeeperTest, AHangingLogDiskDelaysNeitherTheEndNorARestart) {
+    start({"--log-interval", "0.1"});
+    test::hang(test::LOG_FILE);
+    EXPECT_FALSE(test::eventually(1s, [] { return !isPeerAlive(); }));
+    expectEndInTime();
+    start();
+    EXPECT_TRUE(replies("is_alive"));
+    expectEndInTime();
+}
+
+TEST_F(LogKeeperTest, ACompressionThatHangsDoesNotDelayTheEndAndLosesNoLine) {
+    test::replaceProgram("/bin/xz", ": > /tmp/compressing; exec sleep 60");
+    start();
+    daemon->signal(SIGHUP);
+    ASSERT_TRUE(test::eventually(20s, [] { return test::exists("/tmp/compressing"); }));
+    expectEndInTime();
+    EXPECT_THAT(test::readFile(test::LOG_FILE), HasSubstr("Stopping"));
+    EXPECT_NE(test::run({"pgrep", "sleep"}).exitCode, 0);
+}
+
+TEST_F(LogKeeperTest, TheLogKeeperIsStartedAgainWhenItDies) {
+    start({"--log-interval", "3600"});
+    const pid_t keeper = test::childOf(daemon->pid());
+    ASSERT_GT(keeper, 0);
+    kill(keeper, SIGKILL);
+    ASSERT_TRUE(test::eventually(20s, [&] {
+        const pid_t next = test::childOf(daemon->pid());
+        return next > 0 && next != keeper;
+    }));
+    daemon->signal(SIGHUP);
+    EXPECT_TRUE(test::eventually(20s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
+    EXPECT_THAT(test::wholeLog() + test::run({"xz", "-dc", "/var/log/ha/ha.daemon.log.0.xz"}).output,
+                HasSubstr("The log keeper has died, another is started"));
+    expectEndInTime();
+}
+
+TEST_F(LogKeeperTest, TheLogKeeperDiesWithTheDaemon) {
+    start();
+    const pid_t keeper = test::childOf(daemon->pid());
+    ASSERT_GT(keeper, 0);
+    daemon->signal(SIGKILL);
+    EXPECT_TRUE(test::eventually(10s, [&] { return kill(keeper, 0) != 0; }));
+}
+
+TEST_F(LogKeeperTest, TheLogKeeperHoldsNoSocket) {
+    start();
+    const pid_t keeper = test::childOf(daemon->pid());
+    for (const auto& entry : std::filesystem::directory_iterator("/proc/" + std::to_string(keeper) + "/fd")) {
+        std::error_code gone;
+        EXPECT_THAT(std::filesystem::read_symlink(entry.path(), gone).string(), Not(HasSubstr("socket:")));
+    }
+    expectEndInTime();
+}
+
+}  // namespace
