@@ -36,17 +36,27 @@ class Watchers:
                 for watcher in watchers.values():
                     watcher.start()
 
-    def wait_until_alive(self):
-        if not eventually(LIMIT, lambda: all(watcher.sees_peer() for watcher in self.on_a.values()), 0.1):
-            missing = [name for name, watcher in self.on_a.items() if not watcher.sees_peer()]
-            raise RuntimeError(f"no peer is seen by {missing}")
+    def wait_until_alive(self, limit=LIMIT):
+        """Returns the programs on node a that see their peer, among which is ternhad."""
+        eventually(limit, lambda: all(watcher.sees_peer() for watcher in self.on_a.values()), 0.1)
+        seeing = [name for name, watcher in self.on_a.items() if watcher.sees_peer()]
+        if "ternhad" not in seeing:
+            raise RuntimeError("ternhad does not see its peer")
+        return seeing
 
-    def detect(self, since, limit=LIMIT):
-        """Seconds from `since` until each program on node a has seen its peer's failure; None: never."""
-        times = dict.fromkeys(self.on_a)
+    def revive(self):
+        """Starts all programs again when one of them does not see its peer any more."""
+        if len(self.wait_until_alive()) < len(self.on_a):
+            self.end()
+            self.start()
+            self.wait_until_alive()
+
+    def detect(self, names, since, limit=LIMIT):
+        """Seconds from `since` until each of the programs on node a has seen its peer's failure; None: never."""
+        times = dict.fromkeys(names)
         while None in times.values() and time.monotonic() - since < limit:
-            for name, watcher in self.on_a.items():
-                if times[name] is None and watcher.sees_peer() is False:
+            for name in times:
+                if times[name] is None and self.on_a[name].sees_peer() is False:
                     times[name] = time.monotonic() - since
             time.sleep(0.003)
         return times
@@ -88,25 +98,32 @@ def vanished(watchers):
 FAILURES = {"cut link": cut, "killed": killed, "stopped": stopped, "vanished": vanished}
 
 
+def table_row(name, cells):
+    return f"| {name} | {' | '.join(cells)} |"
+
+
+def table_head(name, columns):
+    return "\n" + table_row(name, columns) + "\n|---|" + "---:|" * len(columns)
+
+
 def measure(cluster, times, settings, rivals):
-    """Prints the table."""
-    print(f"seconds until detected, {times} times each: minimum, median, maximum\n")
+    """Prints the table, each row when it is known."""
+    print(f"Seconds until detected, {times} times each: minimum, median, maximum", flush=True)
     for setting in settings:
         watchers = Watchers(cluster, setting, rivals)
         watchers.start()
-        print(f"{setting + ':':12}" + "".join(f"{name:>24}" for name in watchers.on_a))
+        print(table_head(setting, watchers.on_a), flush=True)
         for name, failure in FAILURES.items():
             results = {program: [] for program in watchers.on_a}
             for _ in range(times):
-                watchers.wait_until_alive()
+                watchers.revive()
                 time.sleep(random.uniform(2, 4))  # at any phase of the probes
                 steps = failure(watchers)
                 begin = time.monotonic()
                 next(steps)
-                for program, seconds in watchers.detect(begin).items():
+                for program, seconds in watchers.detect(watchers.on_a, begin).items():
                     results[program].append(LIMIT if seconds is None else seconds)
                 next(steps, None)
-            row = [f"{min(r):.2f} {statistics.median(r):.2f} {max(r):.2f}" for r in results.values()]
-            print(f"{name:12}" + "".join(f"{cell:>24}" for cell in row), flush=True)
+            cells = [f"{min(r):.2f} {statistics.median(r):.2f} {max(r):.2f}" for r in results.values()]
+            print(table_row(name, cells), flush=True)
         watchers.end()
-        print()

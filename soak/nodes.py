@@ -1,11 +1,10 @@
 """Two nodes of one machine, and a third host: namespaces of their own, joined by a bridge."""
 
 import ctypes
-import json
 import os
+import re
 import shutil
 import signal
-import socket
 import subprocess
 import time
 from pathlib import Path
@@ -41,9 +40,10 @@ class Node:
         self.name = name
         self.address = ADDRESSES.get(name)
         self.processes = {}
+        self.prefix = []  # of what is started, such as "env"
         setup = "echo ready; exec sleep infinity"
         if build:
-            files = [build / "daemon/ternhad", *(build / "src").glob("libternhadaemon.so.?"),
+            files = [build / "daemon/ternhad", build / "stepped_clock.so", *(build / "src").glob("libternhadaemon.so.?"),
                      *(build / "platform").glob("libterncore.so.?")]
             setup = f"""mount -t tmpfs -o size=64m none {PROGRAMS}
                 cp -L {' '.join(map(str, files))} {PROGRAMS}
@@ -70,7 +70,7 @@ class Node:
 
     def start(self, name, *argv, **options):
         """A process of the node, to be known as `name`."""
-        process = subprocess.Popen(self.command(*argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
+        process = subprocess.Popen(self.command(*self.prefix, *argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
                                    preexec_fn=die_with_parent, start_new_session=True, **options)
         self.processes[name] = process
         return process
@@ -128,47 +128,37 @@ class Cluster:
 
 
 class Daemon:
-    """A node's ternhad, with `options`."""
+    """A node's ternhad, with `options`. Its journal tells of changes, whatever becomes of descriptors and disks."""
 
     def __init__(self, node, peer, options):
         self.node, self.peer, self.options = node, peer, options
+        self.journal = ""
 
     def start(self):
-        self.node.start("ternhad", "env", f"LD_LIBRARY_PATH={PROGRAMS}", f"{PROGRAMS}/ternhad", "--local-ip",
-                        self.node.address, "--remote-ip", ADDRESSES[self.peer], "--interface", "eth1",
-                        *self.options)
+        self._read()
+        self.journal += "ternhad: started\n"
+        process = self.node.start("ternhad", "env", f"LD_LIBRARY_PATH={PROGRAMS}", f"{PROGRAMS}/ternhad",
+                                  "--local-ip", self.node.address, "--remote-ip", ADDRESSES[self.peer],
+                                  "--interface", "eth1", *self.options)
+        os.set_blocking(process.stderr.fileno(), False)
+
+    def _read(self):
+        if "ternhad" in self.node.processes:
+            self.journal += (self.node.processes["ternhad"].stderr.read() or b"").decode()
 
     def sees_peer(self):
-        """True, False, or None when that cannot be learnt: from its socket, or from its log."""
-        answer = self._answer()
-        return self._logged() if answer is None else answer
-
-    def _logged(self):
-        log = self.node.path("/tmp/ha/ha.daemon.log")
-        text = log.read_text(errors="replace") if log.exists() else ""
-        alive, dead = text.rfind("changed to alive"), text.rfind("changed to dead")
-        return None if alive == dead else alive > dead
-
-    def _answer(self):
-        with socket.socket(socket.AF_UNIX, socket.SOCK_STREAM) as client:
-            client.settimeout(0.1)
-            try:
-                client.connect(str(self.node.path("/run/ternha/control.sock")))
-                client.send(b'{"act":"I"}')
-                return json.loads(client.recv(4096))["isRemoteAlive"]
-            except (OSError, ValueError):
-                return None
+        """True, False, or None when that is unknown."""
+        self._read()
+        states = re.findall(r"^ternhad: (started|peer-alive|peer-dead)\b", self.journal, re.MULTILINE)
+        return {"peer-alive": True, "peer-dead": False}.get(states[-1]) if states else None
 
     def deaths(self):
         """How often it has declared its peer dead."""
-        text = ""
-        for directory in ("/var/log/ha", "/tmp/ha"):
-            log = self.node.path(f"{directory}/ha.daemon.log")
-            if log.exists():
-                text += log.read_text(errors="replace")
-        return text.count("changed to dead")
+        self._read()
+        return self.journal.count("ternhad: peer-dead")
 
     def end(self):
+        self._read()
         if "ternhad" in self.node.processes:
             self.node.kill(["ternhad"])
         for directory in ("/var/log/ha", "/tmp/ha"):

@@ -7,11 +7,11 @@ import signal
 import subprocess
 import sys
 import time
-from contextlib import closing
+from contextlib import closing, suppress
 from pathlib import Path
 
-from detection import Watchers, measure, vanished
-from nodes import Cluster, eventually, require_root
+from detection import Watchers, measure, table_head, table_row, vanished
+from nodes import PROGRAMS, Cluster, eventually, require_root
 
 BUSY = "while :; do :; done"
 FLOOD = """import socket, sys
@@ -82,48 +82,72 @@ def real_time(watchers):
     yield
 
 
+def hog_in(watchers, group, script):
+    """Runs `script` in a control group with node a's programs."""
+    node = watchers.cluster.a
+    try:
+        for name in watchers.on_a:
+            group.add(node.pid(name))
+        hog = node.start("hog", "python3", "-c", script, stdin=subprocess.PIPE)
+        Path(f"/proc/{hog.pid}/oom_score_adj").write_text("1000")
+        group.add(hog.pid)
+        hog.stdin.write(b"\n")
+        hog.stdin.flush()
+        yield
+    finally:
+        node.kill([name for name in ("hog",) if name in node.processes])
+        group.end()
+
+
 def fork_storm(watchers):
     """fork storm at a limit of processes"""
-    node = watchers.cluster.a
-    group = Control("pids", [(["pids.max"], 80)])
-    for name in watchers.on_a:
-        group.add(node.pid(name))
-    node.start("hog", "python3", "-c", FORKS, stdin=subprocess.PIPE)
-    group.add(node.pid("hog"))
-    node.processes["hog"].stdin.write(b"\n")
-    node.processes["hog"].stdin.flush()
-    yield
-    node.kill(["hog"])
-    group.end()
+    return hog_in(watchers, Control("pids", [(["pids.max"], 80)]), FORKS)
 
 
 def descriptors(watchers):
     """descriptors used up"""
     pids = [watchers.cluster.a.pid(name) for name in watchers.on_a]
     before = [resource.prlimit(pid, resource.RLIMIT_NOFILE) for pid in pids]
-    for pid, (_, hard) in zip(pids, before):
-        used = {int(fd.name) for fd in Path(f"/proc/{pid}/fd").iterdir()}
-        free = next(number for number in range(len(used) + 1) if number not in used)
-        resource.prlimit(pid, resource.RLIMIT_NOFILE, (free, hard))
-    yield
-    for pid, limits in zip(pids, before):
-        resource.prlimit(pid, resource.RLIMIT_NOFILE, limits)
+    try:
+        for pid, (_, hard) in zip(pids, before):
+            used = {int(fd.name) for fd in Path(f"/proc/{pid}/fd").iterdir()}
+            free = next(number for number in range(len(used) + 1) if number not in used)
+            resource.prlimit(pid, resource.RLIMIT_NOFILE, (free, hard))
+        yield
+    finally:
+        for pid, limits in zip(pids, before):
+            with suppress(ProcessLookupError):  # it did not bear that
+                resource.prlimit(pid, resource.RLIMIT_NOFILE, limits)
 
 
 def memory(watchers):
     """memory cgroup thrashed"""
+    limit = (["memory.limit_in_bytes", "memory.max"], 80 << 20)
+    return hog_in(watchers, Control("memory", [limit]), THRASH)
+
+
+def clock_steps(watchers):
+    """wall clock of node a's programs an hour forward and back, each second"""
     node = watchers.cluster.a
-    group = Control("memory", [(["memory.limit_in_bytes", "memory.max"], 80 << 20)])
-    for name in watchers.on_a:
-        group.add(node.pid(name))
-    node.start("hog", "python3", "-c", THRASH, stdin=subprocess.PIPE)
-    Path(f"/proc/{node.pid('hog')}/oom_score_adj").write_text("1000")
-    group.add(node.pid("hog"))
-    node.processes["hog"].stdin.write(b"\n")
-    node.processes["hog"].stdin.flush()
-    yield
-    node.kill(["hog"])
-    group.end()
+    node.prefix = ["env", f"LD_PRELOAD={PROGRAMS}/stepped_clock.so"]
+    restart(watchers)
+    node.prefix = []
+    watchers.wait_until_alive()
+    step = "while :; do touch /run/stepped-clock; sleep 1; rm /run/stepped-clock; sleep 1; done"
+    node.start("steps", "sh", "-c", step)
+    try:
+        yield
+    finally:
+        node.kill(["steps"])
+        node.path("/run/stepped-clock").unlink(missing_ok=True)
+        restart(watchers)
+
+
+def restart(watchers):
+    """Restarts node a's programs."""
+    for watcher in watchers.on_a.values():
+        watcher.end()
+    watchers.start("a")
 
 
 def on_a_disk_of_its_own(watchers, directory, sicken, heal):
@@ -145,11 +169,11 @@ def on_a_disk_of_its_own(watchers, directory, sicken, heal):
         yield
     finally:
         node.run(*heal)  # a frozen disk would outlive its namespace, with all that waits for it
-    for watcher in watchers.on_a.values():
-        watcher.end()
-    eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
-                                          stderr=subprocess.DEVNULL).returncode == 0, 0.2)
-    watchers.start("a")
+        for watcher in watchers.on_a.values():
+            watcher.end()
+        eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
+                                              stderr=subprocess.DEVNULL).returncode == 0, 0.2)
+        watchers.start("a")
 
 
 def frozen(directory):
@@ -170,10 +194,12 @@ def full(directory):
 
 def flood(sender):
     def condition(watchers):
-        getattr(watchers.cluster, sender).start("flood", "python3", "-c", FLOOD, watchers.cluster.a.address)
-        yield
-        if "flood" in getattr(watchers.cluster, sender).processes:
-            getattr(watchers.cluster, sender).kill(["flood"])
+        node = getattr(watchers.cluster, sender)
+        node.start("flood", "python3", "-c", FLOOD, watchers.cluster.a.address)
+        try:
+            yield
+        finally:
+            node.kill([name for name in ("flood",) if name in node.processes])  # it may have gone with its node
 
     return condition
 
@@ -205,44 +231,56 @@ CONDITIONS = {
     "stopped for 2 s": stop_for(2),
     "stopped for 5 s": stop_for(5),
     "stopped for 60 s": stop_for(60),
+    "clock steps": clock_steps,
 }
 SHORT = ["200 busy processes", "no descriptors", "/tmp/ha frozen", "flood from another", "stopped for 2 s"]
 
 
+RESTARTED = ("frozen", "full", "clock")  # conditions that restart node a's programs
+
+
 def press(watchers, condition, seconds):
-    """Returns each program's false positives on both nodes, and the seconds until node b's end was seen."""
-    watchers.wait_until_alive()
+    """Returns a cell for each program: its false positives on both nodes, and the seconds until it saw node b's end.
+    And whether ternhad was right."""
+    watchers.revive()
     # Node b is right when it declares a stopped node a dead.
     observers = [watchers.on_a] if condition.startswith("stopped") else [watchers.on_a, watchers.on_b]
     deaths = lambda: {name: sum(observer[name].deaths() for observer in observers) for name in watchers.on_a}
     with closing(CONDITIONS[condition](watchers)) as steps:
-        return measure_under(watchers, condition, seconds, steps, deaths)
-
-
-def measure_under(watchers, condition, seconds, steps, deaths):
-    before = deaths()
-    next(steps)
-    if "frozen" in condition or "full" in condition:
-        before = deaths()  # the programs were started again
-    time.sleep(seconds)
-    false_positives = {name: count - before[name] for name, count in deaths().items()}
-    watchers.wait_until_alive() if not any(false_positives.values()) else time.sleep(5)
-    failure = vanished(watchers)
-    begin = time.monotonic()
-    next(failure)
-    delays = watchers.detect(begin, limit=20)
-    next(steps, None)
-    next(failure, None)
+        before = deaths()
+        next(steps)
+        if any(word in condition for word in RESTARTED):
+            before = deaths()
+        time.sleep(seconds)
+        wrong = {name: count - before[name] for name, count in deaths().items()}
+        seeing = watchers.wait_until_alive(20)
+        failure = vanished(watchers)
+        begin = time.monotonic()
+        next(failure)
+        delays = watchers.detect(seeing, begin, limit=20)
     for node in (watchers.cluster.a, watchers.cluster.c):
         node.kill([name for name in node.processes if name not in watchers.on_a])
-    return false_positives, delays
+    next(failure, None)
+    if None in delays.values():  # what has seen nothing may be broken for good
+        watchers.end()
+        watchers.start()
+    cells = [f"{count}, {cell(name, delays)}" for name, count in wrong.items()]
+    return cells, wrong["ternhad"] == 0 and delays["ternhad"] is not None
+
+
+def cell(name, delays):
+    if name not in delays:
+        return "blind"  # did not see its peer before either
+    return "never" if delays[name] is None else format(delays[name], ".2f")
 
 
 def main():
     parser = argparse.ArgumentParser(prog="script/pressure", description=__doc__)
     parser.add_argument("--build", type=Path, required=True, help=argparse.SUPPRESS)
     parser.add_argument("--short", action="store_true", help="a minute: ternhad alone, fails on a false positive")
-    parser.add_argument("--seconds", type=float, default=300, help="that each pressure lasts (300)")
+    duration = parser.add_mutually_exclusive_group()
+    duration.add_argument("--seconds", type=float, default=300, help="that each pressure lasts (300)")
+    duration.add_argument("--minutes", type=float, help="the same")
     parser.add_argument("--condition", action="append", choices=CONDITIONS, help="instead of all")
     parser.add_argument("--setting", action="append", choices=["default", "fast"], help="instead of both")
     parser.add_argument("--detection", type=int, metavar="TIMES", help="measure detection without pressure instead")
@@ -257,20 +295,26 @@ def main():
     try:
         if options.detection:
             return measure(cluster, options.detection, settings, rivals)
-        wrong = 0
-        print("false positives, and seconds until a true failure is seen")
+        seconds = 5 if options.short else options.minutes * 60 if options.minutes else options.seconds
+        print(f"False positives in {seconds:g} s, and seconds until a true failure is seen", flush=True)
+        is_right = True
         for setting in settings:
             watchers = Watchers(cluster, setting, rivals)
             watchers.start()
-            print(f"\n{setting + ':':22}" + "".join(f"{name:>16}" for name in watchers.on_a))
+            print(table_head(setting, watchers.on_a), flush=True)
             for condition in options.condition or (SHORT if options.short else CONDITIONS):
-                seconds = 5 if options.short else options.seconds
-                counts, delays = press(watchers, condition, seconds)
-                cells = [f"{counts[n]:>4} {'never' if delays[n] is None else format(delays[n], '.2f'):>6}" for n in counts]
-                print(f"{condition:22}" + "".join(f"{cell:>16}" for cell in cells), flush=True)
-                wrong += counts["ternhad"] + (delays["ternhad"] is None)
+                try:
+                    cells, was_right = press(watchers, condition, seconds)
+                except (RuntimeError, OSError, subprocess.CalledProcessError) as error:
+                    cells, was_right = [f"not measured: {error}"] + ["-"] * (len(watchers.on_a) - 1), False
+                    for node in (cluster.a, cluster.b, cluster.c):
+                        node.kill()
+                    watchers.end()
+                    watchers.start()
+                print(table_row(condition, cells), flush=True)
+                is_right = is_right and was_right
             watchers.end()
-        return 1 if wrong else 0
+        return 0 if is_right else 1
     finally:
         cluster.end()
 
