@@ -1,7 +1,9 @@
 #include "peer_watcher.h"
 
-#include <json/value.h>
+#include <json/json.h>
 
+#include <memory>
+#include <optional>
 #include <string>
 
 #include "checker.h"
@@ -15,30 +17,26 @@ using TERN::HA::Daemon::IsRemoteMDResync;
 
 namespace {
 
-// A request that took as long as this got no reply, whatever its result. The library waits for 3 seconds.
-constexpr auto REPLY_LIMIT = std::chrono::milliseconds(2900);
-
-// Whether the last request of this thread had a socket to go out by. A check has no data members.
-thread_local bool isSent = false;
-
-// The library's check of the same type. It asks for the type once it has a socket: without one, the check's
-// result is this node's trouble and tells nothing about the peer.
+// The text of the peer's reply to a check; nothing without one. The check's own result does not tell: one
+// that found no socket, or that a stop of this process interrupted, looks like one with a poor reply.
 template <typename Check>
-class Observed : public Check {
- public:
-    std::string getType() override {
-        isSent = true;
-        return Check::getType();
-    }
-};
+std::optional<std::string> replyTo() {
+    class Request : public Check {
+     public:
+        std::optional<std::string> send() {
+            std::string reply;
+            return this->_sendToRemote(reply) ? std::optional(reply) : std::nullopt;
+        }
+    };
+    return Request().send();
+}
 
-// Runs `request`. True when it got a reply.
-template <typename Request>
-bool exchange(const Request& request) {
-    isSent = false;
-    const auto start = Clock::now();
-    request();
-    return isSent && Clock::now() - start < REPLY_LIMIT;
+bool isJson(const std::string& text) try {
+    const std::unique_ptr<Json::CharReader> reader(Json::CharReaderBuilder().newCharReader());
+    Json::Value value;
+    return reader->parse(text.data(), text.data() + text.size(), &value, nullptr);
+} catch (const Json::Exception&) {
+    return false;  // nested past the parser's limit
 }
 
 }  // namespace
@@ -65,28 +63,33 @@ void PeerWatcher::run() {
 void PeerWatcher::requestDisks() {
     const Json::Value unread("unread");
     Json::Value disks = unread;
-    bool isHandling = false;
-    const bool hasReply = exchange([&] { isHandling = Observed<IsRemoteDiskErrHandling>()(disks); });
-    if (_shutdown.isRequested() || !hasReply) {
+    const bool isHandling = IsRemoteDiskErrHandling()(disks);
+    const bool isRead = disks != unread;
+    if (_shutdown.isRequested() || (!isRead && !isReportCut())) {
         return;
     }
-    const bool isRead = disks != unread;
-    // A report that cannot be read was cut, because it has more disks than a datagram holds: there are
-    // errors, on disks that are not known. Those of the report before may have recovered.
+    // There are errors, on disks that are not known. Those of the report before may have recovered.
     _health.status().setErrHandlingDiskRemote(isRead ? disks : Json::Value(Json::arrayValue));
     _health.findings().setPeerDisksKnown(isRead);
     _health.set(Flag::peerDiskErrors, isHandling || !isRead);
 }
 
+// A report that cannot be read was cut, because it has more disks than a datagram holds.
+bool PeerWatcher::isReportCut() const {
+    if (!_health.isPeerAlive()) {
+        return false;
+    }
+    const auto report = replyTo<IsRemoteDiskErrHandling>();
+    return report && !isJson(*report);
+}
+
 void PeerWatcher::requestResync() {
-    bool isResync = false;
-    const bool hasReply = exchange([&] { isResync = Observed<IsRemoteMDResync>()(); });
-    if (_shutdown.isRequested() || !hasReply) {
+    const bool isResync = IsRemoteMDResync()();
+    const bool isNews = _health.transitions().state(Flag::peerResync).value != isResync;
+    if (_shutdown.isRequested() || (!isResync && isNews && replyTo<IsRemoteMDResync>() != "not_resync")) {
         return;
     }
-    // A reply that says nothing and "no resync" look alike: the end is believed when it is reported twice.
-    _health.set(Flag::peerResync, isResync || _wasResync);
-    _wasResync = isResync;
+    _health.set(Flag::peerResync, isResync);
 }
 
 void PeerWatcher::requestHostname() {

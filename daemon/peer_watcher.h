@@ -18,6 +18,7 @@ class PeerWatcher {
 
  private:
     void requestDisks();
+    bool isReportCut() const;
     void requestResync();
     void requestHostname();
 
@@ -25,7 +26,6 @@ class PeerWatcher {
     Health& _health;
     Events& _events;
     const Shutdown& _shutdown;
-    bool _wasResync = false;
     bool _isHostnameKnown = false;
 };
 

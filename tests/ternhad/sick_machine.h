@@ -33,6 +33,9 @@ class Peer {
         _thread.join();
     }
 
+    // From now on it replies to liveness probes only.
+    void beReticent() { _isReticent = true; }
+
     Peer(const Peer&) = delete;
     Peer& operator=(const Peer&) = delete;
 
@@ -40,7 +43,8 @@ class Peer {
     void run() {
         UdpSocket socket("127.0.0.2", 7499);
         while (!_isOver) {
-            if (const auto request = socket.receive(10ms)) {
+            const auto request = socket.receive(10ms);
+            if (request && (!_isReticent || request->bytes == "is_alive")) {
                 const std::string reply = request->bytes == "is_alive" ? "alive"
                                           : request->bytes == "is_disk_err_handling"
                                               ? R"({"errHandlingDisk":[],"isDiskErrHandling":false})"
@@ -51,6 +55,7 @@ class Peer {
     }
 
     std::atomic<bool> _isOver{false};
+    std::atomic<bool> _isReticent{false};
     std::thread _thread;
 };
 

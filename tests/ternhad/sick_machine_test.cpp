@@ -108,6 +108,20 @@ TEST_F(SickMachineTest, ProbesComeBeforeRepliesAndRepliesBeforeAllElse) {
     expectEndInTime();
 }
 
+TEST_F(SickMachineTest, ARequestThatAStopInterruptsTellsNothingOfThePeer) {
+    start();
+    ASSERT_TRUE(test::eventually(20s, [this] { return says("peer-no-disk-errors"); }));
+    peer->beReticent();
+    for (int i = 0; i < 3; ++i) {
+        std::this_thread::sleep_for(1s);  // until it waits for a reply
+        daemon->signal(SIGSTOP);
+        std::this_thread::sleep_for(200ms);  // what is tried
+        daemon->signal(SIGCONT);
+        EXPECT_FALSE(test::eventually(1s, [this] { return says("peer-disk-errors"); }));
+    }
+    expectEndInTime();
+}
+
 TEST_F(SickMachineTest, AStoppedDaemonDoesNotDeclareThePeerDead) {
     start({"--dead-after", "0.6"});
     for (int i = 0; i < 3; ++i) {
