@@ -114,7 +114,7 @@ class SickMachineTest : public ::testing::Test {
         daemon->signal(SIGTERM);
         const auto status = daemon->waitFor(20s);
         ASSERT_TRUE(status.has_value());
-        EXPECT_EQ(*status, 0);
+        EXPECT_EQ(*status, 0) << daemon->error();
         EXPECT_LT(stopwatch.elapsed(), limit);
     }
 
