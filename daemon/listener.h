@@ -4,13 +4,14 @@
 
 #include <optional>
 #include <string>
+#include <utility>
 
 namespace ternhad {
 
 // A listening local socket and its file. For one thread.
 class Listener {
  public:
-    explicit Listener(const std::string& path) : _path(path) {}
+    explicit Listener(std::string path) : _path(std::move(path)) {}
     ~Listener() { close(); }
 
     Listener(const Listener&) = delete;
