@@ -19,7 +19,7 @@ namespace {
 
 constexpr char REFUSAL[] = "refused: ";  // a reason follows
 constexpr char NOT_TERNHADS[] = "the reply is not ternhad's";
-constexpr std::size_t LONGEST_REPLY = 256 * 1024;
+constexpr std::size_t LONGEST_REPLY = std::size_t{256} * 1024;
 constexpr char NO_REPLY[] = "the connection was closed without a reply";
 
 [[noreturn]] void failWithError() {
