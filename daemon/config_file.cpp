@@ -1,6 +1,9 @@
 #include "config_file.h"
 
 #include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <fstream>
 #include <sstream>
 
 namespace ternhad {
@@ -29,6 +32,13 @@ bool names(const std::string& text, const std::string& option) {
     const std::size_t end = place + option.size();
     return end == text.size() ||
            (std::isalnum(static_cast<unsigned char>(text[end])) == 0 && text[end] != '-');
+}
+
+// Why the file cannot be read. A directory can be opened, but not read.
+std::string reasonOf(const std::string& path) {
+    errno = 0;
+    std::ifstream(path).peek();
+    return std::strerror(errno);
 }
 
 }  // namespace
@@ -77,6 +87,9 @@ std::string ConfigFile::located(const CLI::ParseError& error,
     if (dynamic_cast<const LocatedError*>(&error) != nullptr) {
         return text;
     }
+    if (dynamic_cast<const CLI::FileError*>(&error) != nullptr) {
+        return path() + ": " + reasonOf(path());
+    }
     for (const auto& [name, line] : _lines) {
         const std::string option = "--" + name;
         if (names(text, option) && !isGiven(option, arguments)) {
@@ -86,7 +99,8 @@ std::string ConfigFile::located(const CLI::ParseError& error,
             return path() + ':' + std::to_string(line.number) + ": " + line.text + ": " + text;
         }
     }
-    return {};
+    const bool isMissing = dynamic_cast<const CLI::RequiredError*>(&error) != nullptr;
+    return isMissing && !path().empty() ? path() + ": " + text : std::string();
 }
 
 }  // namespace ternhad

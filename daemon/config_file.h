@@ -15,8 +15,9 @@ class ConfigFile : public CLI::ConfigINI {
 
     std::vector<CLI::ConfigItem> from_config(std::istream& input) const override;
 
-    // "FILE:LINE: NAME = VALUE: reason" when `error` is about something in the file; otherwise empty.
-    // `arguments`: of the command line, whose options win.
+    // "FILE:LINE: NAME = VALUE: reason" when `error` is about something in the file, "FILE: reason" when it
+    // is about the file or what it lacks; otherwise empty. `arguments`: of the command line, whose options
+    // win.
     std::string located(const CLI::ParseError& error, const std::vector<std::string>& arguments) const;
 
  private:

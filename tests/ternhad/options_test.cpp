@@ -169,6 +169,19 @@ INSTANTIATE_TEST_SUITE_P(
                   "status-socket = /run/x: needs --status-group"}),
     [](const auto& line) { return line.param.name; });
 
+TEST_F(OptionsTest, AFileThatLacksANameOrCannotBeReadIsNamed) {
+    test::writeFile("/tmp/ternhad.conf", "local-ip = 127.0.0.1\nremote-ip = 127.0.0.2\n");
+    const auto messageOn = [](const std::string& file) {
+        const auto result = ternhad({"--config", file});
+        EXPECT_EQ(result.exitCode, 2);
+        return result.error;
+    };
+    EXPECT_EQ(messageOn("/tmp/ternhad.conf"), "ternhad: /tmp/ternhad.conf: --interface is required\n");
+    EXPECT_EQ(messageOn("/nowhere.conf"), "ternhad: /nowhere.conf: No such file or directory\n");
+    EXPECT_EQ(messageOn("/tmp"), "ternhad: /tmp: Is a directory\n");
+    EXPECT_EQ(messageOn("/tmp/ternhad.conf/x"), "ternhad: /tmp/ternhad.conf/x: Not a directory\n");
+}
+
 TEST_F(OptionsTest, TheCommandLineIsNotBlamedOnTheFile) {
     test::writeFile("/tmp/ternhad.conf", "local-ip = 127.0.0.1\nremote-ip = 127.0.0.2\ninterface = lo\n");
     const auto result = ternhad({"--config", "/tmp/ternhad.conf", "--local-ip", "127.0.0.300"});
