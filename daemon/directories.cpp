@@ -16,7 +16,9 @@ namespace ternhad {
 namespace {
 
 constexpr char BUFFER_DIR[] = "/tmp/ha";
+constexpr char RUN_DIR[] = "/run/ternha";
 constexpr mode_t PRIVATE_DIR = 0700;
+constexpr mode_t PASSABLE_DIR = 0711;
 
 bool complain(const std::string& path, const std::string& reason) {
     std::cerr << "ternhad: " << path << ": " << reason << '\n';
@@ -78,6 +80,16 @@ bool hasOnlyOurFiles(const char* path) {
 }
 
 }  // namespace
+
+void openStatusDirectory(const std::string& socketPath) {
+    const std::string directory = std::filesystem::path(socketPath).parent_path();
+    if (directory != RUN_DIR && mkdir(directory.c_str(), PASSABLE_DIR) != 0) {
+        return;  // somebody else's
+    }
+    if (chmod(directory.c_str(), PASSABLE_DIR) != 0) {  // whatever the umask is
+        complain(directory, std::strerror(errno));
+    }
+}
 
 bool prepareDirectories(const char* socketPath) {
     return makeDirectory(BUFFER_DIR) && isOurs(BUFFER_DIR) && hasOnlyOurFiles(BUFFER_DIR) &&

@@ -35,6 +35,9 @@ int run(const ternhad::Options& options) {
     if (!ternhad::prepareDirectories(options.socket.c_str())) {
         return FAILURE;
     }
+    if (!options.statusSocket.empty()) {
+        ternhad::openStatusDirectory(options.statusSocket);
+    }
     return ternhad::Daemon(options, lock).run();
 }
 
