@@ -36,6 +36,7 @@ std::string when(const Json::Value& event) {
     return time.isNumeric() ? timeStamp(time.asDouble()) : "unknown";
 }
 
+// What was last known of a dead peer holds no longer.
 bool holds(const Report& report, const std::string& condition) {
     return std::any_of(flagNames().begin(), flagNames().end(), [&](const FlagName& name) {
         const Report::Flag& flag = report.*name.flag;
@@ -71,7 +72,7 @@ ExitCode events(const Settings& settings) {
     firstLine(connection, firstDeadline);
     Json::StreamWriterBuilder compact;
     compact["indentation"] = "";
-    while (std::cout) {
+    for (;;) {
         const auto event = connection.line(Clock::now() + NO_LIMIT);
         if (!event) {
             continue;
@@ -84,7 +85,6 @@ ExitCode events(const Settings& settings) {
                       << std::flush;
         }
     }
-    return ExitCode::Success;
 }
 
 }  // namespace ternhactl

@@ -5,7 +5,6 @@
 #include <cstring>
 #include <functional>
 #include <iostream>
-#include <optional>
 #include <sstream>
 #include <string>
 
@@ -100,24 +99,18 @@ std::string noAnswer(const Settings& settings, const char* reason) {
     return "ternhad does not answer on " + settings.socket + ": " + reason;
 }
 
-// The exit code when not all output could be written.
-std::optional<ExitCode> flushed(ExitCode otherwise) {
-    errno = 0;
-    if (std::cout.flush()) {
-        return std::nullopt;
-    }
-    std::cerr << "ternhactl: cannot write to standard output";
-    if (errno != 0) {
-        std::cerr << ": " << std::strerror(errno);
-    }
-    std::cerr << '\n';
-    return otherwise;
+// Right after a write has failed. `error`: errno
+ExitCode outputError(int error, ExitCode code) {
+    std::cerr << "ternhactl: cannot write to standard output: " << std::strerror(error) << '\n';
+    return code;
 }
 
 ExitCode run(const Command& command, const Settings& settings, bool isPlugin) {
     ExitCode code = ExitCode::Success;
     try {
         code = command(settings);
+    } catch (const std::ios::failure&) {
+        throw;
     } catch (const NoAnswer& error) {
         if (isPlugin) {
             return unknown(noAnswer(settings, error.what()));
@@ -130,10 +123,11 @@ ExitCode run(const Command& command, const Settings& settings, bool isPlugin) {
         }
         return unknown(error.what());
     }
-    return flushed(isPlugin ? ExitCode::NoAnswer : ExitCode::OutputError).value_or(code);
+    std::cout.flush();
+    return code;
 }
 
-ExitCode run(int argc, char** argv) {
+ExitCode run(int argc, char** argv, bool& isPlugin) {
     Settings settings;
     Command command;
     CLI::App app("Asks the high-availability daemon of this node, or gives it an order.", "ternhactl");
@@ -156,13 +150,16 @@ ExitCode run(int argc, char** argv) {
         }
     } catch (const CLI::ParseError& error) {
         if (error.get_exit_code() != 0 && app.got_subcommand(CHECK)) {
+            isPlugin = true;
             return unknown(error.what());
         }
         const ExitCode code = app.exit(error) == 0 ? ExitCode::Success : ExitCode::WrongUsage;
-        return flushed(ExitCode::OutputError).value_or(code);
+        std::cout.flush();
+        return code;
     }
     openlog("ternhactl", LOG_PID, LOG_USER);
-    return run(command, settings, app.got_subcommand(CHECK));
+    isPlugin = app.got_subcommand(CHECK);
+    return run(command, settings, isPlugin);
 }
 
 }  // namespace
@@ -174,7 +171,18 @@ void complain(const Settings& settings, const char* reason) {
 }  // namespace ternhactl
 
 int main(int argc, char** argv) try {
-    return static_cast<int>(ternhactl::run(argc, argv));
+    using ternhactl::ExitCode;
+    bool isPlugin = false;
+    try {
+        // Where a write fails, and not later: errno has the cause.
+        std::cout.exceptions(std::ios::badbit | std::ios::failbit);
+        return static_cast<int>(ternhactl::run(argc, argv, isPlugin));
+    } catch (const std::ios::failure&) {
+        const int error = errno;
+        std::cout.exceptions(std::ios::goodbit);  // it is flushed once more at the end
+        const auto code = isPlugin ? ExitCode::NoAnswer : ExitCode::OutputError;
+        return static_cast<int>(ternhactl::outputError(error, code));
+    }
 } catch (const std::exception& error) {
     std::cerr << "ternhactl: " << error.what() << '\n';
     return static_cast<int>(ternhactl::ExitCode::NoAnswer);

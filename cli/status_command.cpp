@@ -61,9 +61,7 @@ class Watch {
         }
     }
 
-    void remember(const Report& report) {
-        remember(report.isStale() ? std::optional<double>() : report.latency.value);
-    }
+    void remember(const Report& report) { remember(report.latency.current()); }
 
     const Settings& _settings;
     bool _useColour;
@@ -85,7 +83,7 @@ ExitCode status(const Settings& settings) {
         return ExitCode::Success;
     }
     Watch watch(settings, useColour);
-    while (std::cout) {
+    for (;;) {
         if (asRecords) {
             try {
                 std::cout << asJson(settings) << std::flush;
@@ -98,7 +96,6 @@ ExitCode status(const Settings& settings) {
         }
         std::this_thread::sleep_for(std::chrono::duration<double>(settings.watchInterval));
     }
-    return ExitCode::Success;
 }
 
 }  // namespace ternhactl
