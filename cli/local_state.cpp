@@ -38,6 +38,7 @@ void readResource(const std::vector<std::string>& words, LocalState& state) {
     if (link.empty() || link == "Unconfigured") {
         return;
     }
+    state.hasResources = true;
     const bool isConnected = isLinked(link);
     if (!isConnected) {
         state.unlinked.push_back(name + " not connected (" + link + ')');

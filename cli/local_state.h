@@ -8,6 +8,7 @@ namespace ternhactl {
 // What the kernel tells of this node and the daemon's record has no place for.
 struct LocalState {
     bool hasDrbd = false;                          // there is a /proc/drbd
+    bool hasResources = false;                     // DRBD has one that is configured
     std::string unsupportedDrbd;                   // the version of DRBD when it is not 8
     std::vector<std::string> replicaProblems;      // as "DRBD 0 replica Inconsistent"
     std::vector<std::string> peerReplicaProblems;  // the same of the connected peer

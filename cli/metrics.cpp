@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <iomanip>
 #include <sstream>
 #include <system_error>
@@ -35,7 +36,7 @@ class Text {
     }
 
     void gauge(const char* name, const char* help, const Report::Flag& flag) {
-        gauge(name, help, flag.value ? std::optional<double>(*flag.value ? 1 : 0) : std::nullopt);
+        gauge(name, help, flag.isKnown() ? std::optional<double>(*flag.value ? 1 : 0) : std::nullopt);
     }
 
     std::string str() const { return _text.str(); }
@@ -77,12 +78,9 @@ void addPeer(Text& text, const Report& report) {
     text.gauge("ternha_peer_last_reply_timestamp_seconds", "When the peer replied last, since 1970.",
                report.lastReply);
     text.gauge("ternha_peer_rebooting", "Whether the peer is being rebooted.", report.peerRebooting);
-    if (!report.isStale()) {
-        text.gauge("ternha_peer_md_resync", "Whether the peer resynchronises a RAID array.",
-                   report.peerResync);
-        text.gauge("ternha_peer_disk_error_handling", "Whether the peer handles disk errors.",
-                   report.peerDiskErrors);
-    }
+    text.gauge("ternha_peer_md_resync", "Whether the peer resynchronises a RAID array.", report.peerResync);
+    text.gauge("ternha_peer_disk_error_handling", "Whether the peer handles disk errors.",
+               report.peerDiskErrors);
 }
 
 void addNode(Text& text, const Report& report) {
@@ -92,12 +90,11 @@ void addNode(Text& text, const Report& report) {
 
 void addLink(Text& text, const Report& report) {
     text.gauge("ternha_drbd_connected", "Whether the DRBD link is up.", report.connected);
-    if (report.latency.value && !report.isStale()) {
-        text.gauge("ternha_heartbeat_latency_seconds", "Average round trip to the peer.",
-                   *report.latency.value / 1000);
+    if (const auto latency = report.latency.current()) {
+        text.gauge("ternha_heartbeat_latency_seconds", "Average round trip to the peer.", *latency / 1000);
     }
     text.gauge("ternha_interface_non_ok_ratio",
-               "Share of packets of the replication interface that were not OK.", report.nonOkRate.value);
+               "Share of packets of the replication interface that were not OK.", report.nonOkRate.current());
 }
 
 void addDisks(Text& text, const Report& report) {
@@ -109,8 +106,10 @@ void addDisks(Text& text, const Report& report) {
                 std::string("ternha_disk_error{owner=\"") + owner + "\",device=" + quoted(device) + '}', 1);
         }
     };
-    add("self", report.disks);
-    if (report.peerDisks && !report.isStale()) {
+    if (!report.diskErrors.isStale) {
+        add("self", report.disks);
+    }
+    if (report.peerDisks && !report.peerDiskErrors.isStale) {
         add("peer", *report.peerDisks);
     }
 }
@@ -159,10 +158,10 @@ std::string metricsOfNoDaemon() {
 
 void writeAtomically(const std::string& path, const std::string& text) {
     // Collectors read *.prom: the name of the unfinished file must not end so.
-    const std::string unfinished = path + ".new";
-    const int fd = open(unfinished.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, READABLE);
+    std::string unfinished = path + ".XXXXXX";
+    const int fd = mkostemp(unfinished.data(), O_CLOEXEC);
     if (fd < 0) {
-        failWith(errno, unfinished);
+        failWith(errno, path);
     }
     fchmod(fd, READABLE);  // whatever the umask is
     const ssize_t written = write(fd, text.data(), text.size());

@@ -10,12 +10,23 @@ namespace {
 
 constexpr unsigned int REBOOT_TIMEOUT = 40;  // seconds; the daemon follows the peer down for up to 33
 
+constexpr char WAS_DEAD[] = "was-dead";
+constexpr char WENT_DOWN[] = "went-down";
+
 // Asks on the terminal; anything but "y" or "yes" is no.
 bool confirm() {
     std::cout << "Reboot the peer at once, without a shutdown? [y/N] " << std::flush;
     std::string answer;
     std::getline(std::cin, answer);
     return answer == "y" || answer == "Y" || answer == "yes";
+}
+
+// An older daemon does not tell.
+std::string outcomeOf(const Report& before, const Report& after) {
+    return !after.orderOutcome.empty()  ? after.orderOutcome
+           : before.peerAlive.is(false) ? WAS_DEAD
+           : after.peerAlive.is(false)  ? WENT_DOWN
+                                        : "still-answers";
 }
 
 }  // namespace
@@ -38,15 +49,16 @@ ExitCode rebootPeer(const Settings& settings) {
     }
     std::cout << "Ordering the reboot and following the peer down, up to 33 seconds...\n" << std::flush;
     ask(settings, "R", Deadline(REBOOT_TIMEOUT));
-    if (before.peerAlive.is(false)) {
-        std::cout << "The peer was already dead: nobody knows whether it heard the order.\n";
-        return ExitCode::No;
-    }
     if (!before.peerAlive.value) {
         std::cout << "The peer has not been probed yet: nobody knows whether it heard the order.\n";
         return ExitCode::No;
     }
-    if (!Report(fetchReport(settings)).peerAlive.is(false)) {
+    const std::string outcome = outcomeOf(before, Report(fetchReport(settings)));
+    if (outcome == WAS_DEAD) {
+        std::cout << "The peer was already dead: nobody knows whether it heard the order.\n";
+        return ExitCode::No;
+    }
+    if (outcome != WENT_DOWN) {
         std::cout << "The peer still answers: it was not rebooted.\n";
         return ExitCode::No;
     }

@@ -32,15 +32,32 @@ std::optional<std::vector<std::string>> names(const Json::Value& value) {
     return result;
 }
 
+// An older daemon does not tell.
+bool isStale(const Json::Value& json, bool otherwise) {
+    const Json::Value& value = member(json, "stale");
+    return value.isBool() ? value.asBool() : otherwise;
+}
+
 Report::Flag flag(const Json::Value& json) {
     const Json::Value& value = member(json, "value");
     const Json::Value& changes = member(json, "changes");
     return {value.isBool() ? std::optional(value.asBool()) : std::nullopt, number(member(json, "since")),
-            changes.isUInt64() ? std::optional<std::uint64_t>(changes.asUInt64()) : std::nullopt};
+            changes.isUInt64() ? std::optional<std::uint64_t>(changes.asUInt64()) : std::nullopt,
+            number(member(json, "checked")), isStale(json, false)};
 }
 
-Report::Figure figure(const Json::Value& json) {
-    return {number(member(json, "value")), number(member(json, "time"))};
+// What the peer said or was needed for is stale when it is not alive.
+Report::Flag peerFlag(const Json::Value& json, const Report& report) {
+    Report::Flag result = flag(json);
+    result.isStale = isStale(json, !report.peerAlive.is(true));
+    if (!result.checked) {
+        result.checked = report.lastReply;
+    }
+    return result;
+}
+
+Report::Figure figure(const Json::Value& json, bool isStaleOtherwise) {
+    return {number(member(json, "value")), number(member(json, "time")), isStale(json, isStaleOtherwise)};
 }
 
 // How people call a node: its name, else its address.
@@ -95,15 +112,16 @@ Report::Report(const Json::Value& json)
       lastReply(number(member(member(json, "peer"), "lastReply"))),
       peerAlive(flag(member(member(json, "peer"), "alive"))),
       peerRebooting(flag(member(member(json, "peer"), "rebooting"))),
-      peerResync(flag(member(member(json, "peer"), "resync"))),
-      peerDiskErrors(flag(member(member(json, "peer"), "diskErrors"))),
+      orderOutcome(text(member(member(json, "peer"), "orderOutcome"))),
+      peerResync(peerFlag(member(member(json, "peer"), "resync"), *this)),
+      peerDiskErrors(peerFlag(member(member(json, "peer"), "diskErrors"), *this)),
       peerDisks(names(member(member(json, "peer"), "disks"))),
       connected(flag(member(member(json, "link"), "connected"))),
       resync(flag(member(member(json, "node"), "resync"))),
       diskErrors(flag(member(member(json, "node"), "diskErrors"))),
       disks(names(member(member(json, "node"), "disks")).value_or(std::vector<std::string>())),
-      latency(figure(member(member(json, "link"), "latency"))),
-      nonOkRate(figure(member(member(json, "link"), "nonOkRate"))) {}
+      latency(figure(member(member(json, "link"), "latency"), !peerAlive.is(true))),
+      nonOkRate(figure(member(member(json, "link"), "nonOkRate"), false)) {}
 
 const std::vector<FlagName>& flagNames() {
     static const std::vector<FlagName> names = {

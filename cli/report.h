@@ -18,18 +18,21 @@ struct Report {
         std::optional<bool> value;
         std::optional<double> since;
         std::optional<std::uint64_t> changes;
+        std::optional<double> checked;  // when a check has found the value last
+        bool isStale = false;           // the value is the last known one
 
-        bool is(bool expected) const { return value == expected; }
+        bool isKnown() const { return value && !isStale; }
+        bool is(bool expected) const { return isKnown() && value == expected; }
     };
     struct Figure {
         std::optional<double> value;
         std::optional<double> time;  // of the measurement
+        bool isStale = false;
+
+        std::optional<double> current() const { return isStale ? std::nullopt : value; }
     };
 
     explicit Report(const Json::Value& json);
-
-    // What it says of the peer is what was last heard of it.
-    bool isStale() const { return !peerAlive.is(true); }
 
     std::optional<double> time;     // of the report
     std::string version;            // of the daemon; empty for one that does not tell
@@ -40,6 +43,7 @@ struct Report {
 
     Flag peerAlive;
     Flag peerRebooting;
+    std::string orderOutcome;  // of the latest order to reboot it; empty when there was none
     Flag peerResync;
     Flag peerDiskErrors;
     std::optional<std::vector<std::string>> peerDisks;  // device names

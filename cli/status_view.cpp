@@ -68,7 +68,7 @@ std::string yesNo(const Report::Flag& flag, double now) {
 }
 
 bool isWithoutNames(const Report& report) {
-    return report.peerDiskErrors.is(true) && (!report.peerDisks || report.peerDisks->empty());
+    return report.peerDiskErrors.value == true && (!report.peerDisks || report.peerDisks->empty());
 }
 
 std::string headline(const Report& report, const LocalState& local, double now) {
@@ -78,6 +78,21 @@ std::string headline(const Report& report, const LocalState& local, double now) 
            (isOk ? "alive" + sinceOf(report.peerAlive.since, now) : joined(result.reasons));
 }
 
+void addFlag(View& view, const char* label, const Report::Flag& flag, const std::string& value, double now,
+             bool isTroubleSet = true) {
+    const bool isOld = flag.value && flag.isStale;
+    view.row(label, isOld ? Look::Stale : troubleIf(flag.is(isTroubleSet)),
+             value + (isOld ? " (" + lastKnown(flag.checked, now) + ')' : ""));
+}
+
+void addFigure(View& view, const char* label, const Report::Figure& figure, double factor, int decimals,
+               const char* unit, double now) {
+    const bool isOld = figure.value && figure.isStale;
+    const std::string value = figure.value ? fixedPoint(*figure.value * factor, decimals) + unit : "unknown";
+    view.row(label, isOld ? Look::Stale : Look::Normal,
+             value + (isOld ? " (" + lastKnown(figure.time, now) + ')' : ""));
+}
+
 void addPeer(View& view, const Report& report, double now) {
     view.line("Peer");
     if (!report.peerAlive.value) {
@@ -85,33 +100,27 @@ void addPeer(View& view, const Report& report, double now) {
     } else {
         std::string state =
             (report.peerAlive.is(true) ? "alive" : "dead") + sinceOf(report.peerAlive.since, now);
-        if (report.isStale() && report.lastReply) {
+        if (report.peerAlive.is(false) && report.lastReply) {
             state += ", last reply " + duration(now - *report.lastReply) + " ago";
         }
-        view.row("state", troubleIf(report.isStale()), state);
+        view.row("state", troubleIf(report.peerAlive.is(false)), state);
     }
     view.row("being rebooted", troubleIf(report.peerRebooting.is(true)), yesNo(report.peerRebooting, now));
 
-    const std::string age = report.lastReply ? ", " + duration(now - *report.lastReply) + " ago" : "";
-    const auto reported = [&](const char* label, const Report::Flag& flag, const std::string& value) {
-        const bool isOld = report.isStale() && flag.value;
-        view.row(label, isOld ? Look::Stale : troubleIf(flag.is(true)),
-                 value + (isOld ? " (last known" + age + ')' : ""));
-    };
-    reported("RAID resync", report.peerResync, yesNo(report.peerResync, now));
+    addFlag(view, "RAID resync", report.peerResync, yesNo(report.peerResync, now), now);
     std::string disks = yesNo(report.peerDiskErrors, now);
     if (isWithoutNames(report)) {
         disks += std::string(", ") + TOO_MANY_DISKS;
     } else if (report.peerDisks && !report.peerDisks->empty()) {
         disks += ": " + joined(readable(*report.peerDisks));
     }
-    reported("disk errors", report.peerDiskErrors, disks);
+    addFlag(view, "disk errors", report.peerDiskErrors, disks, now);
 }
 
 void addNode(View& view, const Report& report, const LocalState& local, double now) {
     view.line("This node");
-    view.row("RAID resync", troubleIf(report.resync.is(true)),
-             local.hasArrays || !report.resync.is(false) ? yesNo(report.resync, now) : "no arrays");
+    addFlag(view, "RAID resync", report.resync,
+            local.hasArrays || !report.resync.is(false) ? yesNo(report.resync, now) : "no arrays", now);
     if (!local.arrayProblems.empty()) {
         view.row("RAID arrays", Look::Trouble, joined(local.arrayProblems));
     }
@@ -121,20 +130,26 @@ void addNode(View& view, const Report& report, const LocalState& local, double n
     } else if (!report.disks.empty()) {
         disks += ": " + joined(report.disks);
     }
-    view.row("disk errors", troubleIf(report.diskErrors.is(true)), disks);
+    addFlag(view, "disk errors", report.diskErrors, disks, now);
+}
+
+std::string drbdState(const Report::Flag& connected, const LocalState& local, double now) {
+    if (!connected.value) {
+        return "unknown";
+    }
+    if (*connected.value) {
+        return "connected" + sinceOf(connected.since, now);
+    }
+    return "not connected" + (!local.hasDrbd       ? " (no /proc/drbd)"
+                              : local.hasResources ? sinceOf(connected.since, now)
+                                                   : " (no resource)");
 }
 
 void addDrbd(View& view, const Report& report, const LocalState& local, double now) {
     if (!local.unsupportedDrbd.empty()) {
         view.row("DRBD", Look::Trouble, local.unsupportedDrbd + " is not supported, 8.4 is");
-    } else if (!report.connected.value) {
-        view.row("DRBD", Look::Normal, "unknown");
-    } else if (*report.connected.value) {
-        view.row("DRBD", Look::Normal, "connected" + sinceOf(report.connected.since, now));
     } else {
-        view.row("DRBD", Look::Trouble,
-                 "not connected" + (local.hasDrbd ? sinceOf(report.connected.since, now)
-                                                  : std::string(" (no /proc/drbd)")));
+        addFlag(view, "DRBD", report.connected, drbdState(report.connected, local, now), now, false);
     }
     const std::vector<std::string> none;
     for (const auto* problems : {report.connected.is(true) ? &local.unlinked : &none, &local.replicaProblems,
@@ -148,18 +163,24 @@ void addDrbd(View& view, const Report& report, const LocalState& local, double n
 void addLink(View& view, const Report& report, const LocalState& local, double now) {
     view.line("Link");
     addDrbd(view, report, local, now);
-    const bool isOld = report.isStale() && report.latency.value;
-    std::string latency = "unknown";
-    if (report.latency.value) {
-        latency = fixedPoint(*report.latency.value, 3) + " ms";
+    addFigure(view, "latency", report.latency, 1, 3, " ms", now);
+    addFigure(view, "non-OK packets", report.nonOkRate, 100, 2, " %", now);
+}
+
+// A line for each name; without any, none when that is certain.
+std::string disksOf(const std::string& owner, const Report::Flag& flag, std::vector<std::string> names,
+                    double now) {
+    if (!flag.value) {
+        names = {"unknown"};
+    } else if (flag.isStale && names.empty()) {
+        names = {"none"};
     }
-    if (isOld) {
-        latency += " (last known" +
-                   (report.latency.time ? ", " + duration(now - *report.latency.time) + " ago" : "") + ')';
+    std::string text;
+    for (const std::string& name : names) {
+        text += owner + (flag.value && flag.isStale ? ", " + lastKnown(flag.checked, now) : "") + ": " +
+                name + '\n';
     }
-    view.row("latency", isOld ? Look::Stale : Look::Normal, latency);
-    view.row("non-OK packets", Look::Normal,
-             report.nonOkRate.value ? fixedPoint(*report.nonOkRate.value * 100, 2) + " %" : "unknown");
+    return text;
 }
 
 }  // namespace
@@ -180,19 +201,13 @@ std::string dimmed(const std::string& text, bool useColour) {
 }
 
 std::string diskList(const Report& report) {
-    const std::string peer = report.isStale() ? "peer, last known: " : "peer: ";
-    std::string text;
+    const double now = report.time.value_or(currentTime());
+    std::vector<std::string> peerDisks = readable(report.peerDisks.value_or(std::vector<std::string>()));
     if (isWithoutNames(report)) {
-        text += peer + TOO_MANY_DISKS + '\n';
-    } else if (report.peerDisks) {
-        for (const std::string& name : readable(*report.peerDisks)) {
-            text += peer + name + '\n';
-        }
+        peerDisks = {TOO_MANY_DISKS};
     }
-    for (const std::string& name : report.disks) {
-        text += "this node: " + name + '\n';
-    }
-    return text;
+    return disksOf("peer", report.peerDiskErrors, peerDisks, now) +
+           disksOf("this node", report.diskErrors, report.disks, now);
 }
 
 std::string blocks(const std::vector<std::optional<double>>& values) {

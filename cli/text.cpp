@@ -63,6 +63,10 @@ std::string duration(double seconds) {
     return fixedPoint(std::floor(value / DAY), 0) + " d";
 }
 
+std::string lastKnown(const std::optional<double>& time, double now) {
+    return "last known" + (time ? ' ' + duration(now - *time) + " ago" : std::string());
+}
+
 std::string timeStamp(double time) {
     return formatted(time, "%FT%T%z");
 }

@@ -22,6 +22,9 @@ std::string sinceOf(const std::optional<double>& time, double now);
 // "12 s", "3 min", "5 h" or "2 d".
 std::string duration(double seconds);
 
+// "last known", with its age when it is known since when.
+std::string lastKnown(const std::optional<double>& time, double now);
+
 double currentTime();
 
 }  // namespace ternhactl

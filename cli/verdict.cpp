@@ -16,12 +16,12 @@ void append(Reasons& to, const Reasons& from) {
 }
 
 // What was wrong with a peer that can no longer be asked.
-Reasons lastKnown(const Report& report, double now) {
+Reasons lastKnownTrouble(const Report& report, double now) {
     Reasons found;
-    if (report.peerResync.is(true)) {
+    if (report.peerResync.isStale && report.peerResync.value == true) {
         found.emplace_back("RAID resync");
     }
-    if (report.peerDiskErrors.is(true)) {
+    if (report.peerDiskErrors.isStale && report.peerDiskErrors.value == true) {
         found.emplace_back("disk errors");
     }
     if (found.empty()) {
@@ -29,6 +29,16 @@ Reasons lastKnown(const Report& report, double now) {
     }
     const std::string age = report.lastReply ? ' ' + duration(now - *report.lastReply) + " ago" : "";
     return {"peer's last known state" + age + ": " + joined(found)};
+}
+
+// A flag that no check tells of: "not known yet", or the age of what it told last.
+std::string unknownState(const Report::Flag& flag, const char* verb, double now) {
+    return flag.value ? lastKnown(flag.checked, now) : std::string("not ") + verb + " yet";
+}
+
+// The older of two flags that must both be known; null when they are.
+const Report::Flag* unknownOf(const Report::Flag& a, const Report::Flag& b) {
+    return a.isKnown() && b.isKnown() ? nullptr : a.isKnown() ? &b : &a;
 }
 
 // One figure of the performance data.
@@ -56,23 +66,26 @@ Verdict verdict(const Report& report, const LocalState& local) {
     if (!local.unsupportedDrbd.empty()) {
         critical.push_back("DRBD " + local.unsupportedDrbd + " is not supported, 8.4 is");
     } else if (report.connected.is(false)) {
-        critical.push_back("DRBD not connected" + std::string(local.hasDrbd ? "" : " (no /proc/drbd)"));
+        critical.push_back("DRBD not connected" + std::string(!local.hasDrbd       ? " (no /proc/drbd)"
+                                                              : local.hasResources ? ""
+                                                                                   : " (no resource)"));
     } else {
-        if (!report.connected.value) {
-            unknown.emplace_back("DRBD not checked yet");
+        if (!report.connected.isKnown()) {
+            unknown.push_back("DRBD " + unknownState(report.connected, "checked", now));
         }
         append(warnings, local.unlinked);
     }
-    if (report.peerAlive.is(true) && (!report.peerResync.value || !report.peerDiskErrors.value)) {
-        unknown.emplace_back("peer's RAID and disks not known yet");
+    if (const auto* flag = unknownOf(report.peerResync, report.peerDiskErrors);
+        flag != nullptr && report.peerAlive.is(true)) {
+        unknown.push_back("peer's RAID and disks " + unknownState(*flag, "known", now));
     }
-    if (!report.resync.value || !report.diskErrors.value) {
-        unknown.emplace_back("this node not checked yet");
+    if (const auto* flag = unknownOf(report.resync, report.diskErrors)) {
+        unknown.push_back("this node " + unknownState(*flag, "checked", now));
     }
     const std::array<std::pair<bool, const char*>, 5> unwise = {{
         {report.peerRebooting.is(true), "peer being rebooted"},
-        {report.peerResync.is(true) && !report.isStale(), "peer resynchronises RAID"},
-        {report.peerDiskErrors.is(true) && !report.isStale(), "peer handles disk errors"},
+        {report.peerResync.is(true), "peer resynchronises RAID"},
+        {report.peerDiskErrors.is(true), "peer handles disk errors"},
         {report.resync.is(true), "RAID resync"},
         {report.diskErrors.is(true), "disk errors"},
     }};
@@ -84,9 +97,7 @@ Verdict verdict(const Report& report, const LocalState& local) {
     append(warnings, local.replicaProblems);
     append(warnings, local.peerReplicaProblems);
     append(warnings, local.arrayProblems);
-    if (report.isStale()) {
-        append(warnings, lastKnown(report, now));
-    }
+    append(warnings, lastKnownTrouble(report, now));
 
     Verdict result;
     if (!critical.empty()) {
@@ -105,6 +116,7 @@ Verdict verdict(const Report& report, const LocalState& local) {
 }
 
 Verdict verdictOfNode(const Report& report, const LocalState& local) {
+    const double now = report.time.value_or(currentTime());
     Verdict result;
     if (report.resync.is(true)) {
         result.reasons.emplace_back("RAID resync");
@@ -116,14 +128,15 @@ Verdict verdictOfNode(const Report& report, const LocalState& local) {
     append(result.reasons, local.arrayProblems);
     if (!result.reasons.empty()) {
         result.level = Verdict::Level::Warning;
-    } else if (!report.resync.value || !report.diskErrors.value) {
+    } else if (const auto* flag = unknownOf(report.resync, report.diskErrors)) {
         result.level = Verdict::Level::Unknown;
-        result.reasons = {"this node not checked yet"};
-    } else if (!local.hasDrbd || !local.unsupportedDrbd.empty()) {
+        result.reasons = {"this node " + unknownState(*flag, "checked", now)};
+    } else if (!local.hasDrbd || !local.unsupportedDrbd.empty() || !local.hasResources) {
         result.level = Verdict::Level::Unknown;
-        result.reasons = {local.hasDrbd
-                              ? "replica unknown: DRBD " + local.unsupportedDrbd + " is not supported, 8.4 is"
-                              : "replica unknown: no /proc/drbd"};
+        result.reasons = {!local.hasDrbd                  ? "replica unknown: no /proc/drbd"
+                          : local.unsupportedDrbd.empty() ? "replica unknown: DRBD has no resource"
+                                                          : "replica unknown: DRBD " + local.unsupportedDrbd +
+                                                                " is not supported, 8.4 is"};
     } else {
         result.reasons = {"this node could serve alone"};
     }
@@ -135,11 +148,11 @@ std::string pluginLine(const Verdict& verdict) {
 }
 
 std::string pluginLine(const Report& report, const Verdict& verdict) {
-    const bool isLatencyKnown = report.latency.value && !report.isStale();
+    const auto latency = report.latency.current();
+    const auto rate = report.nonOkRate.current();
     return pluginLine(verdict) + " | " +
-           figure("latency", isLatencyKnown ? fixedPoint(*report.latency.value, 3) + "ms" : "U", ";;;0 ") +
-           figure("nonok", report.nonOkRate.value ? fixedPoint(*report.nonOkRate.value * 100, 4) + '%' : "U",
-                  ";;;0;100");
+           figure("latency", latency ? fixedPoint(*latency, 3) + "ms" : "U", ";;;0 ") +
+           figure("nonok", rate ? fixedPoint(*rate * 100, 4) + '%' : "U", ";;;0;100");
 }
 
 }  // namespace ternhactl

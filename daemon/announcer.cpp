@@ -2,6 +2,7 @@
 
 #include <array>
 #include <ctime>
+#include <utility>
 
 #include "journal.h"
 #include "passes.h"
@@ -10,6 +11,8 @@
 namespace ternhad {
 
 namespace {
+
+constexpr auto REFRESH = std::chrono::seconds(5);  // what becomes stale is no change
 
 std::string timeText(std::chrono::system_clock::time_point time) {
     const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
@@ -28,16 +31,15 @@ void Announcer::run() {
         _reader.event().take();
         passes.run([this] {
             std::uint64_t lost = 0;
-            bool isAny = false;
             while (const auto transition = _reader.next(lost)) {
                 announce(*transition);
-                isAny = true;
             }
-            if (isAny) {
-                notifyStatus(summary());
+            if (std::string status = summary(); status != _status) {
+                notifyStatus(status);
+                _status = std::move(status);
             }
         });
-    } while (_shutdown.waitFor(_reader.event()));
+    } while (_shutdown.sleepUntil(Clock::now() + REFRESH, {&_reader.event()}));
 }
 
 void Announcer::announce(const Transition& transition) {
@@ -47,21 +49,22 @@ void Announcer::announce(const Transition& transition) {
                      conditionOf(transition.flag, transition.old) + ')');
 }
 
-// The peer's state and whatever is wrong beside it.
+// The peer's state, whatever is wrong beside it, and what was when it was last known.
 std::string Announcer::summary() const {
     const Transitions::State peer = _transitions.state(Flag::peerAlive);
     std::string text = "peer unknown";
     if (peer.value) {
         text = std::string(*peer.value ? "peer alive since " : "peer dead since ") + timeText(peer.since);
     }
+    std::string lastKnown;
     for (const Flag flag : {Flag::peerRebooting, Flag::peerResync, Flag::peerDiskErrors, Flag::drbdConnected,
                             Flag::resync, Flag::diskErrors}) {
-        const auto value = _transitions.state(flag).value;
-        if (value && *value != nameOf(flag).isSetGood) {
-            text += std::string(", ") + conditionOf(flag, value);
+        const Transitions::State state = _transitions.state(flag);
+        if (state.value && *state.value != nameOf(flag).isSetGood) {
+            (state.isStale ? lastKnown : text) += std::string(", ") + conditionOf(flag, state.value);
         }
     }
-    return text;
+    return lastKnown.empty() ? text : text + "; last known: " + lastKnown.substr(2);
 }
 
 }  // namespace ternhad

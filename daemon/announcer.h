@@ -24,6 +24,7 @@ class Announcer {
     Transitions& _transitions;
     Transitions::Reader _reader;
     const Shutdown& _shutdown;
+    std::string _status;  // as the manager knows it
 };
 
 }  // namespace ternhad

@@ -21,6 +21,8 @@ constexpr unsigned int CLIENT_TIMEOUT = 0;  // a client's; this end does not use
 constexpr auto SILENCE_LIMIT = std::chrono::seconds(5);
 constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the socket file
 constexpr std::size_t MOST_CLIENTS = 16;
+constexpr auto OBEYED = std::chrono::seconds(6);     // after an order a peer that obeys replies no more
+constexpr auto FOLLOWED = std::chrono::seconds(29);  // at least, unless it is seen dead
 constexpr char RESTORING[] = "make the vanished control socket again";
 constexpr char ACCEPTING[] = "accept control clients";
 constexpr char ORDER = 'R';  // the actions
@@ -41,12 +43,26 @@ bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Val
     if (action == ORDER && _orders == nullptr) {
         return false;
     }
-    const bool isServed = MonitordSocket::serverHandle(request, reply);
-    if (action == ORDER && _orders->isPeerAlive()) {
-        // It replies to each probe, so that no other thread would say that it is not being rebooted.
-        _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
+    if (action != ORDER) {
+        return MonitordSocket::serverHandle(request, reply);
     }
+    const bool wasAlive = _orders->isPeerAlive();
+    const auto start = Clock::now();
+    const bool isServed = MonitordSocket::serverHandle(request, reply);
+    _orders->findings().setOrderOutcome(wasAlive ? outcomeSince(start) : Findings::OrderOutcome::wasDead);
     return isServed;
+}
+
+// With a long `dead-after` a peer that went down is not dead yet: what counts is whether it has replied
+// since.
+Findings::OrderOutcome ControlServer::Endpoint::outcomeSince(Clock::time_point start) {
+    const bool isSilent =
+        Clock::now() >= start + FOLLOWED && _orders->findings().lastReplyTime() < start + OBEYED;
+    if (!_orders->isPeerAlive() || isSilent) {
+        return Findings::OrderOutcome::wentDown;
+    }
+    _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
+    return Findings::OrderOutcome::stillAnswers;
 }
 
 ControlServer::ControlServer(const std::string& path, Access access, Health& health, const Reporter& reporter,
@@ -75,7 +91,7 @@ void ControlServer::restoreFile() {
         return;
     }
     if (_listener.listen()) {
-        TERNHAD_LOG(_events, "The control socket had vanished, it is there again");
+        TERNHAD_LOG(_events, "The socket " + _listener.path() + " had vanished, it is there again");
         _isFileLost = false;
     } else if (!_isFileLost) {
         _events.troubleBegan(RESTORING, errno);
@@ -117,7 +133,7 @@ void ControlServer::wait() const {
 
 void ControlServer::acceptClients() {
     const bool wasFull = std::exchange(_isFull, false);
-    while (_clients.size() < MOST_CLIENTS) {
+    while (_listener.fd() >= 0 && _clients.size() < MOST_CLIENTS) {
         const int fd = accept4(_listener.fd(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
         if (fd < 0) {
             if (errno != EAGAIN && errno != EINTR && errno != ECONNABORTED) {
@@ -196,10 +212,12 @@ void ControlServer::carryOutOrder() {
     if (_shutdown.isRequested()) {
         return;
     }
-    const bool isAlive = _health.isPeerAlive();
-    TERNHAD_LOG(_events, std::string("Reboot of the peer: ") + (isAlive    ? "it still answers, not rebooted"
-                                                                : wasAlive ? "it went down"
-                                                                           : "it was already dead"));
+    const auto outcome = _health.findings().orderOutcome();
+    TERNHAD_LOG(_events,
+                std::string("Reboot of the peer: ") +
+                    (outcome == Findings::OrderOutcome::stillAnswers ? "it still answers, not rebooted"
+                     : outcome == Findings::OrderOutcome::wentDown   ? "it went down"
+                                                                     : "it was already dead"));
 }
 
 }  // namespace ternhad

@@ -52,6 +52,8 @@ class ControlServer {
         void serve(int fd) { _serverListen(fd); }
 
      private:
+        Findings::OrderOutcome outcomeSince(Clock::time_point start);
+
         const Reporter& _reporter;
         Health* _orders;
     };

@@ -17,12 +17,16 @@
 
 #include "checker.h"
 #include "env_check.h"
+#include "journal.h"
 #include "passes.h"
 #include "service_notifier.h"
 
 namespace ternhad {
 
 namespace {
+
+// A flag is stale after three rounds of its check, and the time in which the peer's two replies are awaited.
+constexpr auto LOST_REPLIES = std::chrono::seconds(6);
 
 // Of the 2 seconds that the end may take.
 constexpr auto THREADS_LIMIT = std::chrono::milliseconds(1000);
@@ -50,7 +54,8 @@ bool complain(const std::string& what, int error) {
 Daemon::Daemon(const Options& options, InstanceLock& lock)
     : _options(options),
       _lock(lock),
-      _health(_events),
+      _health(_events,
+              std::chrono::duration_cast<Clock::duration>(3 * options.checkInterval) + LOST_REPLIES),
       _logKeeper(options, _health, _events),
       _reboot(_events, _shutdown),
       _peerServer(_health, _events, _reboot, _shutdown, _progress),
@@ -103,13 +108,11 @@ bool Daemon::startThreads() try {
     if (!_controlServer.listener().listen()) {
         return complain("bind the control socket " + _options.socket, errno);
     }
-    if (!startStatusServer()) {
-        return complain("bind the status socket " + _options.statusSocket, errno);
-    }
     _threads.start("reboot", [this] { _reboot.flush(); });
     _threads.start("clients", [this] { _controlServer.run(&_progress); });
     _threads.start("orders", [this] { _controlServer.runOrders(); });
     _threads.start("streams", [this] { _streams.run(); });
+    startStatusServer();
     _threads.start("journal", [this] { _announcer.run(); });
     if (!_options.notify.empty()) {
         _threads.start("notify", [this] { _notifier.run(); });
@@ -123,17 +126,22 @@ bool Daemon::startThreads() try {
     return false;
 }
 
-bool Daemon::startStatusServer() {
+// The node does not depend on it: the server tries again until it has its socket. Its clients have places of
+// their own, so that they cannot take root's.
+void Daemon::startStatusServer() {
     if (_options.statusSocket.empty()) {
-        return true;
+        return;
     }
-    _statusServer.emplace(_options.statusSocket, ControlServer::Access::reading, _health, _reporter, _streams,
-                          _events, _shutdown);
-    if (!_statusServer->listener().listen() || !_statusServer->listener().shareWith(_options.statusGroupId)) {
-        return false;
+    _statusStreams.emplace(_health.transitions(), _reporter, _shutdown);
+    _statusServer.emplace(_options.statusSocket, ControlServer::Access::reading, _health, _reporter,
+                          *_statusStreams, _events, _shutdown);
+    _statusServer->listener().shareWith(_options.statusGroupId);
+    if (!_statusServer->listener().listen()) {
+        writeJournal(Level::warning, "cannot bind the status socket " + _options.statusSocket + ": " +
+                                         std::strerror(errno) + "; trying again");
     }
     _threads.start("readers", [this] { _statusServer->run(nullptr); });
-    return true;
+    _threads.start("reader-streams", [this] { _statusStreams->run(); });
 }
 
 bool Daemon::startPeerThreads() {

@@ -38,7 +38,7 @@ class Daemon {
  private:
     bool startThreads();
     bool startPeerThreads();
-    bool startStatusServer();
+    void startStatusServer();
     void waitForStop(int signals);
     void takeSignals(int signals);
     void updateWatchdog();
@@ -57,7 +57,8 @@ class Daemon {
     Reporter _reporter;
     EventStreams _streams;
     ControlServer _controlServer;
-    std::optional<ControlServer> _statusServer;  // for monitoring without root
+    std::optional<EventStreams> _statusStreams;  // for monitoring without root
+    std::optional<ControlServer> _statusServer;
     Announcer _announcer;
     Notifier _notifier;
     PeerWatcher _peerWatcher;

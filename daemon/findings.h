@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 
+#include "event.h"
 #include "wall_clock.h"
 
 namespace ternhad {
@@ -16,13 +17,25 @@ class Findings {
     struct Figure {
         std::optional<double> value;
         std::chrono::system_clock::time_point time;  // of the measurement
+        Clock::time_point measured;                  // the same
     };
 
+    // What became of an order to reboot the peer.
+    enum class OrderOutcome { none, wentDown, stillAnswers, wasDead };
+
     // The peer has replied to a liveness probe. Neither blocks nor allocates.
-    void peerReplied() noexcept { _lastReply = secondsOf(wallClock()); }
+    void peerReplied() noexcept {
+        _lastReply = secondsOf(wallClock());
+        _lastReplyTime = Clock::now();
+    }
 
     // Seconds since 1970, 0 before the first reply.
     double lastReply() const noexcept { return _lastReply; }
+    Clock::time_point lastReplyTime() const noexcept { return _lastReplyTime; }
+
+    // Of the latest order that has ended.
+    void setOrderOutcome(OrderOutcome outcome) noexcept { _orderOutcome = outcome; }
+    OrderOutcome orderOutcome() const noexcept { return _orderOutcome; }
 
     void setPeerName(const std::string& name) {
         const std::lock_guard<std::mutex> lock(_mutex);
@@ -47,7 +60,7 @@ class Findings {
  private:
     void set(Figure& figure, std::optional<double> value) {
         const std::lock_guard<std::mutex> lock(_mutex);
-        figure = {value, wallClock()};
+        figure = {value, wallClock(), Clock::now()};
     }
     Figure get(const Figure& figure) const {
         const std::lock_guard<std::mutex> lock(_mutex);
@@ -55,6 +68,8 @@ class Findings {
     }
 
     std::atomic<double> _lastReply{0};
+    std::atomic<Clock::time_point> _lastReplyTime{Clock::time_point()};
+    std::atomic<OrderOutcome> _orderOutcome{OrderOutcome::none};
     std::atomic<bool> _arePeerDisksKnown{false};
     mutable std::mutex _mutex;  // guards the rest
     std::string _peerName;

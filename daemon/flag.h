@@ -31,6 +31,11 @@ inline const FlagName& nameOf(Flag flag) {
     return NAMES.at(static_cast<std::size_t>(flag));
 }
 
+// Whether only the peer's replies tell of it.
+inline bool isReportedByPeer(Flag flag) {
+    return flag == Flag::peerResync || flag == Flag::peerDiskErrors;
+}
+
 inline const char* conditionOf(Flag flag, std::optional<bool> value) {
     return !value ? "unknown" : *value ? nameOf(flag).set : nameOf(flag).clear;
 }

@@ -6,10 +6,6 @@ using TERN::HA::Daemon::NodeAlive;
 using TERN::HA::Daemon::NodeRebooting;
 
 void Health::setPeerAlive(bool isAlive) noexcept {
-    // Also when it was alive before: a peer that did not obey the order counts as rebooting, too.
-    if (isAlive && (_status.getRemoteNodeState() & NodeRebooting) != 0) {
-        _status.delRemoteNodeState(NodeRebooting);
-    }
     if (isAlive == isPeerAlive()) {
         _transitions.found(Flag::peerAlive, isAlive);
         return;
@@ -23,6 +19,14 @@ void Health::setPeerAlive(bool isAlive) noexcept {
     }
     _transitions.found(Flag::peerAlive, isAlive);
     _events.changed(Flag::peerAlive, isAlive);
+}
+
+// Not when it is found alive: one that went down is, until `dead-after` has passed.
+void Health::peerReplied() noexcept {
+    _findings.peerReplied();
+    if ((_status.getRemoteNodeState() & NodeRebooting) != 0) {
+        _status.delRemoteNodeState(NodeRebooting);
+    }
 }
 
 void Health::set(Flag flag, bool value) noexcept {

@@ -16,7 +16,8 @@ namespace ternhad {
 // trace. Thread-safe.
 class Health {
  public:
-    explicit Health(Events& events) : _events(events) {}
+    // `staleAfter`: see Transitions.
+    Health(Events& events, Clock::duration staleAfter) : _events(events), _transitions(staleAfter) {}
 
     TERN::HA::Daemon::Status& status() noexcept { return _status; }
 
@@ -25,6 +26,9 @@ class Health {
     // The outcome of the liveness probes, as Status::setRemoteAlive stores it; do not call before there is
     // one. Waits for nothing but the record's lock, under which nobody waits.
     void setPeerAlive(bool isAlive) noexcept;
+
+    // The peer has replied to a liveness probe: it is no longer being rebooted.
+    void peerReplied() noexcept;
 
     // Any other flag.
     void set(Flag flag, bool value) noexcept;

@@ -36,20 +36,15 @@ bool Listener::listen() {
     _fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
     const sockaddr_un address = addressOf(_path);
     if (_fd < 0 || bind(_fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
-        ::listen(_fd, BACKLOG) != 0 || lstat(_path.c_str(), &info) != 0) {
-        return false;
-    }
-    if (_group && !share()) {
+        ::listen(_fd, BACKLOG) != 0 || lstat(_path.c_str(), &info) != 0 || (_group && !share())) {
+        const int error = errno;
+        close();
+        errno = error;
         return false;
     }
     _device = info.st_dev;
     _inode = info.st_ino;
     return true;
-}
-
-bool Listener::shareWith(gid_t group) {
-    _group = group;
-    return share();
 }
 
 bool Listener::share() const {

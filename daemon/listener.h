@@ -21,8 +21,8 @@ class Listener {
     // when that fails; EEXIST when something else than a socket has the name.
     bool listen();
 
-    // Gives the socket file to a group, which may then connect. False with errno.
-    bool shareWith(gid_t group);
+    // Gives the socket file, which listen() makes, to a group: it may connect. Call first.
+    void shareWith(gid_t group) { _group = group; }
 
     // False once somebody has removed or replaced the socket file.
     bool hasFile() const;
@@ -30,7 +30,8 @@ class Listener {
     // Removes the socket file if it is still this listener's.
     void removeFile() const;
 
-    int fd() const { return _fd; }
+    int fd() const { return _fd; }  // -1 when it does not listen
+    const std::string& path() const { return _path; }
 
  private:
     bool share() const;

@@ -159,7 +159,7 @@ void Prober::receive(FailureDetector& detector) noexcept {
                 }
                 if (reply == _expectedReply) {
                     detector.replyReceived(i);
-                    _health.findings().peerReplied();
+                    _health.peerReplied();
                 }
             }
         } catch (const std::exception&) {

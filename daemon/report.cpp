@@ -11,11 +11,12 @@ namespace ternhad {
 
 namespace {
 
-Json::Value figure(const Findings::Figure& figure) {
-    Json::Value json(Json::objectValue);
-    json["value"] = figure.value ? Json::Value(*figure.value) : Json::Value();
-    json["time"] = figure.value ? Json::Value(secondsOf(figure.time)) : Json::Value();
-    return json;
+constexpr auto MEASUREMENT = std::chrono::seconds(10);  // a ping takes as long
+
+const char* nameOf(Findings::OrderOutcome outcome) {
+    return outcome == Findings::OrderOutcome::wentDown       ? "went-down"
+           : outcome == Findings::OrderOutcome::stillAnswers ? "still-answers"
+                                                             : "was-dead";
 }
 
 Json::Value textOrNull(const std::string& text) {
@@ -35,17 +36,29 @@ std::string nodeName(const Health& health) {
 
 }  // namespace
 
+Json::Value Reporter::figure(const Findings::Figure& figure) const {
+    Json::Value json(Json::objectValue);
+    json["value"] = figure.value ? Json::Value(*figure.value) : Json::Value();
+    json["time"] = figure.value ? Json::Value(secondsOf(figure.time)) : Json::Value();
+    json["stale"] =
+        figure.value && Clock::now() - figure.measured > 3 * _options.heartbeatInterval + MEASUREMENT;
+    return json;
+}
+
 Json::Value Reporter::flag(Flag flag) const {
     const Transitions::State state = _health.transitions().state(flag);
     Json::Value json(Json::objectValue);
     json["value"] = state.value ? Json::Value(*state.value) : Json::Value();
     json["since"] = state.value ? Json::Value(secondsOf(state.since)) : Json::Value();
     json["changes"] = Json::UInt64{state.changes};
+    json["checked"] = state.value ? Json::Value(secondsOf(state.checked)) : Json::Value();
+    json["stale"] = state.isStale;
     return json;
 }
 
 Json::Value Reporter::report() const {
     const Findings& findings = _health.findings();
+    _health.updatePeerRebooting();
     Json::Value report(Json::objectValue);
     report["version"] = 1;
     report["time"] = secondsOf(wallClock());
@@ -67,6 +80,8 @@ Json::Value Reporter::report() const {
     peer["rebooting"] = flag(Flag::peerRebooting);
     peer["resync"] = flag(Flag::peerResync);
     peer["diskErrors"] = flag(Flag::peerDiskErrors);
+    const auto outcome = findings.orderOutcome();
+    peer["orderOutcome"] = outcome == Findings::OrderOutcome::none ? Json::Value() : nameOf(outcome);
     peer["disks"] =
         findings.arePeerDisksKnown() ? _health.status().getErrHandlingDiskRemote() : Json::Value();
 
@@ -74,6 +89,9 @@ Json::Value Reporter::report() const {
     link["interface"] = _options.interface;
     link["connected"] = flag(Flag::drbdConnected);
     link["latency"] = figure(findings.latency());
+    if (findings.latency().value && !_health.isPeerAlive()) {
+        link["latency"]["stale"] = true;
+    }
     link["nonOkRate"] = figure(findings.nonOkRate());
 
     report["record"] = _health.status().toJson();

@@ -20,6 +20,7 @@ class Reporter {
 
  private:
     Json::Value flag(Flag flag) const;
+    Json::Value figure(const Findings::Figure& figure) const;
 
     const Options& _options;
     Health& _health;

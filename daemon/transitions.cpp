@@ -7,18 +7,35 @@
 
 namespace ternhad {
 
+// Whether the peer is alive is never stale: the failure detector takes care that it is not.
+bool Transitions::isStale(Flag flag, const Entry& entry, Clock::time_point now) const noexcept {
+    return entry.state.value && flag != Flag::peerAlive &&
+           (!entry.isConfirmed || now - entry.lastCheck > _staleAfter);
+}
+
 void Transitions::found(Flag flag, bool value) noexcept {
     const std::lock_guard<std::mutex> lock(_mutex);
-    State& state = _states.at(static_cast<std::size_t>(flag));
-    const bool isFirst = !state.value;
-    if (state.value == value) {
+    Entry& entry = entryOf(flag);
+    State& state = entry.state;
+    const auto now = Clock::now();
+    if (isReportedByPeer(flag) && entryOf(Flag::peerAlive).state.value != true) {
+        return;  // it comes too late
+    }
+    const auto old = isStale(flag, entry, now) ? std::nullopt : state.value;
+    state.checked = wallClock();
+    entry.lastCheck = now;
+    entry.isConfirmed = true;
+    if (old == value) {
         return;
     }
-    const Time now = wallClock();
-    _latest.at(_count++ % CAPACITY) = {flag, state.value, value, now};
+    if (flag == Flag::peerAlive && !value) {
+        entryOf(Flag::peerResync).isConfirmed = false;
+        entryOf(Flag::peerDiskErrors).isConfirmed = false;
+    }
+    _latest.at(_count++ % CAPACITY) = {flag, old, value, state.checked};
+    state.changes += state.value == !value ? 1U : 0U;
     state.value = value;
-    state.since = now;
-    state.changes += isFirst ? 0 : 1;
+    state.since = state.checked;
     for (Reader* reader : _readers) {
         if (reader != nullptr) {
             reader->_event.set();
@@ -28,7 +45,10 @@ void Transitions::found(Flag flag, bool value) noexcept {
 
 Transitions::State Transitions::state(Flag flag) const noexcept {
     const std::lock_guard<std::mutex> lock(_mutex);
-    return _states.at(static_cast<std::size_t>(flag));
+    const Entry& entry = _entries.at(static_cast<std::size_t>(flag));
+    State state = entry.state;
+    state.isStale = isStale(flag, entry, Clock::now());
+    return state;
 }
 
 Transitions::Reader::Reader(Transitions& transitions) : _transitions(transitions), _position(0) {

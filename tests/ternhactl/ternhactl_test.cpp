@@ -351,11 +351,18 @@ TEST_F(TernhactlTest, SaysThatTheOutputCannotBeWritten) {
         EXPECT_EQ(result.output, "ternhactl: cannot write to standard output: No space left on device\n")
             << command;
     }
-    EXPECT_EQ(shell("ternhactl check >/dev/full").exitCode, 3);
-    EXPECT_EQ(shell("ternhactl status --watch 0.1 >/dev/full").exitCode, 74);
+    for (const std::string command : {"--version", "check --help", "status --watch 0.1"}) {
+        const auto result = shell("ternhactl " + command + " >/dev/full");
+        EXPECT_EQ(result.exitCode, 74) << command;
+        EXPECT_EQ(result.output, "ternhactl: cannot write to standard output: No space left on device\n")
+            << command;
+    }
+    for (const std::string command : {"check", "check --frobnicate"}) {
+        EXPECT_EQ(shell("ternhactl " + command + " >/dev/full").exitCode, 3) << command;
+    }
     const auto file = shell("ternhactl metrics --output /nowhere/ternha.prom");
     EXPECT_EQ(file.exitCode, 74);
-    EXPECT_EQ(file.output, "ternhactl: cannot write /nowhere/ternha.prom.new: No such file or directory\n");
+    EXPECT_EQ(file.output, "ternhactl: cannot write /nowhere/ternha.prom: No such file or directory\n");
 }
 
 TEST_F(TernhactlTest, ReplacesAFileOfMetricsInOneStep) {
@@ -371,6 +378,9 @@ TEST_F(TernhactlTest, ReplacesAFileOfMetricsInOneStep) {
     EXPECT_EQ(test::resultOf(std::move(collector)).output, "");
     EXPECT_EQ(test::readFile("/tmp/ternha.prom"), shell("ternhactl metrics").output);
     EXPECT_EQ(shell("stat -c %a /tmp/ternha.prom; ls /tmp/*.prom*").output, "644\n/tmp/ternha.prom\n");
+    // Whatever else has a name like it.
+    test::makeDirectories("/tmp/ternha.prom.new");
+    EXPECT_EQ(shell("ternhactl metrics --output /tmp/ternha.prom").exitCode, 0);
 }
 
 TEST_F(TernhactlTest, RejectsAReplyThatIsNotTheDaemons) {
@@ -514,6 +524,15 @@ TEST_F(TernhactlTest, PrintsEventsAsTheyComeUntilTheDaemonEnds) {
                       "ternhactl: ternhad does not answer on /run/ternha/control.sock: the connection was "
                       "closed\n");
     }
+}
+
+TEST_F(TernhactlTest, SaysThatEventsCannotBeWritten) {
+    const RawServer server;
+    std::thread answer([&server] { server.answerOnce(EVENTS); });
+    const auto result = shell("ternhactl events >/dev/full");
+    answer.join();
+    EXPECT_EQ(result.exitCode, 74);
+    EXPECT_EQ(result.output, "ternhactl: cannot write to standard output: No space left on device\n");
 }
 
 TEST_F(TernhactlTest, WaitsUntilAConditionHolds) {

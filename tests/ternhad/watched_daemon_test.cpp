@@ -2,9 +2,12 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <optional>
+
 #include "support/udp.h"
 #include "ternhad/daemon.h"
 #include "ternhad/manager.h"
+#include "ternhad/played_peer.h"
 
 namespace {
 
@@ -47,6 +50,27 @@ TEST_F(WatchedDaemonTest, TellsItsManagerTheStateOfTheNode) {
     EXPECT_THAT(status, ::testing::EndsWith(", not-connected, resync"));
     daemon.signal(SIGTERM);
     EXPECT_TRUE(daemon.waitFor(10s).has_value());
+}
+
+TEST_F(WatchedDaemonTest, TellsItsManagerWhatWasLastKnownOfADeadPeer) {
+    const auto isTold = [this](const std::string& begin, const std::string& end) {
+        return test::eventually(20s, [&, told = manager.told()]() mutable {
+            for (; !told.empty(); told = manager.told()) {
+                if (told.rfind(begin, 0) == 0 && told.size() >= end.size() &&
+                    told.compare(told.size() - end.size(), end.size(), end) == 0) {
+                    return true;
+                }
+            }
+            told = manager.told();
+            return false;
+        });
+    };
+    std::optional<test::PlayedPeer> peer(std::in_place);
+    peer->setReply("is_md_resync", "resync");
+    test::Process daemon = start(1h);
+    EXPECT_TRUE(isTold("STATUS=peer alive since 20", ", peer-resync, not-connected"));
+    peer.reset();
+    EXPECT_TRUE(isTold("STATUS=peer dead since 20", ", not-connected; last known: peer-resync"));
 }
 
 TEST_F(WatchedDaemonTest, ShowsItsProgressAgainAndAgain) {

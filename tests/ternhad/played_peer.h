@@ -1,0 +1,63 @@
+#pragma once
+
+#include <atomic>
+#include <map>
+#include <mutex>
+#include <string>
+#include <thread>
+
+#include "support/udp.h"
+
+namespace test {
+
+// The other end of the peer protocol, at 127.0.0.2, with replies that a test sets. Well at first.
+class PlayedPeer {
+ public:
+    PlayedPeer() : _thread([this] { serve(); }) {}
+    ~PlayedPeer() {
+        _isStopping = true;
+        UdpSocket("127.0.0.2").send("", "127.0.0.2", 7499);
+        _thread.join();
+    }
+
+    PlayedPeer(const PlayedPeer&) = delete;
+    PlayedPeer& operator=(const PlayedPeer&) = delete;
+
+    void setReply(const std::string& request, const std::string& reply) {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        _replies[request] = reply;
+    }
+
+    // From now on the request gets no reply.
+    void ignore(const std::string& request) {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        _replies.erase(request);
+    }
+
+ private:
+    void serve() {
+        UdpSocket socket("127.0.0.2", 7499);
+        while (!_isStopping) {
+            const auto request = socket.receive(std::chrono::minutes(1));
+            if (!request) {
+                continue;
+            }
+            const std::lock_guard<std::mutex> lock(_mutex);
+            const auto reply = _replies.find(request->bytes);
+            if (reply != _replies.end()) {
+                socket.send(reply->second, request->address, request->port);
+            }
+        }
+    }
+
+    std::mutex _mutex;
+    std::map<std::string, std::string> _replies = {
+        {"is_alive", "alive"},
+        {"is_md_resync", "not_resync"},
+        {"remote_hostname", "node-b\n"},
+        {"is_disk_err_handling", R"({"errHandlingDisk":[],"isDiskErrHandling":false})"}};
+    std::atomic<bool> _isStopping{false};
+    std::thread _thread;
+};
+
+}  // namespace test

@@ -1,0 +1,99 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "ternhad/machine.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::EndsWith;
+using ::testing::HasSubstr;
+
+class RebootOrderTest : public ::testing::Test {
+ protected:
+    RebootOrderTest() { test::connect(a.node, "10.0.0.1", b.node, "10.0.0.2"); }
+
+    test::CommandResult order() { return a.node.run({TERNHACTL, "reboot-peer", "--yes"}); }
+
+    bool eventuallyLogs(const std::string& text) {
+        return test::eventually(10s, [&] { return a.log().find(text + "\n") != std::string::npos; });
+    }
+
+    test::Machine a{"node-a", "10.0.0.1", "10.0.0.2"};
+    test::Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
+};
+
+// The peer's kernel is a file here: it takes the order, and nothing happens.
+TEST_F(RebootOrderTest, APeerThatIgnoresItWasNotRebooted) {
+    a.start();
+    b.start();
+    ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));
+    test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
+    EXPECT_TRUE(eventuallyLogs("Reboot of the peer ordered, which is alive"));
+    // Nobody else waits for it.
+    EXPECT_TRUE(test::eventually(10s, [this] {
+        return a.node.run({TERNHACTL, "rebooting"}).output == "yes\n";
+    }));
+    EXPECT_THAT(a.node.run({TERNHACTL, "check"}).output, HasSubstr("peer being rebooted"));
+    const auto second = order();
+    EXPECT_EQ(second.exitCode, 1);
+    EXPECT_EQ(second.output, "The peer is being rebooted already. Nothing done.\n");
+
+    const auto result = test::resultOf(std::move(ordered));
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_THAT(result.output, EndsWith("The peer still answers: it was not rebooted.\n"));
+    EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it still answers, not rebooted"));
+    EXPECT_TRUE(test::eventually(10s, [this] {
+        return a.node.run({TERNHACTL, "rebooting"}).output == "no\n";
+    }));
+}
+
+TEST_F(RebootOrderTest, APeerThatObeysWentDownAndADeadOneWasDeadBefore) {
+    a.start();
+    b.start();
+    ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));
+    test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
+    EXPECT_TRUE(test::eventually(20s, [this] {
+        return test::exists(b.node.path("/proc/sysrq-trigger")) &&
+               test::readFile(b.node.path("/proc/sysrq-trigger")) == "b";
+    }));
+    b.daemon->signal(SIGKILL);
+    const auto result = test::resultOf(std::move(ordered));
+    EXPECT_EQ(result.exitCode, 0);
+    EXPECT_THAT(result.output,
+                EndsWith("The peer went down. It counts as rebooting until it answers again.\n"));
+    EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it went down"));
+
+    const auto again = order();
+    EXPECT_EQ(again.exitCode, 1);
+    EXPECT_THAT(again.output,
+                EndsWith("The peer was already dead: nobody knows whether it heard the order.\n"));
+    EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it was already dead"));
+}
+
+// Long before it counts as dead.
+TEST_F(RebootOrderTest, APeerThatObeysWentDownAlthoughItIsNotDeadYet) {
+    a.start({"--dead-after", "60"});
+    b.start();
+    ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));
+    test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
+    EXPECT_TRUE(test::eventually(20s, [this] {
+        return test::exists(b.node.path("/proc/sysrq-trigger")) &&
+               test::readFile(b.node.path("/proc/sysrq-trigger")) == "b";
+    }));
+    b.daemon->signal(SIGKILL);
+    const auto result = test::resultOf(std::move(ordered));
+    EXPECT_EQ(result.exitCode, 0);
+    EXPECT_THAT(result.output,
+                EndsWith("The peer went down. It counts as rebooting until it answers again.\n"));
+    EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it went down"));
+    EXPECT_TRUE(a.sees("isRemoteAlive", true));
+    const auto isRebooting = [this](const std::string& answer) {
+        return a.node.run({TERNHACTL, "rebooting"}).output == answer;
+    };
+    EXPECT_FALSE(test::eventually(1s, [&] { return !isRebooting("yes\n"); }));
+    b.start();
+    EXPECT_TRUE(test::eventually(30s, [&] { return isRebooting("no\n"); }));
+}
+
+}  // namespace

@@ -1,0 +1,95 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <sstream>
+
+#include "support/sandbox.h"
+#include "ternhad/daemon.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::HasSubstr;
+using ::testing::Not;
+
+constexpr char STATUS_SOCKET[] = "/run/ternha/status.sock";
+
+class StatusSocketTest : public ::testing::Test {
+ protected:
+    static test::Process start(const std::string& statusSocket = STATUS_SOCKET) {
+        test::Process daemon(test::daemonArguments(
+            "127.0.0.1", "127.0.0.2", "lo", {"--status-socket", statusSocket, "--status-group", "daemon"}));
+        EXPECT_TRUE(test::eventually(10s, [] { return !test::statusAt().isNull(); })) << daemon.error();
+        return daemon;
+    }
+
+    // What ternhactl prints on standard output and error, and its exit code, for a user and a group of the
+    // same number; 1 is "daemon".
+    static test::CommandResult runAs(int id, const std::string& arguments) {
+        const std::string user = std::to_string(id);
+        return test::run({"/bin/sh", "-c",
+                          "exec 2>&1; setpriv --reuid " + user + " --regid " + user +
+                              " --clear-groups " TERNHACTL " " + arguments});
+    }
+};
+
+TEST_F(StatusSocketTest, ServesItsGroupAndTakesNoOrders) {
+    auto daemon = start();
+    const std::string socket = std::string("--socket ") + STATUS_SOCKET;
+    EXPECT_THAT(runAs(1, socket + " check").output, HasSubstr("TERNHA "));
+    EXPECT_EQ(runAs(1, socket + " status --json").exitCode, 0);
+    EXPECT_EQ(runAs(1, socket + " wait not-connected --timeout 30").exitCode, 0);
+    const auto order = runAs(1, socket + " reboot-peer --yes");
+    EXPECT_EQ(order.exitCode, 3);
+    EXPECT_THAT(order.output, HasSubstr("refused: this socket takes no orders\n"));
+    EXPECT_THAT(runAs(1, "status").output, HasSubstr("Permission denied"));
+    EXPECT_THAT(runAs(2, socket + " status").output, HasSubstr("Permission denied"));
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("Reboot of the peer ordered")));
+    daemon.signal(SIGTERM);
+    EXPECT_TRUE(daemon.waitFor(10s).has_value());
+    EXPECT_FALSE(test::exists(STATUS_SOCKET));
+}
+
+TEST_F(StatusSocketTest, ItsDirectoryLetsTheGroupThroughAndNobodyListIt) {
+    auto daemon = start();
+    EXPECT_EQ(test::run({"stat", "-c", "%a", "/run/ternha"}).output, "711\n");
+    daemon.signal(SIGTERM);
+    EXPECT_TRUE(daemon.waitFor(10s).has_value());
+    // One that is not the daemon's stays as it is; one that it makes is passable, too.
+    ASSERT_EQ(test::run({"mkdir", "-m", "700", "/run/private"}).exitCode, 0);
+    for (const auto& [directory, mode] : {std::pair("/run/private", "700\n"), {"/run/monitoring", "711\n"}}) {
+        auto another = start(directory + std::string("/status.sock"));
+        EXPECT_EQ(test::run({"stat", "-c", "%a", directory}).output, mode) << directory;
+        another.signal(SIGTERM);
+        EXPECT_TRUE(another.waitFor(10s).has_value());
+    }
+}
+
+TEST_F(StatusSocketTest, TheDaemonRunsWithoutItUntilItCanBeMade) {
+    auto daemon = start("/run/missing/below/status.sock");
+    EXPECT_THAT(daemon.error(),
+                HasSubstr("cannot bind the status socket /run/missing/below/status.sock: No such "
+                          "file or directory; trying again\n"));
+    test::makeDirectories("/run/missing/below");
+    EXPECT_TRUE(
+        test::eventually(20s, [] { return !test::statusAt("/run/missing/below/status.sock").isNull(); }));
+    EXPECT_EQ(test::run({"stat", "-c", "%a %G", "/run/missing/below/status.sock"}).output, "660 daemon\n");
+    EXPECT_FALSE(test::statusAt().isNull());
+}
+
+TEST_F(StatusSocketTest, ItsFollowersTakeNoPlaceOfRoots) {
+    auto daemon = start();
+    std::vector<test::Process> followers;
+    for (int i = 0; i < 16; ++i) {
+        followers.emplace_back(
+            std::vector<std::string>{TERNHACTL, "--socket", STATUS_SOCKET, "wait", "peer-alive"});
+    }
+    EXPECT_TRUE(test::eventually(20s, [] {
+        return runAs(1, std::string("--socket ") + STATUS_SOCKET + " wait peer-alive --timeout 0.2")
+                   .output.find("refused: too many clients follow the events\n") != std::string::npos;
+    }));
+    EXPECT_EQ(runAs(0, "wait not-connected --timeout 20").exitCode, 0);
+    EXPECT_EQ(runAs(0, "wait peer-alive --timeout 0.2").exitCode, 1);
+}
+
+}  // namespace
