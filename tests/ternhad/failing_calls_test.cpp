@@ -9,6 +9,7 @@
 #include <sstream>
 #include <thread>
 
+#include "ternhad/control_tool.h"
 #include "ternhad/sick_machine.h"
 
 namespace {
@@ -176,6 +177,17 @@ TEST_F(FailingCallsTest, ALogKeeperThatHangsIsReplacedAndLeftBehind) {
     test::removeTree("/tmp/an-hour-later");
     expectEndInTime();
     EXPECT_EQ(kill(keeper, 0), 0);
+}
+
+// It is looked at before it is read, and an order must not slip through between the two.
+TEST_F(FailingCallsTest, AnOrderThatComesInPiecesIsRefusedByTheStatusSocket) {
+    start({"--status-socket", "/run/ternha/status.sock", "--status-group", "daemon"});
+    test::writeFile("/tmp/slow-client", "");
+    const auto order = test::control("--socket /run/ternha/status.sock reboot-peer --yes");
+    EXPECT_EQ(order.exitCode, 3);
+    EXPECT_THAT(order.output, HasSubstr(": the connection was closed without a reply\n"));
+    EXPECT_FALSE(peer->isOrdered());
+    EXPECT_FALSE(test::statusAt("/run/ternha/status.sock").isNull());
 }
 
 }  // namespace

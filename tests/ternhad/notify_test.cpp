@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <csignal>
 
 #include "support/sandbox.h"
@@ -20,10 +21,12 @@ class NotifyTest : public ::testing::Test {
  protected:
     NotifyTest() { setResync(false); }
 
-    static test::Process start(const std::string& script) {
+    static test::Process start(const std::string& script, const std::string& checkInterval = "0.2") {
         test::writeFile(PROGRAM, "#!/bin/bash\n" + script);
         EXPECT_EQ(chmod(PROGRAM, 0755), 0);
-        test::Process daemon(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo", {"--notify", PROGRAM}));
+        auto arguments = test::daemonArguments("127.0.0.1", "127.0.0.2", "lo", {"--notify", PROGRAM});
+        std::replace(arguments.begin(), arguments.end(), std::string("0.2"), checkInterval);
+        test::Process daemon(arguments);
         EXPECT_TRUE(test::eventually(10s, [] { return !test::statusAt().isNull(); })) << daemon.error();
         return daemon;
     }
@@ -88,6 +91,26 @@ TEST_F(NotifyTest, AProgramThatFailsOrHangsIsLoggedAndDelaysNothing) {
     EXPECT_TRUE(test::eventually(10s, [] { return !test::statusAt()["isMDResync"].asBool(); }));
     EXPECT_TRUE(eventuallyLogs("Ended /tmp/on-change for resync, which took more than 30 seconds\n", 60s));
     EXPECT_EQ(kill(std::stoi(result()), 0), -1);
+}
+
+TEST_F(NotifyTest, ChangesThatASlowProgramMissesAreLogged) {
+    // The program waits until more has changed than the queue holds: 256, of two flags.
+    auto daemon = start("until [ -e /tmp/go ]; do sleep 0.05; done\n", "0.05");
+    const auto change = [](bool isTrouble) {
+        setResync(isTrouble);
+        test::writeFile("/proc/drbd", isTrouble ? "" : " 0: cs:Connected ro:Primary/Secondary\n");
+        return test::eventually(20s, [=] {
+            const Json::Value status = test::statusAt();
+            return status["isMDResync"].asBool() == isTrouble &&
+                   status["isDRBDConnect"].asBool() != isTrouble;
+        });
+    };
+    for (int i = 0; i < 140; ++i) {
+        ASSERT_TRUE(change(i % 2 == 0));
+    }
+    test::writeFile("/tmp/go", "");
+    EXPECT_TRUE(eventuallyLogs("Changes not notified of: "));
+    EXPECT_TRUE(eventuallyLogs("Ran /tmp/on-change for connected: exit code 0\n"));
 }
 
 TEST_F(NotifyTest, TheDaemonEndsInTimeWhileTheProgramRuns) {

@@ -8,20 +8,17 @@
 
 #include "support/sandbox.h"
 #include "support/udp.h"
+#include "ternhad/control_tool.h"
 #include "ternhad/machine.h"
 #include "ternhad/played_peer.h"
 
 namespace {
 
 using namespace std::chrono_literals;
+using test::control;
 using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::Not;
-
-// What ternhactl prints on standard output and error, and its exit code.
-test::CommandResult control(const std::string& arguments) {
-    return test::run({"/bin/sh", "-c", "exec 2>&1; " TERNHACTL " " + arguments});
-}
 
 Json::Value report() {
     Json::Value json;

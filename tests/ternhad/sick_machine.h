@@ -36,6 +36,9 @@ class Peer {
     // From now on it replies to liveness probes only.
     void beReticent() { _isReticent = true; }
 
+    // It was ordered to reboot.
+    bool isOrdered() const { return _isOrdered; }
+
     Peer(const Peer&) = delete;
     Peer& operator=(const Peer&) = delete;
 
@@ -44,6 +47,7 @@ class Peer {
         UdpSocket socket("127.0.0.2", 7499);
         while (!_isOver) {
             const auto request = socket.receive(10ms);
+            _isOrdered = _isOrdered || (request && request->bytes == "reboot_remote");
             if (request && (!_isReticent || request->bytes == "is_alive")) {
                 const std::string reply = request->bytes == "is_alive" ? "alive"
                                           : request->bytes == "is_disk_err_handling"
@@ -56,6 +60,7 @@ class Peer {
 
     std::atomic<bool> _isOver{false};
     std::atomic<bool> _isReticent{false};
+    std::atomic<bool> _isOrdered{false};
     std::thread _thread;
 };
 

@@ -4,20 +4,17 @@
 #include <optional>
 
 #include "support/sandbox.h"
+#include "ternhad/control_tool.h"
 #include "ternhad/daemon.h"
 #include "ternhad/played_peer.h"
 
 namespace {
 
 using namespace std::chrono_literals;
+using test::control;
 using ::testing::ContainsRegex;
 using ::testing::HasSubstr;
 using ::testing::Not;
-
-// What ternhactl prints on standard output and error, and its exit code.
-test::CommandResult control(const std::string& arguments) {
-    return test::run({"/bin/sh", "-c", "exec 2>&1; " TERNHACTL " " + arguments});
-}
 
 bool eventuallyPrints(const std::string& arguments, const std::string& text) {
     return test::eventually(20s, [&] { return control(arguments).output.find(text) != std::string::npos; });
