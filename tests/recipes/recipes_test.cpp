@@ -3,8 +3,10 @@
 #include <sys/stat.h>
 
 #include <filesystem>
+#include <regex>
 
 #include "recipes/programs.h"
+#include "support/json.h"
 #include "ternhad/machine.h"
 
 namespace {
@@ -212,6 +214,56 @@ TEST_F(RecipesTest, PromtoolAcceptsMetricsAndRules) {
     }
 }
 
+// The value of a setting in one of the package's units.
+std::string setting(const std::string& unit, const std::string& name) {
+    for (const std::string& line : test::lines(test::readFile(PROJECT_DIR "/packaging/systemd/" + unit))) {
+        if (line.rfind(name + '=', 0) == 0) {
+            return std::regex_replace(line.substr(name.size() + 1), std::regex("@[A-Z_]+@"), "/usr/sbin");
+        }
+    }
+    return {};
+}
+
+TEST_F(RecipesTest, TheNodeExporterServesWhatTheTimersServiceWrites) {
+    Cluster cluster;
+    test::Machine& a = cluster.a;
+    ASSERT_TRUE(cluster.start());
+    ASSERT_EQ(a.node.run({"mkdir", "-p", "/var/lib/prometheus/node-exporter"}).exitCode, 0);
+    // Debian's reads that directory unless told otherwise.
+    test::Process exporter = a.node.start({"prometheus-node-exporter", "--web.listen-address=127.0.0.1:9100",
+                                           "--collector.disable-defaults", "--collector.textfile"});
+    const auto serves = [&a](const std::string& line) {
+        return test::eventually(30s, [&] {
+            const auto answer = a.node.run({"/bin/bash", "-c",
+                                            "exec 3<>/dev/tcp/127.0.0.1/9100; printf 'GET /metrics "
+                                            "HTTP/1.0\\r\\n\\r\\n' >&3; cat <&3"});
+            return answer.output.find('\n' + line + '\n') != std::string::npos;
+        });
+    };
+    const std::string service = setting("ternha-metrics.service.in", "ExecStart");
+    ASSERT_THAT(service, StartsWith("/usr/sbin/ternhactl metrics "));
+    EXPECT_EQ(a.node.run({"/bin/sh", "-c", service}).exitCode, 0);
+    EXPECT_TRUE(serves("ternha_peer_alive 1")) << exporter.error();
+    EXPECT_TRUE(serves("node_textfile_scrape_error 0"));
+    a.daemon->signal(SIGKILL);
+    EXPECT_EQ(a.node.run({"/bin/sh", "-c", service}).exitCode, 3);
+    EXPECT_TRUE(serves("ternha_up 0"));
+}
+
+TEST_F(RecipesTest, TheDashboardShowsFiguresThatThereAre) {
+    Cluster cluster;
+    ASSERT_TRUE(cluster.start());
+    const auto metrics = [&cluster] { return cluster.a.node.run({"ternhactl", "metrics"}).output; };
+    EXPECT_TRUE(test::eventually(
+        20s, [&] { return metrics().find("ternha_heartbeat_latency_seconds ") != std::string::npos; }));
+    const std::string dashboard = test::readFile(PROJECT_DIR "/packaging/monitoring/ternha-dashboard.json");
+    EXPECT_TRUE(test::parsed(dashboard)["panels"].isArray());
+    const std::regex name("ternha_[a-z_]+");
+    for (std::sregex_iterator match(dashboard.begin(), dashboard.end(), name), end; match != end; ++match) {
+        EXPECT_THAT(metrics(), HasSubstr("# HELP " + match->str() + ' '));
+    }
+}
+
 constexpr char COROSYNC[] = R"(totem {
     version: 2
     cluster_name: ternha
@@ -266,7 +318,8 @@ TEST_F(RecipesTest, PacemakerKnowsWhetherTheNodeIsFit) {
                          }))
         << corosync.error() << pacemaker.error();
 
-    ASSERT_TRUE(cluster.start({"--notify", "/usr/local/sbin/ternha-attribute"}));
+    ASSERT_TRUE(cluster.start());
+    test::Process attribute = a.node.start({"/usr/local/sbin/ternha-attribute"});
     const auto isFit = [&a](const std::string& value) {
         return test::eventually(60s, [&] {
             return a.node.run({"attrd_updater", "-n", "ternha-fit", "-Q"})
@@ -278,6 +331,9 @@ TEST_F(RecipesTest, PacemakerKnowsWhetherTheNodeIsFit) {
     EXPECT_TRUE(isFit("0"));
     a.write(SYNC_ACTION, "idle\n");
     EXPECT_TRUE(isFit("1"));
+    a.daemon->signal(SIGTERM);
+    EXPECT_TRUE(isFit("0"));
+    EXPECT_TRUE(attribute.waitFor(20s).has_value());  // and its service starts it again
     pacemaker.signal(SIGTERM);
     EXPECT_TRUE(pacemaker.waitFor(60s).has_value());
 }
