@@ -91,7 +91,7 @@ TEST_F(RebootOrderTest, APeerThatObeysWentDownAlthoughItIsNotDeadYet) {
     const auto isRebooting = [this](const std::string& answer) {
         return a.node.run({TERNHACTL, "rebooting"}).output == answer;
     };
-    EXPECT_FALSE(test::eventually(1s, [&] { return !isRebooting("yes\n"); }));
+    EXPECT_FALSE(test::eventually(7s, [&] { return !isRebooting("yes\n"); }));
     b.start();
     EXPECT_TRUE(test::eventually(30s, [&] { return isRebooting("no\n"); }));
 }
