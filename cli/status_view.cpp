@@ -100,7 +100,7 @@ void addPeer(View& view, const Report& report, double now) {
     } else {
         std::string state =
             (report.peerAlive.is(true) ? "alive" : "dead") + sinceOf(report.peerAlive.since, now);
-        if (report.peerAlive.is(false) && report.lastReply) {
+        if (report.lastReply && (report.peerAlive.is(false) || report.peerResync.isStale)) {
             state += ", last reply " + duration(now - *report.lastReply) + " ago";
         }
         view.row("state", troubleIf(report.peerAlive.is(false)), state);
