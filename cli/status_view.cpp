@@ -175,10 +175,12 @@ std::string disksOf(const std::string& owner, const Report::Flag& flag, std::vec
     } else if (flag.isStale && names.empty()) {
         names = {"none"};
     }
+    const std::string begin =
+        owner + (flag.value && flag.isStale ? ", " + lastKnown(flag.checked, now) : "") + ": ";
     std::string text;
     for (const std::string& name : names) {
-        text += owner + (flag.value && flag.isStale ? ", " + lastKnown(flag.checked, now) : "") + ": " +
-                name + '\n';
+        text += begin;
+        text += name + '\n';
     }
     return text;
 }

@@ -3,6 +3,7 @@
 #include <atomic>
 #include <map>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <thread>
 
@@ -13,7 +14,7 @@ namespace test {
 // The other end of the peer protocol, at 127.0.0.2, with replies that a test sets. Well at first.
 class PlayedPeer {
  public:
-    PlayedPeer() : _thread([this] { serve(); }) {}
+    PlayedPeer() : _socket("127.0.0.2", 7499), _thread([this] { serve(); }) {}
     ~PlayedPeer() {
         _isStopping = true;
         UdpSocket("127.0.0.2").send("", "127.0.0.2", 7499);
@@ -34,18 +35,32 @@ class PlayedPeer {
         _replies.erase(request);
     }
 
+    // At the next request of this kind it falls silent.
+    void dieAt(const std::string& request) {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        _lastRequest = request;
+    }
+
+    // The reply to that request, which was under way for so long.
+    void replyLate(const std::string& reply) {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        _socket.send(reply, _unanswered.value().address, _unanswered.value().port);
+    }
+
  private:
     void serve() {
-        UdpSocket socket("127.0.0.2", 7499);
         while (!_isStopping) {
-            const auto request = socket.receive(std::chrono::minutes(1));
+            const auto request = _socket.receive(std::chrono::minutes(1));
             if (!request) {
                 continue;
             }
             const std::lock_guard<std::mutex> lock(_mutex);
+            if (!_unanswered && request->bytes == _lastRequest) {
+                _unanswered = request;
+            }
             const auto reply = _replies.find(request->bytes);
-            if (reply != _replies.end()) {
-                socket.send(reply->second, request->address, request->port);
+            if (reply != _replies.end() && !_unanswered) {
+                _socket.send(reply->second, request->address, request->port);
             }
         }
     }
@@ -56,7 +71,10 @@ class PlayedPeer {
         {"is_md_resync", "not_resync"},
         {"remote_hostname", "node-b\n"},
         {"is_disk_err_handling", R"({"errHandlingDisk":[],"isDiskErrHandling":false})"}};
+    std::string _lastRequest;
+    std::optional<Datagram> _unanswered;
     std::atomic<bool> _isStopping{false};
+    UdpSocket _socket;
     std::thread _thread;
 };
 

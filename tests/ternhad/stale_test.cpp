@@ -68,4 +68,13 @@ TEST_F(StaleTest, WhatAnAlivePeerNoLongerTellsIsLastKnown) {
     EXPECT_THAT(control("metrics").output, HasSubstr("\nternha_peer_md_resync 0\n"));
 }
 
+TEST_F(StaleTest, AReplyThatComesAfterThePeersDeathTellsNothingAnyMore) {
+    peer->dieAt("is_md_resync");
+    ASSERT_EQ(control("wait peer-dead --timeout 20").exitCode, 0);
+    peer->replyLate("resync");
+    EXPECT_EQ(control("wait peer-resync --timeout 0.5").exitCode, 1);
+    peer->replyLate("not_resync");
+    EXPECT_EQ(control("wait peer-no-resync --timeout 0.5").exitCode, 1);
+}
+
 }  // namespace
