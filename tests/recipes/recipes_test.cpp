@@ -181,7 +181,6 @@ TEST_F(NrpeTest, RunsTheCheckOnTheStatusSocket) {
     Cluster cluster;
     test::Machine& a = cluster.a;
     addUser(a, "nagios", "nagios", "990");
-    ASSERT_EQ(a.node.run({"mkdir", "-m", "711", "/run/ternha"}).exitCode, 0);
     ASSERT_TRUE(cluster.start({"--status-socket", "/run/ternha/status.sock", "--status-group", "nagios"}));
     const std::string configuration = test::recipe("/etc/nagios/nrpe.d/ternha-status.cfg");
     const auto good = ask(cluster, configuration);

@@ -16,7 +16,6 @@ namespace {
 
 using namespace std::chrono_literals;
 using test::control;
-using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::Not;
 
