@@ -21,18 +21,22 @@ void Transitions::found(Flag flag, bool value) noexcept {
     if (isReportedByPeer(flag) && entryOf(Flag::peerAlive).state.value != true) {
         return;  // it comes too late
     }
-    const auto old = isStale(flag, entry, now) ? std::nullopt : state.value;
+    const bool wasStale = isStale(flag, entry, now);
     state.checked = wallClock();
     entry.lastCheck = now;
     entry.isConfirmed = true;
-    if (old == value) {
+    if (state.value == value && !wasStale) {
         return;
     }
     if (flag == Flag::peerAlive && !value) {
         entryOf(Flag::peerResync).isConfirmed = false;
         entryOf(Flag::peerDiskErrors).isConfirmed = false;
     }
-    _latest.at(_count++ % CAPACITY) = {flag, old, value, state.checked};
+    Transition& transition = _latest.at(_count++ % CAPACITY);
+    transition = {flag, state.value, value, state.checked};
+    if (wasStale) {
+        transition.old.reset();
+    }
     state.changes += state.value == !value ? 1U : 0U;
     state.value = value;
     state.since = state.checked;
