@@ -54,8 +54,7 @@ bool complain(const std::string& what, int error) {
 Daemon::Daemon(const Options& options, InstanceLock& lock)
     : _options(options),
       _lock(lock),
-      _health(_events,
-              std::chrono::duration_cast<Clock::duration>(3 * options.checkInterval) + LOST_REPLIES),
+      _health(_events, std::chrono::duration_cast<Clock::duration>(3 * options.checkInterval) + LOST_REPLIES),
       _logKeeper(options, _health, _events),
       _reboot(_events, _shutdown),
       _peerServer(_health, _events, _reboot, _shutdown, _progress),
