@@ -85,8 +85,8 @@ bool PeerWatcher::isReportCut() const {
 
 void PeerWatcher::requestResync() {
     const bool isResync = IsRemoteMDResync()();
-    const bool isNews = _health.transitions().state(Flag::peerResync).value != isResync;
-    if (_shutdown.isRequested() || (!isResync && isNews && replyTo<IsRemoteMDResync>() != "not_resync")) {
+    // "No resync" is also what the check makes of no reply, which confirms nothing.
+    if (_shutdown.isRequested() || (!isResync && replyTo<IsRemoteMDResync>() != "not_resync")) {
         return;
     }
     _health.set(Flag::peerResync, isResync);
