@@ -13,7 +13,7 @@ using namespace std::string_literals;
 using TERN::HA::Daemon::IsRemoteAlive;
 using TERN::HA::Daemon::Status;
 using test::FakePeer;
-using test::kPeerAddress;
+using test::PEER_ADDRESS;
 using ::testing::ElementsAre;
 
 namespace {
@@ -22,33 +22,33 @@ class AliveTest : public test::SandboxTest {
  protected:
     void SetUp() override {
         SandboxTest::SetUp();
-        remoteIP(kPeerAddress);
+        remoteIP(PEER_ADDRESS);
     }
 
     IsRemoteAlive isRemoteAlive;
 };
 
-TEST_F(AliveTest, APeerThatAnswersAliveIsAlive) {
+TEST_F(AliveTest, PeerReplyingAliveIsAlive) {
     FakePeer peer("alive");
     EXPECT_TRUE(isRemoteAlive());
-    EXPECT_THAT(peer.questions(), ElementsAre("is_alive"));
+    EXPECT_THAT(peer.requests(), ElementsAre("is_alive"));
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(AliveTest, AsksThroughTheBaseToo) {
+TEST_F(AliveTest, CallThroughBaseClassSendsTheRequest) {
     FakePeer peer("no");
     EnvCheck& check = isRemoteAlive;
     EXPECT_FALSE(check());
-    EXPECT_THAT(peer.questions(), ElementsAre("is_alive"));
+    EXPECT_THAT(peer.requests(), ElementsAre("is_alive"));
 }
 
-TEST_F(AliveTest, BytesAfterAZeroByteDoNotCount) {
+TEST_F(AliveTest, ReplyEndsAtFirstZeroByte) {
     FakePeer peer("alive\0?"s);
     EXPECT_TRUE(isRemoteAlive());
 }
 
-TEST_F(AliveTest, ASilentPeerIsNotAliveAfterOneQuestionAndThreeSeconds) {
-    test::UdpSocket peer(kPeerAddress, test::kPeerPort);
+TEST_F(AliveTest, NoReplyWithinThreeSecondsMeansNotAlive) {
+    test::UdpSocket peer(PEER_ADDRESS, test::PEER_PORT);
     const test::Stopwatch watch;
     EXPECT_FALSE(isRemoteAlive());
     EXPECT_GE(watch.elapsed(), 3s);
@@ -57,7 +57,7 @@ TEST_F(AliveTest, ASilentPeerIsNotAliveAfterOneQuestionAndThreeSeconds) {
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(AliveTest, WithoutASocketThePeerIsNotAliveAndOnlyTheExchangeLogs) {
+TEST_F(AliveTest, SocketFailureMeansNotAlive) {
     FakePeer peer("alive");
     {
         const test::FailingCall failing("socket", EMFILE);
@@ -67,7 +67,7 @@ TEST_F(AliveTest, WithoutASocketThePeerIsNotAliveAndOnlyTheExchangeLogs) {
                 ElementsAre(test::LogLine("env_check.cpp", "Failed to start socket client")));
 }
 
-TEST_F(AliveTest, AnswersAliveWhateverTheStatus) {
+TEST_F(AliveTest, RepliesAliveWhateverTheStatus) {
     Status status;
     EXPECT_EQ(isRemoteAlive.handle(status), "alive");
     status.isMDResync = true;
@@ -78,16 +78,16 @@ TEST_F(AliveTest, AnswersAliveWhateverTheStatus) {
     EXPECT_EQ(test::bufferText(), "");
 }
 
-class OtherAnswerTest : public AliveTest, public ::testing::WithParamInterface<std::string> {};
+class OtherReplyTest : public AliveTest, public ::testing::WithParamInterface<std::string> {};
 
-TEST_P(OtherAnswerTest, IsNotAliveAndNotLogged) {
+TEST_P(OtherReplyTest, IsNotAliveAndNotLogged) {
     FakePeer peer(GetParam());
     EXPECT_FALSE(isRemoteAlive());
-    EXPECT_THAT(peer.questions(), ElementsAre("is_alive"));
+    EXPECT_THAT(peer.requests(), ElementsAre("is_alive"));
     EXPECT_EQ(test::bufferText(), "");
 }
 
-INSTANTIATE_TEST_SUITE_P(Answers, OtherAnswerTest,
+INSTANTIATE_TEST_SUITE_P(Replies, OtherReplyTest,
                          ::testing::Values("", "Alive", "ALIVE", "alive\n", "alive\r\n", "alive ", " alive",
                                            "aliv", "alivee", "dead", "\0alive"s, "Undefine",
                                            "alive" + std::string(95, 'e')));

@@ -28,19 +28,19 @@ class AtaTest : public test::SandboxTest {
         std::filesystem::create_symlink(".." + path.substr(4), "/sys/block/" + device);
     }
 
-    Json::Value disks{"as it was"};
+    Json::Value disks{"unchanged"};
 };
 
-TEST_F(AtaTest, WithoutPortsTheListIsLeftAlone) {
+TEST_F(AtaTest, NoPortsLeaveTheListUnchanged) {
     test::writeFile("/sys/class/ata_port/xata1/error_handling", "1\n");  // only names that begin so count
     EXPECT_FALSE(isDiskErrHandling(disks));
-    EXPECT_EQ(disks, "as it was");
+    EXPECT_EQ(disks, "unchanged");
     EXPECT_THAT(
         test::daemonLogMessages(),
         ElementsAre(test::LogLine("checker.cpp", "Failed to set globBuf from /sys/class/ata_port/ata*")));
 }
 
-TEST_F(AtaTest, WithoutTroubleTheListIsEmpty) {
+TEST_F(AtaTest, NoErrorHandlingYieldsAnEmptyList) {
     addPort("ata1", "0\n");
     addDisk("ata1", "sda");
     EXPECT_FALSE(isDiskErrHandling(disks));
@@ -48,7 +48,7 @@ TEST_F(AtaTest, WithoutTroubleTheListIsEmpty) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(AtaTest, AllDisksInTroubleAreListedInTheOrderOfTheirPaths) {
+TEST_F(AtaTest, DisksUnderErrorHandlingAreListedInPathOrder) {
     addPort("ata2", "1\n");
     addDisk("ata2", "sda");
     addPort("ata10", "1\n");
@@ -62,7 +62,7 @@ TEST_F(AtaTest, AllDisksInTroubleAreListedInTheOrderOfTheirPaths) {
 class ErrorHandlingTest : public AtaTest,
                           public ::testing::WithParamInterface<std::pair<const char*, bool>> {};
 
-TEST_P(ErrorHandlingTest, OnlyAFirstLineOfOneCounts) {
+TEST_P(ErrorHandlingTest, OnlyFirstLineEqualToOneCounts) {
     addPort("ata1", GetParam().first);
     addDisk("ata1", "sda");
     EXPECT_EQ(isDiskErrHandling(disks), GetParam().second);
@@ -74,7 +74,7 @@ INSTANTIATE_TEST_SUITE_P(Values, ErrorHandlingTest,
                                            std::pair("0\n1\n", false), std::pair("1 \n", false),
                                            std::pair("11\n", false), std::pair("", false)));
 
-TEST_F(AtaTest, APortWhoseDiskHasNoNameCountsForNothing) {
+TEST_F(AtaTest, PortWithoutDiskNameIsIgnored) {
     addPort("ata1", "1\n");
     addPort("ata2", "1\n");
     addDisk("ata2", "sda");
@@ -85,7 +85,7 @@ TEST_F(AtaTest, APortWhoseDiskHasNoNameCountsForNothing) {
                                           "Failed to get dev name by ata path: /sys/class/ata_port/ata1")));
 }
 
-TEST_F(AtaTest, ADiskWhoseNameIsTooLongHasNone) {
+TEST_F(AtaTest, TooLongDiskNameCountsAsNone) {
     addPort("ata1", "1\n");
     addDisk("ata1", "sdabcdef");
     EXPECT_FALSE(isDiskErrHandling(disks));
@@ -95,7 +95,7 @@ TEST_F(AtaTest, ADiskWhoseNameIsTooLongHasNone) {
                                           "Failed to get dev name by ata path: /sys/class/ata_port/ata1")));
 }
 
-TEST_F(AtaTest, APortWithoutItsFileIsPassedOver) {
+TEST_F(AtaTest, PortWithoutErrorHandlingFileIsSkipped) {
     test::makeDirectories("/sys/class/ata_port/ata1");
     addPort("ata2", "1\n");
     addDisk("ata2", "sda");

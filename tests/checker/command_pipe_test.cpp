@@ -19,7 +19,7 @@ using ::testing::IsEmpty;
 
 class CommandPipeTest : public test::SandboxTest {};
 
-TEST_F(CommandPipeTest, GivesTheOutputOfAProgramWithItsArguments) {
+TEST_F(CommandPipeTest, ReadsOutputAndPassesArguments) {
     const char* const argv[] = {"/bin/echo", "a b", "$HOME", nullptr};
     {
         const CommandPipe pipe(argv);
@@ -32,7 +32,7 @@ TEST_F(CommandPipeTest, GivesTheOutputOfAProgramWithItsArguments) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(CommandPipeTest, AProgramThatCannotBeStartedLeavesOneLine) {
+TEST_F(CommandPipeTest, StartFailureIsLogged) {
     const char* const argv[] = {"/nowhere/program", nullptr};
     {
         const CommandPipe pipe(argv);
@@ -43,25 +43,25 @@ TEST_F(CommandPipeTest, AProgramThatCannotBeStartedLeavesOneLine) {
                 ElementsAre(test::LogLine("checker.cpp", "Failed to exec command: /nowhere/program")));
 }
 
-TEST_F(CommandPipeTest, AnEmptyVectorIsAProgramThatCannotBeStarted) {
+TEST_F(CommandPipeTest, EmptyArgumentVectorFailsToStart) {
     const char* const argv[] = {nullptr};
     EXPECT_TRUE(CommandPipe(argv)._failed);
     EXPECT_THAT(test::daemonLogMessages(),
                 ElementsAre(test::LogLine("checker.cpp", "Failed to exec command: ")));
 }
 
-struct End {
+struct ExitStatus {
     const char* script;
     const char* status;
 };
 
-void PrintTo(const End& end, std::ostream* stream) {
-    *stream << end.script;
+void PrintTo(const ExitStatus& exitStatus, std::ostream* stream) {
+    *stream << exitStatus.script;
 }
 
-class EndTest : public CommandPipeTest, public ::testing::WithParamInterface<End> {};
+class ExitStatusTest : public CommandPipeTest, public ::testing::WithParamInterface<ExitStatus> {};
 
-TEST_P(EndTest, IsReportedAsTheRawWaitStatus) {
+TEST_P(ExitStatusTest, IsLoggedAsRawWaitStatus) {
     test::createProgram("/opt/program", GetParam().script);
     const char* const argv[] = {"/opt/program", nullptr};
     CommandPipe{argv};
@@ -71,11 +71,12 @@ TEST_P(EndTest, IsReportedAsTheRawWaitStatus) {
             "checker.cpp", std::string("Failed to exec /opt/program return code: ") + GetParam().status)));
 }
 
-INSTANTIATE_TEST_SUITE_P(Ends, EndTest,
-                         ::testing::Values(End{"exit 1", "256"}, End{"exit 255", "65280"},
-                                           End{"kill -KILL $$", "9"}, End{"kill -TERM $$", "15"}));
+INSTANTIATE_TEST_SUITE_P(Exits, ExitStatusTest,
+                         ::testing::Values(ExitStatus{"exit 1", "256"}, ExitStatus{"exit 255", "65280"},
+                                           ExitStatus{"kill -KILL $$", "9"},
+                                           ExitStatus{"kill -TERM $$", "15"}));
 
-TEST_F(CommandPipeTest, ClosesAndReportsAlsoWhenAnExceptionPasses) {
+TEST_F(CommandPipeTest, DestructorLogsExitStatusDuringUnwinding) {
     test::createProgram("/opt/program", "exit 2");
     const char* const argv[] = {"/opt/program", nullptr};
     try {

@@ -19,7 +19,7 @@ std::string name;
 
 }  // namespace
 
-// The dynamic linker takes this one before that of the platform library.
+// Interposes the function of the platform library.
 int TERNDiskGetDevnamebyAtaPort(char* buffer, int size, const char* port) {
     calls.push_back({port, size, std::string(buffer, static_cast<std::size_t>(size))});
     name.copy(buffer, name.size());
@@ -41,10 +41,10 @@ class DeviceNameTest : public test::SandboxTest {
 
     static bool find(std::string path, std::string& found) { return devNameByAtaPath(path.data(), found); }
 
-    std::string device = "as it was";
+    std::string device = "unchanged";
 };
 
-TEST_F(DeviceNameTest, ThePlatformIsAskedForTheLastComponent) {
+TEST_F(DeviceNameTest, LastPathComponentIsPassedToThePlatform) {
     for (const char* path : {"/sys/class/ata_port/ata3", "ata3", "/sys/class/ata_port/ata3/"}) {
         EXPECT_TRUE(find(path, device));
         EXPECT_EQ(device, "sda");
@@ -54,20 +54,20 @@ TEST_F(DeviceNameTest, ThePlatformIsAskedForTheLastComponent) {
     }
 }
 
-TEST_F(DeviceNameTest, MinusOneIsTheOnlyFailure) {
+TEST_F(DeviceNameTest, OnlyMinusOneIsAFailure) {
     for (const int value : {1, 2, -2, 0}) {
         result = value;
         EXPECT_TRUE(find("ata1", device)) << value;
         EXPECT_EQ(device, "sda");
     }
     result = -1;
-    device = "as it was";
+    device = "unchanged";
     EXPECT_FALSE(find("ata1", device));
-    EXPECT_EQ(device, "as it was");
+    EXPECT_EQ(device, "unchanged");
     EXPECT_THAT(test::daemonLogMessages(), ::testing::IsEmpty());
 }
 
-TEST_F(DeviceNameTest, ANameHasUpToSevenCharacters) {
+TEST_F(DeviceNameTest, NameHasUpToSevenCharacters) {
     name = "sdabcde";
     EXPECT_TRUE(find("ata1", device));
     EXPECT_EQ(device, "sdabcde");

@@ -15,19 +15,19 @@ using test::parsed;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-class PeersDisksTest : public test::SandboxTest {
+class PeerDisksTest : public test::SandboxTest {
  protected:
     void SetUp() override {
         test::SandboxTest::SetUp();
-        remoteIP(test::kPeerAddress);
+        remoteIP(test::PEER_ADDRESS);
     }
 
-    Json::Value disks{"as it was"};
+    Json::Value disks{"unchanged"};
 };
 
-// ---- The answering side ----
+// ---- The replying side ----
 
-TEST_F(PeersDisksTest, TheAnswerTellsTheFlagAndTheDisks) {
+TEST_F(PeerDisksTest, ReplyHoldsFlagAndDisks) {
     Status status;
     EXPECT_EQ(IsRemoteDiskErrHandling().handle(status),
               R"({"errHandlingDisk":[],"isDiskErrHandling":false})");
@@ -38,42 +38,42 @@ TEST_F(PeersDisksTest, TheAnswerTellsTheFlagAndTheDisks) {
               R"({"errHandlingDisk":["sda","sdb"],"isDiskErrHandling":true})");
 }
 
-TEST_F(PeersDisksTest, TwoDisksFitADatagramAndThreeDoNot) {
+TEST_F(PeerDisksTest, ReplyWithThreeDisksIsTruncated) {
     for (const auto& [own, isReadable] :
          {std::pair(R"(["sda","sdb"])", true), std::pair(R"(["sda","sdb","sdc"])", false)}) {
         Status status;
         status.isDiskErrHandling = true;
         status.setErrHandlingDisk(parsed(own));
         const test::FakePeer peer(IsRemoteDiskErrHandling().handle(status));
-        disks = "as it was";
+        disks = "unchanged";
         EXPECT_EQ(IsRemoteDiskErrHandling()(disks), isReadable);
-        EXPECT_EQ(disks, isReadable ? parsed(own) : Json::Value("as it was"));
+        EXPECT_EQ(disks, isReadable ? parsed(own) : Json::Value("unchanged"));
     }
     EXPECT_THAT(test::daemonLogMessages(),
                 ElementsAre(test::LogLine("checker.cpp", "Failed to parse remote disk error info")));
 }
 
-// ---- The asking side ----
+// ---- The requesting side ----
 
-TEST_F(PeersDisksTest, ThePeerIsAskedByName) {
+TEST_F(PeerDisksTest, SendsTheRequestName) {
     test::FakePeer peer("{}");
     IsRemoteDiskErrHandling()(disks);
-    EXPECT_THAT(peer.questions(), ElementsAre("is_disk_err_handling"));
+    EXPECT_THAT(peer.requests(), ElementsAre("is_disk_err_handling"));
 }
 
-struct Answer {
+struct DisksReply {
     const char* text;
     bool result;
     const char* disks;
 };
 
-void PrintTo(const Answer& answer, std::ostream* stream) {
-    *stream << answer.text;
+void PrintTo(const DisksReply& reply, std::ostream* stream) {
+    *stream << reply.text;
 }
 
-class ReadableAnswerTest : public PeersDisksTest, public ::testing::WithParamInterface<Answer> {};
+class ValidDisksReplyTest : public PeerDisksTest, public ::testing::WithParamInterface<DisksReply> {};
 
-TEST_P(ReadableAnswerTest, GivesFlagAndDisksAsSent) {
+TEST_P(ValidDisksReplyTest, YieldsFlagAndDisksAsSent) {
     const test::FakePeer peer(GetParam().text);
     EXPECT_EQ(IsRemoteDiskErrHandling()(disks), GetParam().result);
     EXPECT_EQ(disks, parsed(GetParam().disks));
@@ -81,40 +81,40 @@ TEST_P(ReadableAnswerTest, GivesFlagAndDisksAsSent) {
 }
 
 INSTANTIATE_TEST_SUITE_P(
-    Answers, ReadableAnswerTest,
-    ::testing::Values(Answer{R"({"isDiskErrHandling":true,"errHandlingDisk":["sda","sdb"]})", true,
-                             R"(["sda","sdb"])"},
-                      Answer{R"({"isDiskErrHandling":false,"errHandlingDisk":["sda"]})", false, R"(["sda"])"},
-                      Answer{R"({"isDiskErrHandling":true,"errHandlingDisk":[]})", true, "[]"},
-                      Answer{"{}", false, "null"}, Answer{"null", false, "null"}, Answer{"[]", false, "null"},
-                      Answer{"[true]", false, "null"}, Answer{"7", false, "null"},
-                      Answer{"true", false, "null"}, Answer{R"("text")", false, "null"},
-                      Answer{R"({"isDiskErrHandling":true})", true, "null"},
-                      Answer{R"({"errHandlingDisk":{"a":1}})", false, R"({"a":1})"},
-                      Answer{R"({"isDiskErrHandling":1,"errHandlingDisk":"sda"})", true, R"("sda")"},
-                      Answer{R"({"isDiskErrHandling":null})", false, "null"},
-                      Answer{"{ /* c */ \"isDiskErrHandling\" : true\n}", true, "null"}));
+    Replies, ValidDisksReplyTest,
+    ::testing::Values(
+        DisksReply{R"({"isDiskErrHandling":true,"errHandlingDisk":["sda","sdb"]})", true, R"(["sda","sdb"])"},
+        DisksReply{R"({"isDiskErrHandling":false,"errHandlingDisk":["sda"]})", false, R"(["sda"])"},
+        DisksReply{R"({"isDiskErrHandling":true,"errHandlingDisk":[]})", true, "[]"},
+        DisksReply{"{}", false, "null"}, DisksReply{"null", false, "null"}, DisksReply{"[]", false, "null"},
+        DisksReply{"[true]", false, "null"}, DisksReply{"7", false, "null"},
+        DisksReply{"true", false, "null"}, DisksReply{R"("text")", false, "null"},
+        DisksReply{R"({"isDiskErrHandling":true})", true, "null"},
+        DisksReply{R"({"errHandlingDisk":{"a":1}})", false, R"({"a":1})"},
+        DisksReply{R"({"isDiskErrHandling":1,"errHandlingDisk":"sda"})", true, R"("sda")"},
+        DisksReply{R"({"isDiskErrHandling":null})", false, "null"},
+        DisksReply{"{ /* c */ \"isDiskErrHandling\" : true\n}", true, "null"}));
 
-class UnreadableAnswerTest : public PeersDisksTest, public ::testing::WithParamInterface<const char*> {};
+class InvalidDisksReplyTest : public PeerDisksTest, public ::testing::WithParamInterface<const char*> {};
 
-TEST_P(UnreadableAnswerTest, LeavesTheDisksAloneAndALine) {
+TEST_P(InvalidDisksReplyTest, IsLoggedAndLeavesDisksUnchanged) {
     const test::FakePeer peer(GetParam());
     EXPECT_FALSE(IsRemoteDiskErrHandling()(disks));
-    EXPECT_EQ(disks, "as it was");
+    EXPECT_EQ(disks, "unchanged");
     EXPECT_THAT(test::daemonLogMessages(),
                 ElementsAre(test::LogLine("checker.cpp", "Failed to parse remote disk error info")));
 }
 
-INSTANTIATE_TEST_SUITE_P(Answers, UnreadableAnswerTest,
+INSTANTIATE_TEST_SUITE_P(Replies, InvalidDisksReplyTest,
                          ::testing::Values("", "alive",
                                            R"({"errHandlingDisk":["sda","sdb","sdc"],"isDiskErr)",
                                            "[[[[[[[[[[[[[[[[[[[[", R"({"isDiskErrHandling":"true"})",
                                            R"({"isDiskErrHandling":[true]})",
                                            R"({"isDiskErrHandling":{},"errHandlingDisk":["sda"]})"));
 
-TEST_F(PeersDisksTest, NoAnswerLeavesTheDisksAloneAndALine) {
+TEST_F(PeerDisksTest, NoReplyIsLoggedAndLeavesDisksUnchanged) {
     EXPECT_FALSE(IsRemoteDiskErrHandling()(disks));
-    EXPECT_EQ(disks, "as it was");
+    EXPECT_EQ(disks, "unchanged");
     EXPECT_THAT(
         test::daemonLogMessages(),
         ElementsAre(test::LogLine("checker.cpp", "Failed to recv remote disk error handling responce")));

@@ -27,21 +27,21 @@ std::string resource(int number, const std::string& state) {
            "pe:0\n";
 }
 
-class LinkedStateTest : public DrbdTest, public ::testing::WithParamInterface<const char*> {};
+class ConnectedStateTest : public DrbdTest, public ::testing::WithParamInterface<const char*> {};
 
-TEST_P(LinkedStateTest, IsConnected) {
+TEST_P(ConnectedStateTest, CountsAsConnected) {
     EXPECT_TRUE(isConnectedWith(HEADER + resource(0, GetParam())));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-INSTANTIATE_TEST_SUITE_P(States, LinkedStateTest,
+INSTANTIATE_TEST_SUITE_P(States, ConnectedStateTest,
                          ::testing::Values("WFReportParams", "Connected", "StartingSyncS", "StartingSyncT",
                                            "WFBitMapS", "WFBitMapT", "WFSyncUUID", "SyncSource", "SyncTarget",
                                            "PausedSyncS", "PausedSyncT", "VerifyS", "VerifyT"));
 
 class OtherStateTest : public DrbdTest, public ::testing::WithParamInterface<const char*> {};
 
-TEST_P(OtherStateTest, IsNotConnected) {
+TEST_P(OtherStateTest, CountsAsDisconnected) {
     EXPECT_FALSE(isConnectedWith(HEADER + resource(0, GetParam())));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
@@ -60,30 +60,30 @@ TEST_F(DrbdTest, OneConnectedResourceSuffices) {
     EXPECT_FALSE(isConnectedWith(HEADER + resource(0, "StandAlone") + resource(1, "WFConnection")));
 }
 
-TEST_F(DrbdTest, AWordInsideALongerOneCounts) {
+TEST_F(DrbdTest, StateInsideALongerWordCounts) {
     EXPECT_TRUE(isConnectedWith("xxVerifySxx"));
     EXPECT_TRUE(isConnectedWith("no resource, but NotConnectedAtAll somewhere\n"));
 }
 
-TEST_F(DrbdTest, LinesMayHaveAnyLengthAndAnyBytes) {
+TEST_F(DrbdTest, LongLinesAndZeroBytesAreSearched) {
     EXPECT_TRUE(isConnectedWith(std::string(1000000, 'x') + "Connected"));
     EXPECT_TRUE(isConnectedWith(std::string(4095, 'x') + "Connected\n"));
     EXPECT_TRUE(isConnectedWith(std::string("\0\0cs:Connected\0", 15)));
     EXPECT_FALSE(isConnectedWith(std::string(1000000, 'x')));
 }
 
-TEST_F(DrbdTest, AnEmptyFileIsNotConnected) {
+TEST_F(DrbdTest, EmptyFileMeansDisconnected) {
     EXPECT_FALSE(isConnectedWith(""));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(DrbdTest, TheFileIsReadAnewOnEveryCall) {
+TEST_F(DrbdTest, FileIsReadOnEveryCall) {
     EXPECT_TRUE(isConnectedWith(resource(0, "Connected")));
     EXPECT_FALSE(isConnectedWith(resource(0, "StandAlone")));
     EXPECT_TRUE(isConnectedWith(resource(0, "Connected")));
 }
 
-TEST_F(DrbdTest, WithoutTheModuleEachCallLeavesALine) {
+TEST_F(DrbdTest, MissingModuleIsLoggedOnEveryCall) {
     EXPECT_FALSE(isDRBDConnect());
     EXPECT_FALSE(isDRBDConnect());
     EXPECT_THAT(test::daemonLogMessages(),

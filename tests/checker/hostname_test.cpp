@@ -13,8 +13,8 @@ using namespace std::chrono_literals;
 using TERN::HA::Daemon::GetRemoteHostname;
 using TERN::HA::Daemon::Status;
 using test::FakePeer;
-using test::kPeerAddress;
 using test::LogLine;
+using test::PEER_ADDRESS;
 using ::testing::ElementsAre;
 
 namespace {
@@ -23,36 +23,36 @@ class HostnameTest : public test::SandboxTest {
  protected:
     void SetUp() override {
         SandboxTest::SetUp();
-        remoteIP(kPeerAddress);
+        remoteIP(PEER_ADDRESS);
     }
 
     GetRemoteHostname getRemoteHostname;
     std::string hostname = "before";
 };
 
-TEST_F(HostnameTest, TheAnswerIsTheNameByteForByte) {
+TEST_F(HostnameTest, ReplyIsTakenByteForByte) {
     FakePeer peer(" Node-B\r\n\n");
     EXPECT_TRUE(getRemoteHostname(hostname));
     EXPECT_EQ(hostname, " Node-B\r\n\n");
-    EXPECT_THAT(peer.questions(), ElementsAre("remote_hostname"));
+    EXPECT_THAT(peer.requests(), ElementsAre("remote_hostname"));
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(HostnameTest, AnEmptyAnswerIsAnEmptyName) {
+TEST_F(HostnameTest, EmptyReplyIsAnEmptyName) {
     FakePeer peer("");
     EXPECT_TRUE(getRemoteHostname(hostname));
     EXPECT_EQ(hostname, "");
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(HostnameTest, ALongNameArrivesAsItsFirst63Characters) {
+TEST_F(HostnameTest, LongNameIsTruncatedTo63Characters) {
     FakePeer peer(std::string(63, 'n') + "ode");
     EXPECT_TRUE(getRemoteHostname(hostname));
     EXPECT_EQ(hostname, std::string(63, 'n'));
 }
 
-TEST_F(HostnameTest, ASilentPeerLeavesOneLineInTheLog) {
-    test::UdpSocket peer(kPeerAddress, test::kPeerPort);
+TEST_F(HostnameTest, NoReplyIsLogged) {
+    test::UdpSocket peer(PEER_ADDRESS, test::PEER_PORT);
     const test::Stopwatch watch;
     EXPECT_FALSE(getRemoteHostname(hostname));
     EXPECT_GE(watch.elapsed(), 3s);
@@ -62,7 +62,7 @@ TEST_F(HostnameTest, ASilentPeerLeavesOneLineInTheLog) {
                 ElementsAre(LogLine("checker.cpp", "Failed to get remote hostname")));
 }
 
-TEST_F(HostnameTest, WithoutASocketTheExchangeLogsFirst) {
+TEST_F(HostnameTest, SocketFailureIsLoggedBeforeTheMissingReply) {
     FakePeer peer("node-b");
     {
         const test::FailingCall failing("socket", EMFILE);
@@ -73,7 +73,7 @@ TEST_F(HostnameTest, WithoutASocketTheExchangeLogsFirst) {
                             LogLine("checker.cpp", "Failed to get remote hostname")));
 }
 
-TEST_F(HostnameTest, AnswersWithTheLocalHostNameUnchanged) {
+TEST_F(HostnameTest, RepliesWithTheLocalHostnameUnchanged) {
     Status status;
     EXPECT_EQ(getRemoteHostname.handle(status), "");
     test::writeFile("/tmp/.ha.hostname.original", "node-a\n");

@@ -15,7 +15,7 @@ using Outcome = InterfaceListing::Outcome;
 
 constexpr char TITLE[] = "Iface MTU RX-OK RX-ERR TX-OK Flg\n";
 
-// An open stream of a text.
+// A stream that reads a text.
 class Stream {
  public:
     explicit Stream(const std::string& text)
@@ -41,48 +41,48 @@ InterfaceListing read(const std::string& text) {
     return listing;
 }
 
-TEST(InterfaceListingTest, GivesTheCountersByTheirTitles) {
+TEST(InterfaceListingTest, ReturnsCountersByColumnTitle) {
     const InterfaceListing listing =
         read(TITLE + std::string("lo 65536 1 2 3 LRU\neth1 1500 10 0x20 -30 BMRU\neth10 1500 7 7 7 BMRU\n"));
     EXPECT_EQ(listing.outcome, Outcome::READ);
     EXPECT_THAT(listing.counters, ElementsAre(Pair("RX-ERR", 32), Pair("RX-OK", 10), Pair("TX-OK", -30)));
 }
 
-TEST(InterfaceListingTest, GivesTheColumnsForAnInterfaceThatIsNotListed) {
+TEST(InterfaceListingTest, UnlistedInterfaceYieldsColumnIndexes) {
     EXPECT_THAT(read(TITLE).counters, ElementsAre(Pair("RX-ERR", 3), Pair("RX-OK", 2), Pair("TX-OK", 4)));
 }
 
-TEST(InterfaceListingTest, GivesNoCountersUnderAnotherTitle) {
+TEST(InterfaceListingTest, UnknownTitleYieldsNoCounters) {
     const InterfaceListing listing = read("Kernel Interface table\neth1 1500 10 20 30 BMRU\n");
     EXPECT_EQ(listing.outcome, Outcome::READ);
     EXPECT_THAT(listing.counters, IsEmpty());
 }
 
-TEST(InterfaceListingTest, FailsWithoutATitle) {
+TEST(InterfaceListingTest, MissingTitleIsAFailure) {
     EXPECT_EQ(read("").outcome, Outcome::NO_TITLE);
 }
 
-TEST(InterfaceListingTest, FailsOnALineThatIsTooShort) {
+TEST(InterfaceListingTest, TooShortLineIsAFailure) {
     EXPECT_EQ(read(TITLE + std::string("eth1 1500 10 20 30\n")).outcome, Outcome::LINE_TOO_SHORT);
 }
 
-TEST(InterfaceListingTest, SkipsEveryLineUnderATitleWithoutCounters) {
+TEST(InterfaceListingTest, TitleWithoutCountersYieldsNone) {
     const InterfaceListing listing = read("Iface MTU Flg\neth1 1500\n");
     EXPECT_EQ(listing.outcome, Outcome::READ);
     EXPECT_THAT(listing.counters, IsEmpty());
 }
 
-TEST(InterfaceListingTest, KnowsATitleByItsFirstCharacters) {
+TEST(InterfaceListingTest, TitleIsRecognisedByItsFirstCharacters) {
     EXPECT_THAT(read(std::string(" ") + TITLE).counters, IsEmpty());
 }
 
-TEST(InterfaceListingTest, NamesTheCounterThatIsOutOfRange) {
+TEST(InterfaceListingTest, OutOfRangeCounterIsNamed) {
     const InterfaceListing listing = read(TITLE + std::string("eth1 1500 10 99999999999999999999 30 BMRU\n"));
     EXPECT_EQ(listing.outcome, Outcome::OUT_OF_RANGE);
     EXPECT_EQ(listing.token, "99999999999999999999");
 }
 
-TEST(TextTest, ReadsLinesAndThePiecesOfLongOnes) {
+TEST(TextTest, ReadsLongLinesInChunks) {
     const Stream stream("first\n" + std::string(600, 'x') + "\nlast");
     Line line = {};
     EXPECT_EQ(readLine(stream.get(), line), "first\n");
@@ -92,7 +92,7 @@ TEST(TextTest, ReadsLinesAndThePiecesOfLongOnes) {
     EXPECT_EQ(readLine(stream.get(), line), "");
 }
 
-TEST(TextTest, SplitsAtBlanksOfAllKinds) {
+TEST(TextTest, SplitsAtAnyWhitespace) {
     EXPECT_THAT(split(" a\tbc \v\f\r d\n"), ElementsAre("a", "bc", "d"));
     EXPECT_THAT(split(" \n"), IsEmpty());
 }

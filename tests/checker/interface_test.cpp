@@ -25,7 +25,7 @@ class InterfaceTest : public test::SandboxTest {
         drbdIF("eth1");
     }
 
-    // What ifconfig prints from now on, and how it ends.
+    // Replace ifconfig by a stub that prints `output` and then runs `end`.
     static void print(const std::string& output, const std::string& end = "exit 0") {
         test::replaceProgram("/sbin/ifconfig", "cat <<'END'\n" + output + "\nEND\n" + end);
     }
@@ -35,7 +35,7 @@ class InterfaceTest : public test::SandboxTest {
                " BMRU";
     }
 
-    // The rate of one sample that must succeed.
+    // Take a sample, which must succeed, and return its rate.
     float sample() {
         float rate = -7.0F;
         EXPECT_TRUE(checker.networkNonOkRate(rate));
@@ -52,7 +52,7 @@ class InterfaceTest : public test::SandboxTest {
     InterfaceChecker checker;
 };
 
-TEST_F(InterfaceTest, TheRealIfconfigCountsPackets) {
+TEST_F(InterfaceTest, RealIfconfigCountsPackets) {
     drbdIF("lo");
     test::UdpSocket socket("127.0.0.1");
     socket.send("packet", "127.0.0.1", socket.port());
@@ -61,8 +61,8 @@ TEST_F(InterfaceTest, TheRealIfconfigCountsPackets) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-// Were the title or the interface not found, the rate would be 0 all the same.
-TEST_F(InterfaceTest, TheRealIfconfigHasTheTitleAndTheLineThatAreLookedFor) {
+// Guards the test above: with an unknown title its rate would be 0, too.
+TEST_F(InterfaceTest, RealIfconfigListingHasTheExpectedFormat) {
     test::UdpSocket socket("127.0.0.1");
     socket.send("packet", "127.0.0.1", socket.port());
     ASSERT_TRUE(socket.receive(5s).has_value());
@@ -71,14 +71,14 @@ TEST_F(InterfaceTest, TheRealIfconfigHasTheTitleAndTheLineThatAreLookedFor) {
     EXPECT_THAT(output, Contains(MatchesRegex("lo +[0-9]+ +[1-9][0-9]* +0 .*")));
 }
 
-TEST_F(InterfaceTest, IfconfigIsAskedForItsShortListing) {
+TEST_F(InterfaceTest, IfconfigIsRunWithTheShortOption) {
     test::replaceProgram("/sbin/ifconfig", "printf '%s\\n' \"$#\" \"$@\" > /tmp/arguments");
     float rate = 0;
     checker.networkNonOkRate(rate);
     EXPECT_EQ(test::readFile("/tmp/arguments"), "1\n-s\n");
 }
 
-TEST_F(InterfaceTest, TheFirstSampleCoversEverything) {
+TEST_F(InterfaceTest, FirstSampleCoversAllPacketsSoFar) {
     print(line("eth1", "1000 5 0 0 995 0 0 0"));
     EXPECT_FLOAT_EQ(sample(), 5.0F / 2000.0F);
     print(line("eth1", "1000 5 0 0 1005 0 0 0"));  // 10 more are OK: the totals were kept
@@ -87,7 +87,7 @@ TEST_F(InterfaceTest, TheFirstSampleCoversEverything) {
     EXPECT_FLOAT_EQ(sample(), 6.0F / 10.0F);
 }
 
-TEST_F(InterfaceTest, WithoutTrafficTheRateIsZero) {
+TEST_F(InterfaceTest, NoTrafficYieldsRateZero) {
     print(line("eth1", "1000 5 0 0 995 0 0 0"));
     sample();
     EXPECT_EQ(sample(), 0.0F);
@@ -100,7 +100,7 @@ TEST_F(InterfaceTest, ColumnsAreFoundByName) {
     EXPECT_FLOAT_EQ(sample(), 0.0025F);
 }
 
-TEST_F(InterfaceTest, OnlyColumnsThatBeginWithRxOrTxCount) {
+TEST_F(InterfaceTest, OnlyRxAndTxColumnsCount) {
     print("Iface xRX-ERR OK TXQ RX-OK\neth1 100 100 1 3");
     EXPECT_FLOAT_EQ(sample(), 0.25F);
 }
@@ -110,37 +110,37 @@ TEST_F(InterfaceTest, CountersMayBeHexadecimalOrOctal) {
     EXPECT_FLOAT_EQ(sample(), 8.0F / 24.0F);
 }
 
-TEST_F(InterfaceTest, WhatFollowsANumberDoesNotCount) {
+TEST_F(InterfaceTest, TrailingCharactersOfACounterAreIgnored) {
     print(line("eth1", "6abc none 2 0 0 0 0 0"));
     EXPECT_FLOAT_EQ(sample(), 2.0F / 8.0F);
 }
 
-TEST_F(InterfaceTest, CountersThatWentBackwardsGiveANegativeRate) {
+TEST_F(InterfaceTest, DecreasingCountersYieldANegativeRate) {
     print(line("eth1", "1000 5 0 0 995 0 0 0"));
     sample();
     print(line("eth1", "2000 0 0 0 2000 0 0 0"));
     EXPECT_FLOAT_EQ(sample(), -5.0F / 2000.0F);
 }
 
-TEST_F(InterfaceTest, TheRateIsNotClamped) {
+TEST_F(InterfaceTest, RateIsNotClamped) {
     print(line("eth1", "1000 5 0 0 995 0 0 0"));
     sample();
     print(line("eth1", "990 25 0 0 995 0 0 0"));
     EXPECT_FLOAT_EQ(sample(), 2.0F);
 }
 
-TEST_F(InterfaceTest, TheDivisionIsInSinglePrecision) {
+TEST_F(InterfaceTest, RateIsDividedInSinglePrecision) {
     print(line("eth1", "1 16777217 0 0 0 0 0 0"));
     EXPECT_EQ(sample(), 16777216.0F / 16777218.0F);  // in double precision it rounds to another float
 }
 
-TEST_F(InterfaceTest, AnInterfaceThatIsNotListedCountsTheColumns) {
+TEST_F(InterfaceTest, UnlistedInterfaceUsesColumnIndexesAsCounters) {
     print(line("eth0", "1000 5 0 0 995 0 0 0"));
     EXPECT_FLOAT_EQ(sample(), (3.0F + 4 + 5 + 7 + 8 + 9) / (2 + 3 + 4 + 5 + 6 + 7 + 8 + 9));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(InterfaceTest, AnotherTitleNegatesTheTotals) {
+TEST_F(InterfaceTest, UnknownTitleNegatesTheTotals) {
     print(line("eth1", "1000 5 0 0 995 0 0 0"));
     sample();
     print("Kernel Interface table\neth1 1500 1 1 1 1 1 1 1 1 BMRU");
@@ -149,7 +149,7 @@ TEST_F(InterfaceTest, AnotherTitleNegatesTheTotals) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(InterfaceTest, APrefixOfTheLineSufficesAndTheFirstLineCounts) {
+TEST_F(InterfaceTest, FirstLineBeginningWithTheNameCounts) {
     const std::string eth1 = "eth1 1500 100 0 0 0 0 0 0 0 BMRU\n";
     const std::string eth10 = "eth10 1500 0 100 0 0 0 0 0 0 BMRU\n";
     print(std::string(TITLE) + "\n" + eth1 + eth10);
@@ -159,23 +159,23 @@ TEST_F(InterfaceTest, APrefixOfTheLineSufficesAndTheFirstLineCounts) {
     EXPECT_EQ(sample(), 1.0F);
 }
 
-TEST_F(InterfaceTest, AColumnThatComesTwiceCountsOnce) {
+TEST_F(InterfaceTest, RepeatedColumnCountsOnce) {
     print("Iface RX-OK RX-ERR RX-ERR\neth1 60 40 340");
     EXPECT_FLOAT_EQ(sample(), 0.4F);
 }
 
-TEST_F(InterfaceTest, AnInterfaceMayHaveAShortName) {
+TEST_F(InterfaceTest, InterfaceNameMayBeOneCharacter) {
     drbdIF("x");
     print("Iface RX-OK RX-ERR\nx 60 40");
     EXPECT_FLOAT_EQ(sample(), 0.4F);
 }
 
-TEST_F(InterfaceTest, WordsAreWhatAnyBlanksPart) {
+TEST_F(InterfaceTest, ColumnsAreSeparatedByAnyWhitespace) {
     print("Iface\tRX-OK \v RX-ERR\f\r\neth1\t60\r40\v");
     EXPECT_FLOAT_EQ(sample(), 0.4F);
 }
 
-TEST_F(InterfaceTest, TheRateIsTheShareOfWhatIsNotOk) {
+TEST_F(InterfaceTest, RateIsTheShareOfNonOkPackets) {
     EXPECT_FLOAT_EQ(checker._rateCaculate(5, 1995), 0.0025F);
     EXPECT_EQ(checker._rateCaculate(0, 7), 0.0F);
     EXPECT_EQ(checker._rateCaculate(7, 0), 1.0F);
@@ -185,7 +185,7 @@ TEST_F(InterfaceTest, TheRateIsTheShareOfWhatIsNotOk) {
     EXPECT_EQ(checker._rateCaculate(-5, 15), -0.5F);
 }
 
-TEST_F(InterfaceTest, ARateIsTakenFromTheTotalsOfTheSampleBefore) {
+TEST_F(InterfaceTest, RateCoversPacketsSinceThePreviousSample) {
     EXPECT_FLOAT_EQ(checker._rateGet({{"RX-ERR", 10}, {"RX-OK", 20}, {"an OK amid", 30}, {"x", 40}}), 0.5F);
     EXPECT_EQ(checker._lastOkTotal, 50);
     EXPECT_EQ(checker._lastNonOkTotal, 50);
@@ -195,7 +195,7 @@ TEST_F(InterfaceTest, ARateIsTakenFromTheTotalsOfTheSampleBefore) {
     EXPECT_EQ(checker._rateGet({}), 51.0F / 104.0F);
 }
 
-TEST_F(InterfaceTest, CountersAreReplacedOnSuccessOnly) {
+TEST_F(InterfaceTest, CountersAreReplacedOnlyOnSuccess) {
     const std::map<std::string, long long> before = {{"RX-OK", 1}, {"before", 2}};
     std::map<std::string, long long> counters = before;
     for (const char* rest : {"1500 99999999999999999999 5", "1500 60"}) {
@@ -221,8 +221,8 @@ TEST_F(InterfaceTest, CountersAreReplacedOnSuccessOnly) {
     EXPECT_THAT(counters, IsEmpty());
 }
 
-TEST_F(InterfaceTest, LongLinesAreReadInPiecesOf511Bytes) {
-    // The last column begins where the second piece of the title does; a piece of a line counts as a line.
+TEST_F(InterfaceTest, LongLinesAreReadInChunksOf511Bytes) {
+    // The last column begins with the second chunk of the title; each chunk counts as a line.
     const std::string title = "Iface RX-OK" + std::string(500, ' ');
     ASSERT_EQ(title.size(), 511U);
     print(title + "RX-ERR\neth1 60 40");
@@ -232,40 +232,40 @@ TEST_F(InterfaceTest, LongLinesAreReadInPiecesOf511Bytes) {
     EXPECT_FLOAT_EQ(sample(), 0.4F);
 }
 
-TEST_F(InterfaceTest, OnlyTheFirstMatchingLineHasToBeInOrder) {
+TEST_F(InterfaceTest, LinesAfterTheFirstMatchMayBeMalformed) {
     print(line("eth1", "60 40 0 0 0 0 0 0") + "\neth1 1500\neth1 1500 99999999999999999999 0 0 0 0 0 0 0");
     EXPECT_FLOAT_EQ(sample(), 0.4F);
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(InterfaceTest, TheListingIsReadToItsEnd) {
-    // More than a pipe holds: it would end by a signal if nobody read on.
+TEST_F(InterfaceTest, ListingIsReadToTheEnd) {
+    // Exceeds the capacity of a pipe: SIGPIPE would end ifconfig if reading stopped early.
     print(line("eth1", "60 40 0 0 0 0 0 0"), "printf '%0200000d' 0; exit 0");
     EXPECT_FLOAT_EQ(sample(), 0.4F);
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(InterfaceTest, AnIfconfigThatCannotBeStartedLeavesThreeLines) {
+TEST_F(InterfaceTest, IfconfigStartFailureLogsThreeLines) {
     test::hideProgram("/sbin/ifconfig");
     expectFailure(ElementsAre(test::LogLine("checker.cpp", "Failed to exec command: /sbin/ifconfig"),
                               test::LogLine("checker.cpp", "Failed to exec ifconfig to get interface status"),
                               test::LogLine("checker.cpp", "Failed to get interface detail")));
 }
 
-TEST_F(InterfaceTest, NoOutputIsAFailure) {
+TEST_F(InterfaceTest, EmptyOutputIsAFailure) {
     test::replaceProgram("/sbin/ifconfig", "exit 0");
     expectFailure(ElementsAre(test::LogLine("checker.cpp", "Failed to get title from ifconfig output"),
                               test::LogLine("checker.cpp", "Failed to get interface detail")));
 }
 
-TEST_F(InterfaceTest, NoOutputAndAFailingIfconfigLeaveThreeLines) {
+TEST_F(InterfaceTest, EmptyOutputAndExitStatusLogThreeLines) {
     test::replaceProgram("/sbin/ifconfig", "exit 1");
     expectFailure(ElementsAre(test::LogLine("checker.cpp", "Failed to get title from ifconfig output"),
                               test::LogLine("checker.cpp", "Failed to exec /sbin/ifconfig return code: 256"),
                               test::LogLine("checker.cpp", "Failed to get interface detail")));
 }
 
-TEST_F(InterfaceTest, AnIfconfigThatFailsAfterItsListingIsReportedOnly) {
+TEST_F(InterfaceTest, ExitStatusAfterAListingIsOnlyLogged) {
     print(line("eth1", "1000 5 0 0 995 0 0 0"), "exit 3");
     EXPECT_FLOAT_EQ(sample(), 0.0025F);
     EXPECT_THAT(test::daemonLogMessages(),
@@ -285,26 +285,26 @@ INSTANTIATE_TEST_SUITE_P(Counters, OutOfRangeTest,
                                            "99999999999999999999", "-99999999999999999999",
                                            "0x7fffffffffffffff"));
 
-TEST_F(InterfaceTest, ACounterOutOfRangeIsReportedBeforeTheFailureOfIfconfig) {
+TEST_F(InterfaceTest, OutOfRangeCounterIsLoggedBeforeTheExitStatus) {
     print(line("eth1", "99999999999999999999 0 0 0 0 0 0 0"), "exit 1");
     expectFailure(ElementsAre(test::LogLine("checker.cpp", "strtoll failed: 99999999999999999999"),
                               test::LogLine("checker.cpp", "Failed to exec /sbin/ifconfig return code: 256"),
                               test::LogLine("checker.cpp", "Failed to get interface detail")));
 }
 
-TEST_F(InterfaceTest, TheLargestCountersDoNotHarm) {
+TEST_F(InterfaceTest, LargestCountersAreHandled) {
     print(line("eth1",
                "9223372036854775806 9223372036854775806 9223372036854775806 0 9223372036854775806 0 0 0"));
     sample();
     EXPECT_EQ(sample(), 0.0F);
 }
 
-TEST_F(InterfaceTest, ALineThatIsTooShortIsAFailure) {
+TEST_F(InterfaceTest, TooShortLineIsAFailure) {
     print(std::string(TITLE) + "\neth1 1500 1000 5 0 0 995 0 0");
     expectFailure(ElementsAre(test::LogLine("checker.cpp", "Failed to get interface detail")));
 }
 
-TEST_F(InterfaceTest, AFailureLeavesTheTotals) {
+TEST_F(InterfaceTest, FailureKeepsThePreviousTotals) {
     print(line("eth1", "1000 5 0 0 995 0 0 0"));
     sample();
     print(line("eth1", "x"));

@@ -19,7 +19,7 @@ class MdTest : public test::SandboxTest {
     }
 };
 
-TEST_F(MdTest, WithoutArraysEachCallLeavesALine) {
+TEST_F(MdTest, MissingArraysAreLoggedOnEveryCall) {
     test::makeDirectories("/sys/block/sda");
     setAction("xmd0", "resync\n");  // only names that begin so count
     EXPECT_FALSE(isMDResync());
@@ -29,7 +29,7 @@ TEST_F(MdTest, WithoutArraysEachCallLeavesALine) {
                             test::LogLine("checker.cpp", "Failed to set globBuf from /sys/block/md*")));
 }
 
-TEST_F(MdTest, AnyArrayThatResyncsCounts) {
+TEST_F(MdTest, ResyncOfAnyArrayCounts) {
     setAction("md0", "idle\n");
     setAction("md1", "resync\n");
     EXPECT_TRUE(isMDResync());
@@ -41,7 +41,7 @@ TEST_F(MdTest, AnyArrayThatResyncsCounts) {
 
 class OtherActionTest : public MdTest, public ::testing::WithParamInterface<const char*> {};
 
-TEST_P(OtherActionTest, DoesNotCount) {
+TEST_P(OtherActionTest, IsNoResync) {
     setAction("md0", GetParam());
     EXPECT_FALSE(isMDResync());
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
@@ -52,14 +52,14 @@ INSTANTIATE_TEST_SUITE_P(Actions, OtherActionTest,
                                            "frozen\n", "resync \n", "resync\r\n", " resync\n", "Resync\n",
                                            "resyncing\n", "resyn\n", "", "\nresync\n", "idle\nresync\n"));
 
-TEST_F(MdTest, OnlyTheFirstLineCountsWithOrWithoutItsEnd) {
+TEST_F(MdTest, OnlyFirstLineCounts) {
     setAction("md0", "resync");
     EXPECT_TRUE(isMDResync());
     setAction("md0", "resync\nidle\n");
     EXPECT_TRUE(isMDResync());
 }
 
-TEST_F(MdTest, AnArrayWithoutItsFileIsPassedOver) {
+TEST_F(MdTest, ArrayWithoutSyncActionIsSkipped) {
     test::makeDirectories("/sys/block/md0");
     setAction("md1", "resync\n");
     EXPECT_TRUE(isMDResync());
@@ -68,14 +68,14 @@ TEST_F(MdTest, AnArrayWithoutItsFileIsPassedOver) {
         ElementsAre(test::LogLine("checker.cpp", "Failed to open sysfs file /sys/block/md0/md/sync_action")));
 }
 
-TEST_F(MdTest, TheSearchEndsAtTheFirstResync) {
+TEST_F(MdTest, SearchStopsAtFirstResync) {
     setAction("md0", "resync\n");
     test::makeDirectories("/sys/block/md1");
     EXPECT_TRUE(isMDResync());
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(MdTest, ArraysWithoutAResyncAreAllLookedAt) {
+TEST_F(MdTest, AllArraysAreReadUntilOneResyncs) {
     test::makeDirectories("/sys/block/md10");
     test::makeDirectories("/sys/block/md2");
     setAction("md3", "idle\n");
@@ -86,7 +86,7 @@ TEST_F(MdTest, ArraysWithoutAResyncAreAllLookedAt) {
                     test::LogLine("checker.cpp", "Failed to open sysfs file /sys/block/md2/md/sync_action")));
 }
 
-TEST_F(MdTest, AValueIsTheWholeFirstLine) {
+TEST_F(MdTest, SysfsValueIsTheWholeFirstLine) {
     const auto isValue = [](const std::string& text, const std::string& expected) {
         test::writeFile("/tmp/value", text);
         return isSysfsValue("/tmp/value", expected);

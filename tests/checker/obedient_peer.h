@@ -12,22 +12,22 @@
 
 namespace test {
 
-// A peer that answers the request after calling `onRequest`, unless that returns false.
+// A stub peer that calls `onRequest` and replies to the request if that returns true.
 class ObedientPeer {
  public:
     explicit ObedientPeer(std::function<bool()> onRequest = [] { return true; })
         : _onRequest(std::move(onRequest)), _thread([this] {
-              if (const auto question = _socket.receive(std::chrono::seconds(10))) {
-                  _question = question->bytes;
+              if (const auto request = _socket.receive(std::chrono::seconds(10))) {
+                  _request = request->bytes;
                   if (_onRequest()) {
-                      _socket.send("", question->address, question->port);
+                      _socket.send("", request->address, request->port);
                   }
               }
           }) {}
 
     ~ObedientPeer() {
         _thread.join();
-        EXPECT_EQ(_question, "reboot_remote");
+        EXPECT_EQ(_request, "reboot_remote");
     }
 
     ObedientPeer(const ObedientPeer&) = delete;
@@ -36,7 +36,7 @@ class ObedientPeer {
  private:
     std::function<bool()> _onRequest;
     UdpSocket _socket{"127.0.0.2", 7499};
-    std::string _question;
+    std::string _request;
     std::thread _thread;
 };
 

@@ -39,21 +39,21 @@ class RebootTest : public test::SandboxTest {
     Status status;
 };
 
-// ---- The asking side ----
+// ---- The requesting side ----
 
-TEST_F(RebootTest, TheInheritedOperatorsAskNobody) {
+TEST_F(RebootTest, InheritedOperatorsSendNothing) {
     test::UdpSocket peer("127.0.0.2", 7499);
     RebootRemote reboot;
     EnvCheck& check = reboot;
-    Json::Value out("as it was");
+    Json::Value out("unchanged");
     EXPECT_TRUE(check());
     EXPECT_TRUE(check(out));
-    EXPECT_EQ(out, "as it was");
+    EXPECT_EQ(out, "unchanged");
     EXPECT_FALSE(peer.receive(0ms).has_value());
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(RebootTest, APeerThatCountsAsDeadIsOfflineAtOnce) {
+TEST_F(RebootTest, DeadPeerIsOfflineAtOnce) {
     const test::ObedientPeer peer;
     const test::FastSleep noSleep([](int) {});
     EXPECT_TRUE(RebootRemote()(status));
@@ -62,7 +62,7 @@ TEST_F(RebootTest, APeerThatCountsAsDeadIsOfflineAtOnce) {
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 
-TEST_F(RebootTest, APeerThatDoesNotAnswerIsFollowedAllTheSame) {
+TEST_F(RebootTest, MissingReplyIsLoggedAndTheWaitContinues) {
     const test::FastSleep noSleep([](int) {});
     const test::Stopwatch stopwatch;
     EXPECT_TRUE(RebootRemote()(status));
@@ -73,7 +73,7 @@ TEST_F(RebootTest, APeerThatDoesNotAnswerIsFollowedAllTheSame) {
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 
-TEST_F(RebootTest, TheStateChangesAfterTheRequest) {
+TEST_F(RebootTest, StateChangesOnlyAfterTheExchange) {
     status.setRemoteAlive(true);
     const test::ObedientPeer peer([this] {
         EXPECT_EQ(status.getRemoteNodeState(), NodeAlive);
@@ -83,7 +83,7 @@ TEST_F(RebootTest, TheStateChangesAfterTheRequest) {
     RebootRemote()(status);
 }
 
-TEST_F(RebootTest, APeerDeclaredDeadWhileTheRequestGoesUnansweredIsOfflineAtOnce) {
+TEST_F(RebootTest, PeerDeclaredDeadDuringTheRequestIsOfflineAtOnce) {
     status.setRemoteAlive(true);
     const test::ObedientPeer peer([this] {
         status.setRemoteAlive(false);
@@ -100,7 +100,7 @@ TEST_F(RebootTest, APeerDeclaredDeadWhileTheRequestGoesUnansweredIsOfflineAtOnce
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 
-TEST_F(RebootTest, APeerThatDoesNotAnswerIsFollowedUntilItIsDeclaredDead) {
+TEST_F(RebootTest, WaitsForASilentPeerUntilItIsDeclaredDead) {
     status.setRemoteAlive(true);
     const test::FastSleep sleep([this](int number) {
         if (number == 2) {
@@ -113,8 +113,8 @@ TEST_F(RebootTest, APeerThatDoesNotAnswerIsFollowedUntilItIsDeclaredDead) {
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 
-// Each change waits for the lock that another thread holds, so that every state lasts a second.
-TEST_F(RebootTest, ThePeerCountsAsRebootingInEachTransition) {
+// A held lock delays each change, so that every state lasts a second.
+TEST_F(RebootTest, PeerIsRebootingThroughoutTheTransition) {
     status.lockTimeout = 1;
     const std::lock_guard<std::timed_mutex> stuck(status.remoteNodeStateMutex);
     const test::ObedientPeer peer;
@@ -132,11 +132,11 @@ TEST_F(RebootTest, ThePeerCountsAsRebootingInEachTransition) {
     EXPECT_THAT(states, ElementsAre(0U, NodeRebootPending, NodeRebootPending | NodeRebooting, NodeRebooting));
 }
 
-TEST_F(RebootTest, APeerIsFollowedUntilItIsDeclaredDead) {
+TEST_F(RebootTest, WaitsUntilThePeerIsDeclaredDead) {
     status.setRemoteAlive(true);
     const test::ObedientPeer peer;
     const test::FastSleep sleep([this](int number) {
-        // Both bits may be set, and the reboot counts from the request on.
+        // A peer may be alive and rebooting at once.
         EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebootPending);
         EXPECT_TRUE(status.isRemoteRebooting());
         if (number == 4) {
@@ -149,7 +149,7 @@ TEST_F(RebootTest, APeerIsFollowedUntilItIsDeclaredDead) {
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 
-TEST_F(RebootTest, APeerThatStaysAliveIsTestedThirtyTimes) {
+TEST_F(RebootTest, PeerThatStaysAliveIsCheckedThirtyTimes) {
     status.setRemoteAlive(true);
     const test::ObedientPeer peer;
     const test::FastSleep sleep([](int) {});
@@ -159,7 +159,7 @@ TEST_F(RebootTest, APeerThatStaysAliveIsTestedThirtyTimes) {
     EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebooting);  // the alive bit is not its business
 }
 
-TEST_F(RebootTest, ThereIsNoTestAfterTheLastSleep) {
+TEST_F(RebootTest, NoCheckFollowsTheLastSleep) {
     status.setRemoteAlive(true);
     const test::ObedientPeer peer;
     const test::FastSleep sleep([this](int number) {
@@ -172,9 +172,9 @@ TEST_F(RebootTest, ThereIsNoTestAfterTheLastSleep) {
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 
-// ---- The answering side ----
+// ---- The replying side ----
 
-TEST_F(RebootTest, BothLogsAreOnDiskAndTheKernelIsToldToRestart) {
+TEST_F(RebootTest, FlushesBothLogsAndTriggersTheReboot) {
     daemonLog->set("last words");
     recordLog->set("last snapshot");
     EXPECT_EQ(RebootRemote().handle(status), "");
@@ -186,13 +186,13 @@ TEST_F(RebootTest, BothLogsAreOnDiskAndTheKernelIsToldToRestart) {
     EXPECT_EQ(status.getRemoteNodeState(), 0U);
 }
 
-TEST_F(RebootTest, TheTriggerIsWrittenAnew) {
+TEST_F(RebootTest, TriggerFileIsOverwritten) {
     test::writeFile(TRIGGER, "something longer");
     RebootRemote().handle(status);
     EXPECT_EQ(test::readFile(TRIGGER), "b");
 }
 
-TEST_F(RebootTest, ATriggerThatCannotBeOpenedIsSilent) {
+TEST_F(RebootTest, UnopenableTriggerIsNotLogged) {
     test::removeTree(TRIGGER);
     test::makeDirectories(TRIGGER);
     daemonLog->set("last words");
@@ -201,7 +201,7 @@ TEST_F(RebootTest, ATriggerThatCannotBeOpenedIsSilent) {
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(RebootTest, WithoutADirectoryForTheLogsTheMachineRestartsAllTheSame) {
+TEST_F(RebootTest, MissingLogDirectoryDoesNotPreventTheReboot) {
     test::removeTree("/var/log/ha");
     daemonLog->set("lost");
     EXPECT_EQ(RebootRemote().handle(status), "");

@@ -30,7 +30,7 @@ class RecordingTest : public test::SandboxTest {
     }
 };
 
-TEST_F(RecordingTest, AnEntryIsTheStampsLineTheOutputAndAnEmptyLine) {
+TEST_F(RecordingTest, EntryIsTimeStampOutputAndEmptyLine) {
     test::replaceProgram("/bin/df", "echo Filesystem; echo tmpfs; echo $# arguments");
     recordDF();
     EXPECT_THAT(test::recordText(),
@@ -38,18 +38,18 @@ TEST_F(RecordingTest, AnEntryIsTheStampsLineTheOutputAndAnEmptyLine) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(RecordingTest, AProgramGetsItsArguments) {
+TEST_F(RecordingTest, ProgramGetsItsArguments) {
     record("echo \"$0 $*\"");
     EXPECT_THAT(test::recordEntries(), ElementsAre("\n/opt/program first second\n"));
 }
 
-TEST_F(RecordingTest, AnEmptyOutputIsAnEntryToo) {
+TEST_F(RecordingTest, EmptyOutputIsRecorded) {
     record("exit 0");
     EXPECT_THAT(test::recordText(), EndsWith(" \n\n"));
     EXPECT_THAT(test::recordEntries(), ElementsAre("\n"));
 }
 
-TEST_F(RecordingTest, LongLinesAreJoined) {
+TEST_F(RecordingTest, LongLinesAreRecordedWhole) {
     record("printf '%0511d' 0; printf '%01000d' 0; echo end; printf '%0600d' 0");
     EXPECT_THAT(test::recordEntries(),
                 ElementsAre("\n" + std::string(1511, '0') + "end\n" + std::string(600, '0')));
@@ -60,7 +60,7 @@ TEST_F(RecordingTest, EveryByteIsRecorded) {
     EXPECT_THAT(test::recordEntries(), ElementsAre(std::string("\na\0b\nc\377\n", 8)));
 }
 
-TEST_F(RecordingTest, SignalsDoNotCutTheOutput) {
+TEST_F(RecordingTest, SignalsDoNotTruncateTheOutput) {
     struct sigaction action = {};
     action.sa_handler = [](int) {};  // without SA_RESTART
     ASSERT_EQ(sigaction(SIGALRM, &action, nullptr), 0);
@@ -73,7 +73,7 @@ TEST_F(RecordingTest, SignalsDoNotCutTheOutput) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(RecordingTest, AnErrorNumberFromBeforeDoesNotMatter) {
+TEST_F(RecordingTest, EarlierErrnoIsIgnored) {
     test::createProgram("/opt/program", "echo one");
     const char* const argv[] = {"/opt/program", nullptr};
     errno = EINTR;
@@ -86,15 +86,15 @@ TEST_F(RecordingTest, OnlyStandardOutputIsRecorded) {
     EXPECT_THAT(test::recordEntries(), ElementsAre("\noutput\n"));
 }
 
-TEST_F(RecordingTest, AFailingProgramIsRecordedAndThenReported) {
-    // The program ends only once its output is in the record log: a report that came first would never come.
+TEST_F(RecordingTest, OutputIsRecordedBeforeTheExitStatusIsLogged) {
+    // The program ends only after its output has reached the record log.
     record("echo output; exec >&-; while [ ! -s /tmp/ha/ha.daemon.record ]; do :; done; exit 4");
     EXPECT_THAT(test::recordEntries(), ElementsAre("\noutput\n"));
     EXPECT_THAT(test::daemonLogMessages(),
                 ElementsAre(test::LogLine("checker.cpp", "Failed to exec /opt/program return code: 1024")));
 }
 
-TEST_F(RecordingTest, AProgramThatCannotBeStartedLeavesTwoLinesAndNoEntry) {
+TEST_F(RecordingTest, StartFailureLogsTwoLinesAndRecordsNothing) {
     const char* const argv[] = {"/nowhere/program", nullptr};
     recordCMD(argv);
     EXPECT_EQ(test::recordText(), "");
@@ -103,7 +103,7 @@ TEST_F(RecordingTest, AProgramThatCannotBeStartedLeavesTwoLinesAndNoEntry) {
                             test::LogLine("checker.cpp", "Failed to exec ifconfig to get interface status")));
 }
 
-TEST_F(RecordingTest, TheRealPsListsThisProcess) {
+TEST_F(RecordingTest, RealPsListsThisProcess) {
     recordPS();
     ASSERT_EQ(test::recordEntries().size(), 1U);
     const std::string entry = test::recordEntries()[0];
@@ -114,14 +114,14 @@ TEST_F(RecordingTest, TheRealPsListsThisProcess) {
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(RecordingTest, TheRealDfListsTheRoot) {
+TEST_F(RecordingTest, RealDfListsTheRootFileSystem) {
     recordDF();
     ASSERT_EQ(test::recordEntries().size(), 1U);
     EXPECT_THAT(test::recordEntries()[0], StartsWith("\nFilesystem"));
     EXPECT_THAT(test::recordEntries()[0], HasSubstr(" /\n"));
 }
 
-TEST_F(RecordingTest, TheStatusIsRecordedAsItsJson) {
+TEST_F(RecordingTest, StatusIsRecordedAsJson) {
     Status status;
     status.isMDResync = true;
     recordStatus(status);
@@ -134,21 +134,21 @@ TEST_F(RecordingTest, TheStatusIsRecordedAsItsJson) {
                     R"("isRemoteMDResync":false})"));
 }
 
-TEST_F(RecordingTest, TheMemoryIsRecordedAsTheKernelShowsIt) {
+TEST_F(RecordingTest, MeminfoIsRecordedVerbatim) {
     const std::string meminfo = "MemTotal:  1 kB\n\nodd line\n" + std::string(10000, 'x') + "\n";
     test::writeFile("/proc/meminfo", meminfo);
     recordMemoryInfo();
     EXPECT_THAT(test::recordEntries(), ElementsAre("\n" + meminfo));
 }
 
-TEST_F(RecordingTest, MemoryFiguresThatAreEmptyAreAnEntryToo) {
+TEST_F(RecordingTest, EmptyMeminfoIsRecorded) {
     test::writeFile("/proc/meminfo", "");
     recordMemoryInfo();
     EXPECT_THAT(test::recordEntries(), ElementsAre("\n"));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-TEST_F(RecordingTest, WithoutMemoryFiguresThereIsALineAndNoEntry) {
+TEST_F(RecordingTest, MissingMeminfoIsLoggedAndNotRecorded) {
     test::removeTree("/proc/meminfo");
     recordMemoryInfo();
     EXPECT_EQ(test::recordText(), "");
@@ -156,7 +156,7 @@ TEST_F(RecordingTest, WithoutMemoryFiguresThereIsALineAndNoEntry) {
                 ElementsAre(test::LogLine("checker.cpp", "Failed to get meminfo")));
 }
 
-TEST_F(RecordingTest, ARecordLogThatCannotBeOpenedIsSilent) {
+TEST_F(RecordingTest, UnopenableRecordLogIsNotLogged) {
     test::makeDirectories("/tmp/ha/ha.daemon.record");
     recordMemoryInfo();
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());

@@ -17,11 +17,11 @@ class ResyncTest : public test::SandboxTest {
  protected:
     void SetUp() override {
         test::SandboxTest::SetUp();
-        remoteIP(test::kPeerAddress);
+        remoteIP(test::PEER_ADDRESS);
     }
 };
 
-TEST_F(ResyncTest, TheAnswerTellsTheFlag) {
+TEST_F(ResyncTest, ReplyHoldsTheFlag) {
     Status status;
     EXPECT_EQ(IsRemoteMDResync().handle(status), "not_resync");
     status.isMDResync = true;
@@ -31,25 +31,25 @@ TEST_F(ResyncTest, TheAnswerTellsTheFlag) {
     EXPECT_EQ(IsRemoteMDResync().handle(status), "not_resync");
 }
 
-TEST_F(ResyncTest, ThePeerIsAskedByName) {
+TEST_F(ResyncTest, SendsTheRequestName) {
     test::FakePeer peer("resync");
     EXPECT_TRUE(IsRemoteMDResync()());
-    EXPECT_THAT(peer.questions(), ElementsAre("is_md_resync"));
+    EXPECT_THAT(peer.requests(), ElementsAre("is_md_resync"));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-class OtherResyncAnswerTest : public ResyncTest, public ::testing::WithParamInterface<const char*> {};
+class OtherResyncReplyTest : public ResyncTest, public ::testing::WithParamInterface<const char*> {};
 
-TEST_P(OtherResyncAnswerTest, IsNoResyncAndNotLogged) {
+TEST_P(OtherResyncReplyTest, IsNoResyncAndNotLogged) {
     const test::FakePeer peer(GetParam());
     EXPECT_FALSE(IsRemoteMDResync()());
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
 }
 
-INSTANTIATE_TEST_SUITE_P(Answers, OtherResyncAnswerTest,
+INSTANTIATE_TEST_SUITE_P(Replies, OtherResyncReplyTest,
                          ::testing::Values("not_resync", "", "Resync", "resync\n", "resync ", "alive"));
 
-TEST_F(ResyncTest, NoAnswerLeavesALine) {
+TEST_F(ResyncTest, NoReplyIsLogged) {
     const test::Stopwatch stopwatch;
     EXPECT_FALSE(IsRemoteMDResync()());
     EXPECT_GE(stopwatch.elapsed(), 2900ms);

@@ -26,7 +26,7 @@ class SlowRebootTest : public test::SandboxTest {
     test::Stopwatch stopwatch;
 };
 
-TEST_F(SlowRebootTest, APeerThatAnswersAndStaysAliveCountsAsRebootingAfterThirtySeconds) {
+TEST_F(SlowRebootTest, WaitForALivingPeerEndsAfterThirtySeconds) {
     const test::ObedientPeer peer;
     EXPECT_TRUE(RebootRemote()(status));
     EXPECT_GE(stopwatch.elapsed(), 30s);
@@ -36,7 +36,7 @@ TEST_F(SlowRebootTest, APeerThatAnswersAndStaysAliveCountsAsRebootingAfterThirty
                 ElementsAre(test::LogLine("status.cpp", "Remote server status changed to alive")));
 }
 
-TEST_F(SlowRebootTest, APeerThatIgnoresTheRequestCountsAsRebootingThreeSecondsLater) {
+TEST_F(SlowRebootTest, MissingReplyDelaysTheWaitByThreeSeconds) {
     EXPECT_TRUE(RebootRemote()(status));
     EXPECT_GE(stopwatch.elapsed(), 33s);
     EXPECT_LT(stopwatch.elapsed(), 50s);
@@ -46,7 +46,7 @@ TEST_F(SlowRebootTest, APeerThatIgnoresTheRequestCountsAsRebootingThreeSecondsLa
                             test::LogLine("checker.cpp", "Failed to reboot remote, but keep checking")));
 }
 
-TEST_F(SlowRebootTest, APeerDeclaredDeadMeanwhileEndsTheWait) {
+TEST_F(SlowRebootTest, WaitEndsWhenThePeerIsDeclaredDead) {
     const test::ObedientPeer peer;
     std::thread liveness([this] {
         EXPECT_TRUE(test::eventually(10s, [this] { return status.isRemoteRebooting(); }));

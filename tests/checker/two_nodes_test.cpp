@@ -1,4 +1,4 @@
-// Both checks from end to end: two nodes, each with a network, files and processes of its own.
+// The peer checks end to end, between two nodes with separate networks, files and processes.
 
 #include <chrono>
 #include <string>
@@ -17,24 +17,24 @@ using TERN::HA::Daemon::Status;
 
 namespace {
 
-constexpr const char* kAddressA = "10.0.0.1";
-constexpr const char* kAddressB = "10.0.0.2";
-constexpr const char* kLog = "/tmp/ha/ha.daemon.log";
+constexpr const char* ADDRESS_A = "10.0.0.1";
+constexpr const char* ADDRESS_B = "10.0.0.2";
+constexpr const char* BUFFER = "/tmp/ha/ha.daemon.log";
 
 class TwoNodesTest : public test::SandboxTest {
  protected:
     void SetUp() override {
         SandboxTest::SetUp();
-        test::connect(a, kAddressA, b, kAddressB);
+        test::connect(a, ADDRESS_A, b, ADDRESS_B);
         test::makeDirectories(a.path("/tmp/ha"));
         test::makeDirectories(b.path("/tmp/ha"));
-        remoteIP(kAddressB);
+        remoteIP(ADDRESS_B);
     }
 
-    // Serves on node B until the process is killed or a pass fails.
+    // Run the server on node B until the process is killed or a pass fails.
     test::Process serveOnB() {
         test::Process process = b.start([] {
-            localIP(kAddressB);
+            localIP(ADDRESS_B);
             Status status;
             SocketServer server;
             while (server(status)) {
@@ -42,7 +42,7 @@ class TwoNodesTest : public test::SandboxTest {
             return 1;
         });
         const std::string table = "/.kernel/proc/" + std::to_string(b.pid()) + "/net/udp";
-        EXPECT_TRUE(test::eventually(10s, [&] { return test::isBound(kAddressB, test::kPeerPort, table); }));
+        EXPECT_TRUE(test::eventually(10s, [&] { return test::isBound(ADDRESS_B, test::PEER_PORT, table); }));
         return process;
     }
 
@@ -57,18 +57,18 @@ class TwoNodesTest : public test::SandboxTest {
     test::Node b{"node-b"};
 };
 
-TEST_F(TwoNodesTest, APeerIsAliveWhileItsServerRuns) {
+TEST_F(TwoNodesTest, PeerIsAliveWhileItsServerRuns) {
     {
         const test::Process server = serveOnB();
         EXPECT_EQ(onA([] { EXPECT_TRUE(IsRemoteAlive()()); }), 0);
         EXPECT_EQ(onA([] { EXPECT_TRUE(IsRemoteAlive()()); }), 0);
     }
     EXPECT_EQ(onA([] { EXPECT_FALSE(IsRemoteAlive()()); }), 0);
-    EXPECT_FALSE(test::exists(a.path(kLog)));
-    EXPECT_FALSE(test::exists(b.path(kLog)));
+    EXPECT_FALSE(test::exists(a.path(BUFFER)));
+    EXPECT_FALSE(test::exists(b.path(BUFFER)));
 }
 
-TEST_F(TwoNodesTest, APeerBehindACutLinkIsNotAlive) {
+TEST_F(TwoNodesTest, PeerIsNotAliveWhileTheLinkIsDown) {
     const test::Process server = serveOnB();
     test::setLink(b, false);
     EXPECT_EQ(onA([] { EXPECT_FALSE(IsRemoteAlive()()); }), 0);
@@ -76,7 +76,7 @@ TEST_F(TwoNodesTest, APeerBehindACutLinkIsNotAlive) {
     EXPECT_TRUE(test::eventually(30s, [this] { return onA([] { EXPECT_TRUE(IsRemoteAlive()()); }) == 0; }));
 }
 
-TEST_F(TwoNodesTest, TheHostNameOfThePeerArrivesWithItsLineEnd) {
+TEST_F(TwoNodesTest, PeerHostnameKeepsItsNewline) {
     test::writeFile(a.path("/tmp/.ha.hostname.original"), "node-a\n");
     test::writeFile(b.path("/tmp/.ha.hostname.original"), "node-b\n");
     const test::Process server = serveOnB();
@@ -86,11 +86,11 @@ TEST_F(TwoNodesTest, TheHostNameOfThePeerArrivesWithItsLineEnd) {
                   EXPECT_EQ(hostname, "node-b\n");
               }),
               0);
-    EXPECT_FALSE(test::exists(a.path(kLog)));
-    EXPECT_FALSE(test::exists(b.path(kLog)));
+    EXPECT_FALSE(test::exists(a.path(BUFFER)));
+    EXPECT_FALSE(test::exists(b.path(BUFFER)));
 }
 
-TEST_F(TwoNodesTest, APeerWithoutAHostNameAnswersAnEmptyOne) {
+TEST_F(TwoNodesTest, PeerWithoutAHostnameRepliesWithAnEmptyOne) {
     const test::Process server = serveOnB();
     EXPECT_EQ(onA([] {
                   std::string hostname = "before";

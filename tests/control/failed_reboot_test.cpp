@@ -6,7 +6,7 @@
 #include "support/json.h"
 #include "support/sandbox.h"
 
-// The dynamic linker takes this one, which fails as the library's own never does.
+// Interposes the library's operator, which never fails.
 bool TERN::HA::Daemon::RebootRemote::operator()(Status& /*status*/) {
     return false;
 }
@@ -18,7 +18,7 @@ using ::testing::ElementsAre;
 
 class FailedRebootTest : public test::SandboxTest {};
 
-TEST_F(FailedRebootTest, IsLoggedAndNotAnswered) {
+TEST_F(FailedRebootTest, IsLoggedWithoutAReply) {
     Status status;
     MonitordSocket server("/tmp/control.sock", 0);
     server.setStatus(&status);

@@ -46,7 +46,7 @@ class DaemonLogTest : public test::SandboxTest {
 
 // ---- Lines and their time stamps ----
 
-TEST_F(DaemonLogTest, ALineIsTimeStampSpaceTextAndNewline) {
+TEST_F(DaemonLogTest, LineIsTimeStampSpaceTextNewline) {
     const test::FixedTime now(1794730821);
     setenv("TZ", "CET-1", 1);
     log.set("util.cpp:88 Failed to get ha hostname");
@@ -64,7 +64,7 @@ void PrintTo(const Zone& zone, std::ostream* stream) {
 
 class ZoneTest : public DaemonLogTest, public ::testing::WithParamInterface<Zone> {};
 
-TEST_P(ZoneTest, TheStampEndsInTheZone) {
+TEST_P(ZoneTest, TimeStampEndsInTheOffset) {
     const test::FixedTime now(1794730821);
     setenv("TZ", GetParam().tz, 1);
     log.set("x");
@@ -79,20 +79,20 @@ INSTANTIATE_TEST_SUITE_P(Zones, ZoneTest,
                                            Zone{"LINT-14", "2026-11-15T22:20:21+14:00"},
                                            Zone{"AOE12", "2026-11-14T20:20:21-12:00"}));
 
-TEST_F(DaemonLogTest, StampsAreRightAfter2038) {
+TEST_F(DaemonLogTest, TimeStampIsCorrectAfter2038) {
     const test::FixedTime now(2177452800);
     log.set("x");
     EXPECT_EQ(test::readFile(BUFFER), "2039-01-01T00:00:00+00:00 x\n");
 }
 
-TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheProcess) {
+TEST_F(DaemonLogTest, TimeStampFollowsTheTzVariable) {
     setAt(1794730821, "first");
     setenv("TZ", "CET-1", 1);
     setAt(1794730822, "second");
     EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T08:20:21+00:00 first\n2026-11-15T09:20:22+01:00 second\n");
 }
 
-TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheProcessWithinASecond) {
+TEST_F(DaemonLogTest, TimeStampFollowsTheTzVariableWithinOneSecond) {
     const std::string kolkata = ":/usr/share/zoneinfo/" + std::string(60, '/') + "Asia/Kolkata";
     setAt(1794730821, "first");
     setenv("TZ", "CET-1", 1);
@@ -109,12 +109,12 @@ TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheProcessWithinASecond) {
               "2026-11-15T01:20:21-07:00 fifth\n");
 }
 
-TEST_F(DaemonLogTest, TheSecondBefore1970HasItsStamp) {
+TEST_F(DaemonLogTest, TimeStampIsCorrectBefore1970) {
     setAt(-1, "x");
     EXPECT_EQ(test::readFile(BUFFER), "1969-12-31T23:59:59+00:00 x\n");
 }
 
-TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheMachine) {
+TEST_F(DaemonLogTest, TimeStampFollowsEtcLocaltime) {
     unsetenv("TZ");
     test::removeTree("/etc/localtime");
     std::filesystem::create_symlink("/usr/share/zoneinfo/Asia/Kolkata", "/etc/localtime");
@@ -125,7 +125,7 @@ TEST_F(DaemonLogTest, StampsFollowAChangeOfTheZoneOfTheMachine) {
     EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T13:50:21+05:30 first\n2026-11-15T01:20:22-07:00 second\n");
 }
 
-TEST_F(DaemonLogTest, StampsFollowAClockThatIsSetBack) {
+TEST_F(DaemonLogTest, TimeStampFollowsABackwardClockStep) {
     setAt(1794730821, "first");
     setAt(1794730820, "second");
     setAt(1794730821, "third");
@@ -134,7 +134,7 @@ TEST_F(DaemonLogTest, StampsFollowAClockThatIsSetBack) {
               "2026-11-15T08:20:21+00:00 third\n");
 }
 
-TEST_F(DaemonLogTest, StampsAreThoseOfTheMoment) {
+TEST_F(DaemonLogTest, TimeStampIsTheCurrentTime) {
     const std::time_t before = std::time(nullptr);
     log.set("x");
     const std::time_t after = std::time(nullptr);
@@ -144,30 +144,30 @@ TEST_F(DaemonLogTest, StampsAreThoseOfTheMoment) {
     EXPECT_LE(timegm(&stamp), after);
 }
 
-TEST_F(DaemonLogTest, LinesOfOneSecondLookAtTheZoneOnce) {
-    // Longer names are looked at for every line.
+TEST_F(DaemonLogTest, TimeZoneIsReadOncePerSecond) {
+    // Names of 64 characters and more are not cached.
     for (const auto& [length, looks] :
          {std::pair(4, 1), std::pair(63, 1), std::pair(64, 3), std::pair(5, 1)}) {
         setenv("TZ", ("X" + std::string(static_cast<std::size_t>(length) - 2, 'X') + "0").c_str(), 1);
-        const int before = test::zoneLooks();
+        const int before = test::timeZoneReads();
         for (int i = 0; i < 3; ++i) {
             setAt(1794730821, "line");
         }
-        EXPECT_EQ(test::zoneLooks() - before, looks) << length;
+        EXPECT_EQ(test::timeZoneReads() - before, looks) << length;
     }
-    const int before = test::zoneLooks();
+    const int before = test::timeZoneReads();
     setAt(1794730822, "line");
-    EXPECT_EQ(test::zoneLooks() - before, 1);
+    EXPECT_EQ(test::timeZoneReads() - before, 1);
 }
 
-TEST_F(DaemonLogTest, AnyTextIsKeptByteForByte) {
+TEST_F(DaemonLogTest, TextIsKeptByteForByte) {
     const test::FixedTime now(1794730821);
     const std::string text = "\n{}\n\0\xff%s\r\n"s;
     log.set(text);
     EXPECT_EQ(test::readFile(BUFFER), "2026-11-15T08:20:21+00:00 " + text + "\n");
 }
 
-TEST_F(DaemonLogTest, ALineIsDroppedWithoutTheDirectory) {
+TEST_F(DaemonLogTest, LineIsDroppedWithoutTheDirectory) {
     test::removeTree("/tmp/ha");
     log.set("lost");
     EXPECT_FALSE(test::exists("/tmp/ha"));
@@ -176,7 +176,7 @@ TEST_F(DaemonLogTest, ALineIsDroppedWithoutTheDirectory) {
     EXPECT_THAT(test::messages(test::readFile(BUFFER)), ElementsAre("kept"));
 }
 
-TEST_F(DaemonLogTest, ALineIsDroppedWhileADirectoryIsInTheWay) {
+TEST_F(DaemonLogTest, LineIsDroppedWhileTheBufferIsADirectory) {
     test::makeDirectories(BUFFER);
     log.set("lost");
     test::removeTree(BUFFER);
@@ -186,7 +186,7 @@ TEST_F(DaemonLogTest, ALineIsDroppedWhileADirectoryIsInTheWay) {
 
 // ---- Objects ----
 
-TEST_F(DaemonLogTest, EachSourceFileHasItsOwnObjectsForTheSameFiles) {
+TEST_F(DaemonLogTest, EachSourceFileHasItsOwnLogObjects) {
     EXPECT_NE(TERN::HA::Daemon::daemonLog, test::otherDaemonLog());
     EXPECT_NE(TERN::HA::Daemon::recordLog, test::otherRecordLog());
     HA_LOG("here");
@@ -195,24 +195,24 @@ TEST_F(DaemonLogTest, EachSourceFileHasItsOwnObjectsForTheSameFiles) {
                                                        test::LogLine("other_unit.cpp", "there")));
 }
 
-TEST_F(DaemonLogTest, TheObjectsAreThereBeforeTheSourceFilesOwn) {
+TEST_F(DaemonLogTest, LogObjectsPrecedeOtherStaticObjects) {
     EXPECT_TRUE(test::wereLogsReadyDuringInitialisation());
 }
 
-TEST_F(DaemonLogTest, ALogLineNamesItsOwnPlace) {
+TEST_F(DaemonLogTest, LogLineNamesItsCallSite) {
     const int line = __LINE__ + 1;
     HA_LOG("message");
     EXPECT_THAT(test::daemonLogMessages(),
                 ElementsAre("daemon_log_test.cpp:" + std::to_string(line) + " message"));
 }
 
-TEST_F(DaemonLogTest, AProcessCanLogToItsVeryEnd) {
+TEST_F(DaemonLogTest, LoggingWorksDuringStaticDestruction) {
     const auto probe = test::run({LOG_PROBE, "end"});
     EXPECT_EQ(probe.exitCode, 0) << probe.error;
     EXPECT_THAT(test::daemonLogMessages(), ElementsAre("last word"));
 }
 
-TEST_F(DaemonLogTest, TheFilesAreNamedAfterTheArguments) {
+TEST_F(DaemonLogTest, FilesAreNamedByTheArguments) {
     test::makeDirectories("/var/other");
     DaemonLog other("/var/other", "/x.log");
     other.set("x");
@@ -222,14 +222,14 @@ TEST_F(DaemonLogTest, TheFilesAreNamedAfterTheArguments) {
     EXPECT_FALSE(test::exists(BUFFER));
 }
 
-TEST_F(DaemonLogTest, TheRecordLogIsAFileOfItsOwn) {
+TEST_F(DaemonLogTest, RecordLogHasItsOwnFile) {
     TERN::HA::Daemon::recordLog->set("snapshot");
     EXPECT_FALSE(test::exists(BUFFER));
     TERN::HA::Daemon::recordLog->writeLogToDisk();
     EXPECT_THAT(test::messages(test::readFile("/var/log/ha/ha.daemon.record")), ElementsAre("snapshot"));
 }
 
-// ---- Several writers ----
+// ---- Concurrent writers ----
 
 void logLines(char letter, int count) {
     DaemonLog log("/var/log/ha", "/ha.daemon.log");
@@ -246,7 +246,7 @@ void expectWholeLines(int countOfEach) {
     }
 }
 
-TEST_F(DaemonLogTest, LongLinesOfTwoThreadsArriveWhole) {
+TEST_F(DaemonLogTest, LongLinesOfTwoThreadsAreNotTorn) {
     std::thread a(logLines, 'a', 100);
     std::thread b(logLines, 'b', 100);
     a.join();
@@ -254,7 +254,7 @@ TEST_F(DaemonLogTest, LongLinesOfTwoThreadsArriveWhole) {
     expectWholeLines(100);
 }
 
-TEST_F(DaemonLogTest, LongLinesOfTwoProcessesArriveWhole) {
+TEST_F(DaemonLogTest, LongLinesOfTwoProcessesAreNotTorn) {
     const pid_t child = fork();
     if (child == 0) {
         logLines('a', 100);
@@ -267,7 +267,7 @@ TEST_F(DaemonLogTest, LongLinesOfTwoProcessesArriveWhole) {
     expectWholeLines(100);
 }
 
-TEST_F(DaemonLogTest, LinesOfManyThreadsArriveWholeAndEachThreadsInOrder) {
+TEST_F(DaemonLogTest, LinesOfEachThreadStayInOrder) {
     constexpr int THREADS = 8;
     constexpr int LINES = 200;
     std::vector<std::thread> threads;
@@ -296,7 +296,7 @@ TEST_F(DaemonLogTest, LinesOfManyThreadsArriveWholeAndEachThreadsInOrder) {
 
 // ---- Moving to disk ----
 
-TEST_F(DaemonLogTest, MovesTheLinesInOrderToTheEndOfTheLog) {
+TEST_F(DaemonLogTest, MoveAppendsBufferedLinesInOrder) {
     test::writeFile(LOG, "older\n");
     log.set("one");
     log.set("two");
@@ -306,20 +306,20 @@ TEST_F(DaemonLogTest, MovesTheLinesInOrderToTheEndOfTheLog) {
     EXPECT_EQ(test::readFile(BUFFER), "");
 }
 
-TEST_F(DaemonLogTest, WithoutABufferMakesAnEmptyOneAndLeavesTheLogAsItIs) {
+TEST_F(DaemonLogTest, MoveWithoutABufferCreatesAnEmptyOne) {
     test::writeFile(LOG, "older\n");
     log.writeLogToDisk();
     EXPECT_EQ(test::readFile(LOG), "older\n");
     EXPECT_EQ(test::readFile(BUFFER), "");
 }
 
-TEST_F(DaemonLogTest, WithoutABufferAndALogMakesBothEmpty) {
+TEST_F(DaemonLogTest, MoveWithoutFilesCreatesBoth) {
     log.writeLogToDisk();
     EXPECT_EQ(test::readFile(LOG), "");
     EXPECT_EQ(test::readFile(BUFFER), "");
 }
 
-TEST_F(DaemonLogTest, WithoutTheLogsDirectoryTheBufferIsEmptiedAllTheSame) {
+TEST_F(DaemonLogTest, MoveWithoutALogDirectoryEmptiesTheBuffer) {
     test::removeTree("/var/log/ha");
     log.set("lost");
     log.writeLogToDisk();
@@ -330,20 +330,20 @@ TEST_F(DaemonLogTest, WithoutTheLogsDirectoryTheBufferIsEmptiedAllTheSame) {
     EXPECT_THAT(test::messages(test::readFile(LOG)), ElementsAre("kept"));
 }
 
-TEST_F(DaemonLogTest, WithADirectoryForALogTheBufferIsEmptiedAllTheSame) {
+TEST_F(DaemonLogTest, MoveEmptiesTheBufferWhenTheLogIsADirectory) {
     test::makeDirectories(LOG);
     log.set("lost");
     log.writeLogToDisk();
     EXPECT_EQ(test::readFile(BUFFER), "");
 }
 
-TEST_F(DaemonLogTest, WithADirectoryForABufferNothingIsMoved) {
+TEST_F(DaemonLogTest, MoveDoesNothingWhenTheBufferIsADirectory) {
     test::makeDirectories(BUFFER);
     log.writeLogToDisk();
     EXPECT_EQ(test::readFile(LOG), "");
 }
 
-TEST_F(DaemonLogTest, TheEndOfALineIsWaitedForForATenthOfASecond) {
+TEST_F(DaemonLogTest, MoveWaits100msForTheEndOfALine) {
     test::writeFile(BUFFER, "x");
     const test::NoSleep noSleep;
     log.writeLogToDisk();
@@ -351,7 +351,7 @@ TEST_F(DaemonLogTest, TheEndOfALineIsWaitedForForATenthOfASecond) {
     EXPECT_EQ(test::NoSleep::total(), std::chrono::milliseconds(100));
 }
 
-TEST_F(DaemonLogTest, NothingIsWaitedForWithoutALogToMoveItTo) {
+TEST_F(DaemonLogTest, MoveDoesNotWaitWithoutALog) {
     test::writeFile(BUFFER, "the beginning of a line");
     test::removeTree("/var/log/ha");
     const test::NoSleep noSleep;
@@ -359,20 +359,20 @@ TEST_F(DaemonLogTest, NothingIsWaitedForWithoutALogToMoveItTo) {
     EXPECT_EQ(test::NoSleep::total(), std::chrono::milliseconds(0));
 }
 
-TEST_F(DaemonLogTest, ALastLineWithoutANewlineGainsOne) {
+TEST_F(DaemonLogTest, MoveTerminatesAnIncompleteLastLine) {
     test::writeFile(BUFFER, "whole\ntorn");
     log.writeLogToDisk();
     EXPECT_EQ(test::readFile(LOG), "whole\ntorn\n");
 }
 
-TEST_F(DaemonLogTest, EmptyLinesAndZeroBytesAreMovedToo) {
+TEST_F(DaemonLogTest, MoveKeepsEmptyLinesAndZeroBytes) {
     const std::string text("\n\na\0b\n\n", 7);
     test::writeFile(BUFFER, text);
     log.writeLogToDisk();
     EXPECT_EQ(test::readFile(LOG), text);
 }
 
-TEST_F(DaemonLogTest, LinesOfAnyLengthAreMovedWhole) {
+TEST_F(DaemonLogTest, MoveKeepsLinesOfAnyLength) {
     std::string text;
     for (const std::size_t length : {65534U, 65535U, 65536U, 65537U, 1U, 200000U, 0U, 131072U}) {
         text += std::string(length, 'x') + '\n';
@@ -382,7 +382,7 @@ TEST_F(DaemonLogTest, LinesOfAnyLengthAreMovedWhole) {
     EXPECT_EQ(test::readFile(LOG), text);
 }
 
-TEST_F(DaemonLogTest, NoLineOfAnotherThreadIsTornByAMove) {
+TEST_F(DaemonLogTest, ConcurrentMoveTearsNoLine) {
     std::thread writer(logLines, 'a', 200);
     DaemonLog other("/var/log/ha", "/ha.daemon.log");
     for (int i = 0; i < 50; ++i) {

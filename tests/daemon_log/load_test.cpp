@@ -27,7 +27,7 @@ constexpr char DIRECTORY[] = "/var/log/ha";
 constexpr auto DURATION = 60s;
 constexpr int BURST = 20;
 
-// Appends numbered lines in bursts until the time is over. Returns how many.
+// Append numbered lines in bursts for DURATION; return their number.
 int append(DaemonLog& log, const std::string& writer) {
     int number = 0;
     const test::Stopwatch stopwatch;
@@ -42,7 +42,7 @@ int append(DaemonLog& log, const std::string& writer) {
     return number;
 }
 
-// Two threads for each of two source files' log objects. Writes down how many lines each has appended.
+// Append from two threads for each of two log objects; write the number of lines of each to a file.
 int appendFromTwoUnits(const std::string& process) {
     std::vector<std::thread> threads;
     for (int i = 0; i < 4; ++i) {
@@ -58,7 +58,7 @@ int appendFromTwoUnits(const std::string& process) {
     return 0;
 }
 
-// The lines of the disk's log, of its archives and of the buffer.
+// Return the lines of the log on disk, its archives and the buffer.
 std::vector<std::string> allLines() {
     std::vector<std::string> all;
     std::vector<std::string> files = {"/tmp/ha/ha.daemon.log"};
@@ -77,7 +77,7 @@ std::vector<std::string> allLines() {
     return all;
 }
 
-TEST(LogUnderLoadTest, NoLineIsTornOrTwiceWhileOneProcessMovesAndRotates) {
+TEST(LogUnderLoadTest, ConcurrentRotationNeitherTearsNorDuplicatesLines) {
     test::makeDirectories("/tmp/ha");
     test::makeDirectories(DIRECTORY);
     const pid_t other = fork();
@@ -125,7 +125,8 @@ TEST(LogUnderLoadTest, NoLineIsTornOrTwiceWhileOneProcessMovesAndRotates) {
             EXPECT_EQ(times, 1) << writer << " " << number;
         }
     }
-    // What comes between the last read and the emptying is lost: microseconds of each move.
+    // A move drops lines that arrive between its last read and the truncation, which takes
+    // microseconds.
     std::printf("%d of %d lines lost\n", appended - arrived, appended);
     EXPECT_LT(appended - arrived, appended / 100);
 }

@@ -18,13 +18,13 @@ using TERN::HA::Daemon::DaemonLog;
 using test::LOG;
 using ::testing::ElementsAre;
 
-// A rotation that is stuck in its compressor holds the log's mutex until release().
+// A rotation whose compressor hangs holds the log's mutex.
 class StuckLogTest : public test::SandboxTest {
  protected:
     void SetUp() override {
         test::SandboxTest::SetUp();
         ASSERT_EQ(mkfifo("/tmp/gate", 0600), 0);
-        // Only the first compressor is stuck.
+        // Only the first compressor hangs.
         test::replaceProgram("/bin/xz",
                              "[ -e /tmp/stuck ] && exit 1; : > /tmp/stuck; read line < /tmp/gate; exit 1");
         test::writeFile(LOG, "log\n");
@@ -38,8 +38,8 @@ class StuckLogTest : public test::SandboxTest {
         test::SandboxTest::TearDown();
     }
 
-    // The operation goes ahead after the wait and leaves the mutex to its holder.
-    void expectToGoAheadAfterAMinute(const std::function<void()>& operation) {
+    // The operation proceeds without the lock after the wait, which leaves the mutex to its holder.
+    void expectToProceedAfterAMinute(const std::function<void()>& operation) {
         const test::Stopwatch stopwatch;
         operation();
         EXPECT_GE(stopwatch.elapsed(), 60s);
@@ -53,29 +53,29 @@ class StuckLogTest : public test::SandboxTest {
     std::thread _holder;
 };
 
-TEST(LogLockTest, TheWaitIsSixtySeconds) {
+TEST(LogLockTest, WaitIsSixtySeconds) {
     EXPECT_EQ(DaemonLog("/var/log/ha", "/ha.daemon.log")._lockTimeout, 60);
 }
 
-TEST_F(StuckLogTest, ALineIsWrittenAfterAMinute) {
-    expectToGoAheadAfterAMinute([this] { log.set("late"); });
+TEST_F(StuckLogTest, LineIsWrittenWithoutTheLockAfterAMinute) {
+    expectToProceedAfterAMinute([this] { log.set("late"); });
     EXPECT_THAT(test::daemonLogMessages(), ElementsAre("late"));
 }
 
-TEST_F(StuckLogTest, TheLinesAreMovedAfterAMinute) {
+TEST_F(StuckLogTest, MoveProceedsWithoutTheLockAfterAMinute) {
     test::writeFile("/tmp/ha/ha.daemon.log", "buffered\n");
-    expectToGoAheadAfterAMinute([this] { log.writeLogToDisk(); });
+    expectToProceedAfterAMinute([this] { log.writeLogToDisk(); });
     EXPECT_EQ(test::readFile(LOG), "log\nbuffered\n");
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(StuckLogTest, ARotationGoesAheadAfterAMinute) {
+TEST_F(StuckLogTest, RotationProceedsWithoutTheLockAfterAMinute) {
     test::writeFile(std::string(LOG) + ".3.xz", "archive");
-    expectToGoAheadAfterAMinute([this] { log.rotate(); });
+    expectToProceedAfterAMinute([this] { log.rotate(); });
     EXPECT_EQ(test::readFile(std::string(LOG) + ".4.xz"), "archive");
 }
 
-TEST_F(StuckLogTest, AnotherObjectForTheSameFilesDoesNotWait) {
+TEST_F(StuckLogTest, OtherLogObjectDoesNotWait) {
     DaemonLog other("/var/log/ha", "/ha.daemon.log");
     const test::Stopwatch stopwatch;
     other.set("at once");

@@ -3,7 +3,7 @@
 
 namespace {
 
-// Made before the log objects of this file, and so destroyed after all that they could be destroyed with.
+// Constructed before the log objects of this file, and so destroyed after them.
 struct LastWord {
     ~LastWord();
     bool isWanted = false;
@@ -21,8 +21,8 @@ LastWord::~LastWord() {
     }
 }
 
-// To be watched from outside: logs as many lines as its argument says; with "move" moves the buffered lines,
-// with "rotate" rotates, with "end" logs when its static objects are destroyed.
+// Run under strace. The argument is a number of lines to log, "move" to move the buffered lines to
+// disk, "rotate", or "end" to log while static objects are destroyed.
 int main(int argc, char** argv) {
     const char* const action = argc > 1 ? argv[1] : "";
     TERN::HA::Daemon::DaemonLog log("/var/log/ha", "/probe.log");

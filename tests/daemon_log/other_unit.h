@@ -2,16 +2,16 @@
 
 #include "daemon_log.h"
 
-// A second source file with a pair of log objects of its own.
+// A second source file, with its own pair of log objects.
 namespace test {
 
 TERN::HA::Daemon::DaemonLog* otherDaemonLog();
 TERN::HA::Daemon::DaemonLog* otherRecordLog();
 
-// Logs through this file's own object.
+// Log through this file's log object.
 void logFromOtherUnit(const char* message);
 
-// Whether this file's log objects were there when its own static objects were made.
+// Return whether this file's log objects existed when its other static objects were constructed.
 bool wereLogsReadyDuringInitialisation();
 
 }  // namespace test

@@ -33,7 +33,7 @@ class RotationTest : public test::SandboxTest {
     DaemonLog log{"/var/log/ha", "/ha.daemon.log"};
 };
 
-TEST_F(RotationTest, TheLogBecomesArchive0) {
+TEST_F(RotationTest, LogBecomesArchive0) {
     test::writeFile(LOG, "lines\n");
     log.rotate();
     EXPECT_FALSE(test::exists(LOG));
@@ -41,7 +41,7 @@ TEST_F(RotationTest, TheLogBecomesArchive0) {
     EXPECT_EQ(uncompressed(archive(0) + ".xz"), "lines\n");
 }
 
-TEST_F(RotationTest, ItsStepsAreTrueWhenTheyFailed) {
+TEST_F(RotationTest, StepsReturnTrueOnFailure) {
     test::writeFile("/tmp/a", "lines\n");
     EXPECT_FALSE(log._xz("/tmp/a"));
     EXPECT_TRUE(log._xz("/tmp/a"));
@@ -50,7 +50,7 @@ TEST_F(RotationTest, ItsStepsAreTrueWhenTheyFailed) {
     EXPECT_EQ(uncompressed("/tmp/b.xz"), "lines\n");
 }
 
-TEST_F(RotationTest, WithAllArchivesTheLastIsLostAndTheOthersMoveUp) {
+TEST_F(RotationTest, OldestOfFortyArchivesIsDropped) {
     for (int number = 0; number < 40; ++number) {
         compress(archive(number), std::to_string(number));
     }
@@ -64,7 +64,7 @@ TEST_F(RotationTest, WithAllArchivesTheLastIsLostAndTheOthersMoveUp) {
     EXPECT_FALSE(test::exists(archive(40) + ".xz"));
 }
 
-TEST_F(RotationTest, AGapMovesUp) {
+TEST_F(RotationTest, GapBetweenArchivesMovesUp) {
     compress(archive(0), "zero");
     compress(archive(2), "two");
     test::writeFile(LOG, "log");
@@ -75,14 +75,14 @@ TEST_F(RotationTest, AGapMovesUp) {
     EXPECT_EQ(uncompressed(archive(3) + ".xz"), "two");
 }
 
-TEST_F(RotationTest, WithoutALogTheArchivesMoveUpAllTheSame) {
+TEST_F(RotationTest, ArchivesMoveUpWithoutALog) {
     compress(archive(0), "zero");
     log.rotate();
     EXPECT_FALSE(test::exists(archive(0) + ".xz"));
     EXPECT_EQ(uncompressed(archive(1) + ".xz"), "zero");
 }
 
-TEST_F(RotationTest, AnUncompressedArchiveIsCompressedAndMovesUp) {
+TEST_F(RotationTest, UncompressedArchiveIsCompressed) {
     test::writeFile(archive(5), "five");
     log.rotate();
     EXPECT_FALSE(test::exists(archive(5)));
@@ -90,7 +90,7 @@ TEST_F(RotationTest, AnUncompressedArchiveIsCompressedAndMovesUp) {
     EXPECT_EQ(uncompressed(archive(6) + ".xz"), "five");
 }
 
-TEST_F(RotationTest, AnUncompressedLastArchiveIsReplacedByTheOneBefore) {
+TEST_F(RotationTest, UncompressedOldestArchiveIsReplaced) {
     compress(archive(38), "thirty-eight");
     test::writeFile(archive(39), "thirty-nine");
     log.rotate();
@@ -98,7 +98,7 @@ TEST_F(RotationTest, AnUncompressedLastArchiveIsReplacedByTheOneBefore) {
     EXPECT_EQ(uncompressed(archive(39) + ".xz"), "thirty-eight");
 }
 
-TEST_F(RotationTest, ALogWhoseArchiveIsInTheWayStaysUncompressed) {
+TEST_F(RotationTest, ExistingCompressedLogDelaysCompression) {
     test::writeFile(LOG, "new");
     compress(std::string(LOG) + ".copy", "old");
     ASSERT_EQ(test::run({"mv", std::string(LOG) + ".copy.xz", std::string(LOG) + ".xz"}).exitCode, 0);
@@ -111,7 +111,7 @@ TEST_F(RotationTest, ALogWhoseArchiveIsInTheWayStaysUncompressed) {
     EXPECT_EQ(uncompressed(archive(1) + ".xz"), "old");
 }
 
-TEST_F(RotationTest, AnUncompressedArchiveWithACompressedNamesakeWaitsForTheNextRotation) {
+TEST_F(RotationTest, ExistingCompressedArchiveDelaysCompression) {
     compress(archive(5), "compressed");
     test::writeFile(archive(5), "uncompressed");
     log.rotate();
@@ -123,7 +123,7 @@ TEST_F(RotationTest, AnUncompressedArchiveWithACompressedNamesakeWaitsForTheNext
     EXPECT_EQ(uncompressed(archive(7) + ".xz"), "compressed");
 }
 
-TEST_F(RotationTest, WithoutXzNothingIsLost) {
+TEST_F(RotationTest, FailedCompressionKeepsTheLog) {
     test::writeFile(LOG, "lines\n");
     test::hideProgram("/bin/xz");
     log.rotate();
@@ -133,7 +133,7 @@ TEST_F(RotationTest, WithoutXzNothingIsLost) {
     EXPECT_EQ(uncompressed(archive(0) + ".xz"), "lines\n");
 }
 
-TEST_F(RotationTest, OneLogLeavesTheOtherAlone) {
+TEST_F(RotationTest, OtherLogIsNotRotated) {
     test::writeFile(LOG, "daemon");
     test::writeFile("/var/log/ha/ha.daemon.record", "record");
     log.rotate();
@@ -141,7 +141,7 @@ TEST_F(RotationTest, OneLogLeavesTheOtherAlone) {
     EXPECT_FALSE(test::exists("/var/log/ha/ha.daemon.record.0.xz"));
 }
 
-TEST_F(RotationTest, TheNextMoveMakesANewLog) {
+TEST_F(RotationTest, NextMoveCreatesANewLog) {
     log.set("first");
     log.writeLogToDisk();
     log.rotate();
@@ -150,7 +150,7 @@ TEST_F(RotationTest, TheNextMoveMakesANewLog) {
     EXPECT_THAT(test::messages(test::readFile(LOG)), ElementsAre("second"));
 }
 
-TEST_F(RotationTest, SizeIsThatOfTheLog) {
+TEST_F(RotationTest, SizeIsThatOfTheLogOnDisk) {
     EXPECT_EQ(log.size(), 0);
     test::writeFile("/tmp/ha/ha.daemon.log", "buffered lines do not count");
     EXPECT_EQ(log.size(), 0);
@@ -160,7 +160,7 @@ TEST_F(RotationTest, SizeIsThatOfTheLog) {
     EXPECT_EQ(log.size(), 0);
 }
 
-TEST_F(RotationTest, SizeOfALargeLogIsTrue) {
+TEST_F(RotationTest, SizeMayExceed32Bits) {
     constexpr std::int64_t FIVE_GIB = std::int64_t{5} << 30;
     test::writeFile(LOG, "");
     ASSERT_EQ(truncate(LOG, FIVE_GIB), 0);

@@ -17,8 +17,8 @@ using namespace std::chrono_literals;
 using namespace std::string_literals;
 using test::arrived;
 using test::FakePeer;
-using test::kPeerAddress;
-using test::kPeerPort;
+using test::PEER_ADDRESS;
+using test::PEER_PORT;
 using test::UdpSocket;
 using ::testing::AllOf;
 using ::testing::Each;
@@ -28,108 +28,108 @@ using ::testing::SizeIs;
 
 namespace {
 
-class Question : public EnvCheck {
+class TestCheck : public EnvCheck {
  public:
     using EnvCheck::_sendToRemote;
-    std::string getType() override { return "question"; }
+    std::string getType() override { return "test_request"; }
 };
 
-class NamelessQuestion : public EnvCheck {
+class NamelessCheck : public EnvCheck {
  public:
     using EnvCheck::_sendToRemote;
 };
 
 class ExchangeTest : public test::SandboxTest {
  protected:
-    Question question;
+    TestCheck check;
     std::string reply = "before";
 };
 
-TEST_F(ExchangeTest, SendsTheTypeNameAndTakesTheAnswer) {
-    FakePeer peer("answer");
-    remoteIP(kPeerAddress);
-    EXPECT_TRUE(question._sendToRemote(reply));
-    EXPECT_EQ(reply, "answer");
-    EXPECT_THAT(peer.questions(), ElementsAre("question"));
+TEST_F(ExchangeTest, SendsTheTypeNameAndReturnsTheReply) {
+    FakePeer peer("reply");
+    remoteIP(PEER_ADDRESS);
+    EXPECT_TRUE(check._sendToRemote(reply));
+    EXPECT_EQ(reply, "reply");
+    EXPECT_THAT(peer.requests(), ElementsAre("test_request"));
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(ExchangeTest, AnEmptyAnswerIsAnAnswer) {
+TEST_F(ExchangeTest, EmptyReplyIsAReply) {
     FakePeer peer("");
-    remoteIP(kPeerAddress);
-    EXPECT_TRUE(question._sendToRemote(reply));
+    remoteIP(PEER_ADDRESS);
+    EXPECT_TRUE(check._sendToRemote(reply));
     EXPECT_EQ(reply, "");
 }
 
-TEST_F(ExchangeTest, TheAnswerIsCutAt63Characters) {
+TEST_F(ExchangeTest, ReplyIsTruncatedTo63Characters) {
     FakePeer peer(std::string(63, 'x') + "yyyyyyy");
-    remoteIP(kPeerAddress);
-    EXPECT_TRUE(question._sendToRemote(reply));
+    remoteIP(PEER_ADDRESS);
+    EXPECT_TRUE(check._sendToRemote(reply));
     EXPECT_EQ(reply, std::string(63, 'x'));
 }
 
-TEST_F(ExchangeTest, TheAnswerEndsAtAZeroByte) {
-    FakePeer peer("ans\0wer"s);
-    remoteIP(kPeerAddress);
-    EXPECT_TRUE(question._sendToRemote(reply));
-    EXPECT_EQ(reply, "ans");
+TEST_F(ExchangeTest, ReplyEndsAtFirstZeroByte) {
+    FakePeer peer("rep\0ly"s);
+    remoteIP(PEER_ADDRESS);
+    EXPECT_TRUE(check._sendToRemote(reply));
+    EXPECT_EQ(reply, "rep");
 }
 
-TEST_F(ExchangeTest, ACheckWithoutATypeNameAsksUndefine) {
-    FakePeer peer("answer");
-    remoteIP(kPeerAddress);
-    EXPECT_TRUE(NamelessQuestion()._sendToRemote(reply));
-    EXPECT_THAT(peer.questions(), ElementsAre("Undefine"));
+TEST_F(ExchangeTest, CheckWithoutATypeNameSendsUndefine) {
+    FakePeer peer("reply");
+    remoteIP(PEER_ADDRESS);
+    EXPECT_TRUE(NamelessCheck()._sendToRemote(reply));
+    EXPECT_THAT(peer.requests(), ElementsAre("Undefine"));
 }
 
-TEST_F(ExchangeTest, AsksOnceAndGivesUpAfterThreeSeconds) {
-    UdpSocket peer(kPeerAddress, kPeerPort);
-    remoteIP(kPeerAddress);
+TEST_F(ExchangeTest, SendsOneRequestAndTimesOutAfterThreeSeconds) {
+    UdpSocket peer(PEER_ADDRESS, PEER_PORT);
+    remoteIP(PEER_ADDRESS);
     const test::Stopwatch watch;
-    EXPECT_FALSE(question._sendToRemote(reply));
+    EXPECT_FALSE(check._sendToRemote(reply));
     EXPECT_GE(watch.elapsed(), 3s);
     EXPECT_EQ(test::receiveTimeout(), 3s);
     EXPECT_EQ(reply, "before");
-    EXPECT_THAT(arrived(peer), ElementsAre("question"));
+    EXPECT_THAT(arrived(peer), ElementsAre("test_request"));
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(ExchangeTest, WithoutARemoteAddressAsks0000) {
+TEST_F(ExchangeTest, MissingRemoteAddressCountsAs0000) {
     ASSERT_EQ(remoteIP(""), "");
-    UdpSocket own("127.0.0.1", kPeerPort);
+    UdpSocket own("127.0.0.1", PEER_PORT);
     const test::Stopwatch watch;
-    EXPECT_FALSE(question._sendToRemote(reply));
+    EXPECT_FALSE(check._sendToRemote(reply));
     EXPECT_GE(watch.elapsed(), 3s);
     EXPECT_EQ(reply, "before");
-    EXPECT_THAT(arrived(own), ElementsAre("question"));
+    EXPECT_THAT(arrived(own), ElementsAre("test_request"));
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(ExchangeTest, NobodyAtThePeersPortIsNoAnswer) {
-    remoteIP(kPeerAddress);
+TEST_F(ExchangeTest, ClosedPeerPortTimesOut) {
+    remoteIP(PEER_ADDRESS);
     const test::Stopwatch watch;
-    EXPECT_FALSE(question._sendToRemote(reply));
+    EXPECT_FALSE(check._sendToRemote(reply));
     EXPECT_GE(watch.elapsed(), 3s);
     EXPECT_EQ(reply, "before");
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(ExchangeTest, AQuestionThatCannotBeSentIsNoAnswer) {
+TEST_F(ExchangeTest, SendFailureTimesOut) {
     remoteIP("255.255.255.255");
     const test::Stopwatch watch;
-    EXPECT_FALSE(question._sendToRemote(reply));
+    EXPECT_FALSE(check._sendToRemote(reply));
     EXPECT_GE(watch.elapsed(), 3s);
     EXPECT_EQ(reply, "before");
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(ExchangeTest, WithoutASocketNothingIsSentAndTheLogSaysSo) {
+TEST_F(ExchangeTest, SocketFailureIsLoggedAndNothingIsSent) {
     test::SystemLog systemLog;
-    UdpSocket peer(kPeerAddress, kPeerPort);
-    remoteIP(kPeerAddress);
+    UdpSocket peer(PEER_ADDRESS, PEER_PORT);
+    remoteIP(PEER_ADDRESS);
     {
         const test::FailingCall failing("socket", EMFILE);
-        EXPECT_FALSE(question._sendToRemote(reply));
+        EXPECT_FALSE(check._sendToRemote(reply));
     }
     EXPECT_EQ(reply, "before");
     EXPECT_THAT(arrived(peer), IsEmpty());
@@ -138,12 +138,12 @@ TEST_F(ExchangeTest, WithoutASocketNothingIsSentAndTheLogSaysSo) {
     EXPECT_THAT(systemLog.texts(), ElementsAre(test::LogLine("chkstate.cpp", "Failed to set socket")));
 }
 
-TEST_F(ExchangeTest, WithoutATimeoutNothingIsSentAndTheLogSaysSo) {
-    UdpSocket peer(kPeerAddress, kPeerPort);
-    remoteIP(kPeerAddress);
+TEST_F(ExchangeTest, TimeoutOptionFailureIsLoggedAndNothingIsSent) {
+    UdpSocket peer(PEER_ADDRESS, PEER_PORT);
+    remoteIP(PEER_ADDRESS);
     {
         const test::FailingCall failing("setsockopt", EDOM);
-        EXPECT_FALSE(question._sendToRemote(reply));
+        EXPECT_FALSE(check._sendToRemote(reply));
     }
     EXPECT_EQ(reply, "before");
     EXPECT_THAT(arrived(peer), IsEmpty());
@@ -151,40 +151,40 @@ TEST_F(ExchangeTest, WithoutATimeoutNothingIsSentAndTheLogSaysSo) {
                 ElementsAre(test::LogLine("env_check.cpp", "Failed to start socket client")));
 }
 
-TEST_F(ExchangeTest, TakesTheFirstDatagramThatReachesItFromAnybody) {
-    UdpSocket peer(kPeerAddress, kPeerPort);
-    remoteIP(kPeerAddress);
-    std::thread stranger([&] {
+TEST_F(ExchangeTest, DatagramFromAnotherAddressIsTakenAsTheReply) {
+    UdpSocket peer(PEER_ADDRESS, PEER_PORT);
+    remoteIP(PEER_ADDRESS);
+    std::thread other([&] {
         const auto asked = peer.receive(10s);
         if (asked) {
-            UdpSocket("127.0.0.3").send("from a stranger", asked->address, asked->port);
+            UdpSocket("127.0.0.3").send("from another address", asked->address, asked->port);
         }
     });
-    EXPECT_TRUE(question._sendToRemote(reply));
-    stranger.join();
-    EXPECT_EQ(reply, "from a stranger");
+    EXPECT_TRUE(check._sendToRemote(reply));
+    other.join();
+    EXPECT_EQ(reply, "from another address");
 }
 
-TEST_F(ExchangeTest, ManyThreadsAskAtOnce) {
-    constexpr int kThreads = 8;
-    constexpr int kQuestions = 50;
-    FakePeer peer("answer");
-    remoteIP(kPeerAddress);
-    std::vector<std::vector<std::string>> answers(kThreads);
+TEST_F(ExchangeTest, ConcurrentRequestsGetTheirReplies) {
+    constexpr int THREADS = 8;
+    constexpr int REQUESTS = 50;
+    FakePeer peer("reply");
+    remoteIP(PEER_ADDRESS);
+    std::vector<std::vector<std::string>> replies(THREADS);
     std::vector<std::thread> threads;
-    for (auto& own : answers) {
+    for (auto& own : replies) {
         threads.emplace_back([&own] {
-            for (int i = 0; i < kQuestions; ++i) {
-                std::string answer;
-                own.push_back(Question()._sendToRemote(answer) ? answer : "nothing");
+            for (int i = 0; i < REQUESTS; ++i) {
+                std::string received;
+                own.push_back(TestCheck()._sendToRemote(received) ? received : "nothing");
             }
         });
     }
     for (std::thread& thread : threads) {
         thread.join();
     }
-    EXPECT_THAT(answers, Each(AllOf(SizeIs(kQuestions), Each("answer"))));
-    EXPECT_THAT(peer.questions(), AllOf(SizeIs(kThreads * kQuestions), Each("question")));
+    EXPECT_THAT(replies, Each(AllOf(SizeIs(REQUESTS), Each("reply"))));
+    EXPECT_THAT(peer.requests(), AllOf(SizeIs(THREADS * REQUESTS), Each("test_request")));
 }
 
 }  // namespace

@@ -1,5 +1,5 @@
-// A host daemon that looks its factories up in the registry. Built in several ways, which differ in where
-// the address of a function template's instance comes from.
+// A host daemon that compares the registry with its own factories. Built in several ways, which
+// differ in how the address of a template instance is resolved.
 
 #include <cstdio>
 

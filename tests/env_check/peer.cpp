@@ -13,27 +13,27 @@ using namespace std::chrono_literals;
 
 namespace test {
 
-FakePeer::FakePeer(const std::string& answer)
-    : answer_(answer), socket_(kPeerAddress, kPeerPort), thread_(&FakePeer::serve, this) {}
+FakePeer::FakePeer(const std::string& reply)
+    : _reply(reply), _socket(PEER_ADDRESS, PEER_PORT), _thread(&FakePeer::serve, this) {}
 
 FakePeer::~FakePeer() {
-    stopped_ = true;
-    thread_.join();
+    _stopped = true;
+    _thread.join();
 }
 
-std::vector<std::string> FakePeer::questions() {
-    const std::lock_guard lock(mutex_);
-    return questions_;
+std::vector<std::string> FakePeer::requests() {
+    const std::lock_guard lock(_mutex);
+    return _requests;
 }
 
 void FakePeer::serve() {
-    while (!stopped_) {
-        if (const std::optional<Datagram> question = socket_.receive(10ms)) {
+    while (!_stopped) {
+        if (const std::optional<Datagram> request = _socket.receive(10ms)) {
             {
-                const std::lock_guard lock(mutex_);
-                questions_.push_back(question->bytes);
+                const std::lock_guard lock(_mutex);
+                _requests.push_back(request->bytes);
             }
-            socket_.send(answer_, question->address, question->port);
+            _socket.send(_reply, request->address, request->port);
         }
     }
 }

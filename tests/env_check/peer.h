@@ -9,40 +9,40 @@
 
 #include "support/udp.h"
 
-/// The two ends of the peer protocol as tests see them, on addresses of the loopback network.
+/// Both ends of the peer protocol for tests, on loopback addresses.
 namespace test {
 
-constexpr std::uint16_t kPeerPort = 7499;
-constexpr const char* kPeerAddress = "127.0.0.2";
-constexpr const char* kServer = "127.0.0.2";  ///< where a server under test serves
+constexpr std::uint16_t PEER_PORT = 7499;
+constexpr const char* PEER_ADDRESS = "127.0.0.2";
+constexpr const char* SERVER = "127.0.0.2";  ///< address of a server under test
 
-/// Stands in for the other node: gives the same answer to everyone who asks kPeerAddress.
+/// A stub peer that sends the same reply to every request at PEER_ADDRESS.
 class FakePeer {
  public:
-    explicit FakePeer(const std::string& answer);
+    explicit FakePeer(const std::string& reply);
     ~FakePeer();
 
     FakePeer(const FakePeer&) = delete;
     FakePeer& operator=(const FakePeer&) = delete;
 
-    /// The questions up to now.
-    std::vector<std::string> questions();
+    /// Return the requests received so far.
+    std::vector<std::string> requests();
 
  private:
     void serve();
 
-    const std::string answer_;
-    UdpSocket socket_;
-    std::atomic<bool> stopped_{false};
-    std::mutex mutex_;
-    std::vector<std::string> questions_;
-    std::thread thread_;
+    const std::string _reply;
+    UdpSocket _socket;
+    std::atomic<bool> _stopped{false};
+    std::mutex _mutex;
+    std::vector<std::string> _requests;
+    std::thread _thread;
 };
 
-/// The datagrams that have arrived at `socket` and were not received yet.
+/// Return the datagrams queued at `socket`.
 std::vector<std::string> arrived(UdpSocket& socket);
 
-/// Whether a UDP socket is bound to the address and port, as the kernel's list `table` has it.
+/// Return whether the kernel's table lists a UDP socket bound to the address and port.
 bool isBound(const std::string& address, std::uint16_t port, const std::string& table = "/proc/net/udp");
 
 }  // namespace test

@@ -36,7 +36,7 @@ std::vector<std::string> registeredNames() {
 
 const std::vector<std::string> namesBeforeMain = registeredNames();
 
-// Checks have no destructor to run, and a delete expression on one is a warning.
+// A delete expression would be a warning: checks have no virtual destructor.
 void release(EnvCheck* check) {
     ::operator delete(check);
 }
@@ -45,7 +45,7 @@ class Impostor : public EnvCheck {};
 
 class RegistryTest : public test::SandboxTest {};
 
-TEST_F(RegistryTest, HoldsTheFiveChecksBeforeAnyCodeOfTheHostRuns) {
+TEST_F(RegistryTest, HoldsTheFiveChecksBeforeMain) {
     EXPECT_THAT(namesBeforeMain, ElementsAre("is_alive", "is_disk_err_handling", "is_md_resync",
                                              "reboot_remote", "remote_hostname"));
 }
@@ -56,7 +56,7 @@ using Checks = ::testing::Types<IsRemoteAlive, IsRemoteMDResync, IsRemoteDiskErr
                                 GetRemoteHostname>;
 TYPED_TEST_SUITE(RegisteredCheckTest, Checks, );
 
-TYPED_TEST(RegisteredCheckTest, IsMadeByTheNameThatItGivesItself) {
+TYPED_TEST(RegisteredCheckTest, FactoryOfItsTypeNameCreatesIt) {
     TypeParam own;
     const auto entry = CheckerFactory::opMap->find(own.getType());
     ASSERT_NE(entry, CheckerFactory::opMap->end());
@@ -66,7 +66,7 @@ TYPED_TEST(RegisteredCheckTest, IsMadeByTheNameThatItGivesItself) {
     release(made);
 }
 
-TYPED_TEST(RegisteredCheckTest, IsNoMoreThanItsTableOfOperations) {
+TYPED_TEST(RegisteredCheckTest, HoldsOnlyTheVirtualTablePointer) {
     EXPECT_EQ(sizeof(TypeParam), sizeof(void*));
     static_assert(!std::has_virtual_destructor_v<TypeParam>);
     static_assert(std::is_trivially_destructible_v<TypeParam>);
@@ -74,19 +74,19 @@ TYPED_TEST(RegisteredCheckTest, IsNoMoreThanItsTableOfOperations) {
     static_assert(std::is_same_v<decltype(TypeParam::reg), CheckerRegister<TypeParam>>);
 }
 
-TEST_F(RegistryTest, ANameThatIsTakenKeepsItsFirstFactory) {
+TEST_F(RegistryTest, FirstFactoryOfANameWins) {
     const Factory first = CheckerFactory::opMap->at("is_alive");
     const CheckerRegister<Impostor> second("is_alive");
     EXPECT_EQ(CheckerFactory::opMap->at("is_alive"), first);
     EXPECT_NE(first, factoryOf<Impostor>());
 }
 
-TEST_F(RegistryTest, ANewNameGetsItsFactory) {
+TEST_F(RegistryTest, NewNameIsRegistered) {
     const CheckerRegister<Impostor> registration("new_check");
     EXPECT_EQ(CheckerFactory::opMap->at("new_check"), factoryOf<Impostor>());
 }
 
-TEST_F(RegistryTest, TheFirstRegistrationMakesTheMap) {
+TEST_F(RegistryTest, FirstRegistrationCreatesTheMap) {
     auto* const map = std::exchange(CheckerFactory::opMap, nullptr);
     const CheckerRegister<Impostor> registration("first_check");
     ASSERT_NE(CheckerFactory::opMap, nullptr);
@@ -95,7 +95,7 @@ TEST_F(RegistryTest, TheFirstRegistrationMakesTheMap) {
     delete std::exchange(CheckerFactory::opMap, map);
 }
 
-TEST_F(RegistryTest, ALibraryThatIsLoadedLaterAddsItsCheck) {
+TEST_F(RegistryTest, LibraryLoadedLaterRegistersItsCheck) {
     EXPECT_EQ(CheckerFactory::opMap->count("late_check"), 0U);
     void* const library = dlopen(LATE_CHECK, RTLD_NOW | RTLD_NODELETE);
     ASSERT_NE(library, nullptr) << dlerror();
@@ -108,7 +108,7 @@ TEST_F(RegistryTest, ALibraryThatIsLoadedLaterAddsItsCheck) {
     dlclose(library);
 }
 
-TEST_F(RegistryTest, TheBaseOfAllChecksAsksNothing) {
+TEST_F(RegistryTest, BaseClassSendsNothing) {
     EnvCheck check;
     Json::Value out = "before";
     Status status;
@@ -119,7 +119,7 @@ TEST_F(RegistryTest, TheBaseOfAllChecksAsksNothing) {
     EXPECT_EQ(check.getType(), "Undefine");
 }
 
-// The table of virtual operations, as a host that was built against other headers sees it.
+// Return the virtual table, as a host built against older headers sees it.
 using Slot = void (*)();
 const Slot* slotsOf(const EnvCheck& check) {
     const Slot* table = nullptr;
@@ -127,7 +127,7 @@ const Slot* slotsOf(const EnvCheck& check) {
     return table;
 }
 
-TEST_F(RegistryTest, TheVirtualOperationsStandInTheDocumentedOrder) {
+TEST_F(RegistryTest, VirtualFunctionsAreInTheDocumentedOrder) {
     EnvCheck base;
     const Slot* const slots = slotsOf(base);
     Json::Value out;
@@ -143,7 +143,7 @@ TEST_F(RegistryTest, TheVirtualOperationsStandInTheDocumentedOrder) {
     EXPECT_EQ(reinterpret_cast<std::string (*)(EnvCheck*)>(aliveSlots[3])(&alive), "is_alive");
 }
 
-// Which of the four operations a check has of its own.
+// Return which of the four virtual functions a check overrides.
 std::vector<bool> ownSlots(const EnvCheck& check) {
     const EnvCheck base;
     std::vector<bool> own;
@@ -153,7 +153,7 @@ std::vector<bool> ownSlots(const EnvCheck& check) {
     return own;
 }
 
-TEST_F(RegistryTest, EachCheckOverridesItsOwnOperationsOnly) {
+TEST_F(RegistryTest, EachCheckOverridesOnlyItsOwnFunctions) {
     EXPECT_THAT(ownSlots(IsRemoteAlive()), ElementsAre(true, false, true, true));
     EXPECT_THAT(ownSlots(IsRemoteMDResync()), ElementsAre(true, false, true, true));
     EXPECT_THAT(ownSlots(IsRemoteDiskErrHandling()), ElementsAre(false, true, true, true));
@@ -161,7 +161,7 @@ TEST_F(RegistryTest, EachCheckOverridesItsOwnOperationsOnly) {
     EXPECT_THAT(ownSlots(GetRemoteHostname()), ElementsAre(false, false, true, true));
 }
 
-TEST_F(RegistryTest, TheHostnameCheckKeepsTheCallsThatAskNothing) {
+TEST_F(RegistryTest, HostnameCheckInheritsOperatorsThatSendNothing) {
     GetRemoteHostname check;
     EnvCheck& base = check;
     Json::Value out = "before";
@@ -179,23 +179,23 @@ class AddressTest : public test::SandboxTest, public ::testing::WithParamInterfa
     const AddressFunction address = addressFunctions.at(GetParam());
 };
 
-TEST_P(AddressTest, IsEmptyAtFirst) {
+TEST_P(AddressTest, IsInitiallyEmpty) {
     EXPECT_EQ(address(""), "");
 }
 
-TEST_P(AddressTest, IsKeptOnceSetAndReadWithAnEmptyText) {
+TEST_P(AddressTest, EmptyArgumentReturnsTheStoredValue) {
     EXPECT_EQ(address("10.0.0.2"), "10.0.0.2");
     EXPECT_EQ(address(""), "10.0.0.2");
     EXPECT_EQ(address(""), "10.0.0.2");
 }
 
-TEST_P(AddressTest, IsReplacedByALaterText) {
+TEST_P(AddressTest, NonEmptyArgumentReplacesTheValue) {
     address("10.0.0.2");
     EXPECT_EQ(address("any text"), "any text");
     EXPECT_EQ(address(""), "any text");
 }
 
-TEST_P(AddressTest, IsApartFromTheOthers) {
+TEST_P(AddressTest, IsIndependentOfTheOthers) {
     address("10.0.0.2");
     for (const auto& [name, other] : addressFunctions) {
         EXPECT_EQ(other(""), name == GetParam() ? "10.0.0.2" : "") << name;

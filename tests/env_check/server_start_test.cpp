@@ -1,4 +1,4 @@
-// The first pass of a server, and servers that could not start.
+// The first pass of a server, and servers that fail to start.
 
 #include <cerrno>
 #include <chrono>
@@ -18,22 +18,22 @@ using namespace std::chrono_literals;
 using TERN::HA::Daemon::Status;
 using test::arrived;
 using test::isBound;
-using test::kPeerPort;
-using test::kServer;
 using test::LogLine;
+using test::PEER_PORT;
+using test::SERVER;
 using test::UdpSocket;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
 namespace {
 
-// The socket of a server stays open until the process ends, and so these tests do not look at descriptors.
+// No SandboxTest, which would report the server socket, open until the process ends, as a leak.
 class ServerStartTest : public ::testing::Test {
  protected:
     void SetUp() override { test::makeDirectories("/tmp/ha"); }
 
-    // Every pass of a broken server says `line`, at once and whatever the error number is by then.
-    void expectBroken(const std::string& line) {
+    // Every pass of a failed server logs `line` and returns early, whatever errno is by then.
+    void expectFailure(const std::string& line) {
         const test::Stopwatch watch;
         EXPECT_FALSE(server(status));
         errno = ENOENT;
@@ -50,58 +50,58 @@ class ServerStartTest : public ::testing::Test {
 };
 
 TEST_F(ServerStartTest, NothingIsBoundBeforeTheFirstPass) {
-    localIP(kServer);
-    EXPECT_FALSE(isBound(kServer, kPeerPort));
-    EXPECT_FALSE(isBound("0.0.0.0", kPeerPort));
+    localIP(SERVER);
+    EXPECT_FALSE(isBound(SERVER, PEER_PORT));
+    EXPECT_FALSE(isBound("0.0.0.0", PEER_PORT));
 }
 
-TEST_F(ServerStartTest, WithoutALocalAddressListensOnAllAddresses) {
+TEST_F(ServerStartTest, MissingLocalAddressListensOnAllAddresses) {
     ASSERT_EQ(localIP(""), "");
     auto pass = std::async(std::launch::async, [this] { return server(status); });
-    ASSERT_TRUE(test::eventually(10s, [] { return isBound("0.0.0.0", kPeerPort); }));
-    UdpSocket asker;
-    asker.send("is_alive", "127.0.0.77", kPeerPort);
+    ASSERT_TRUE(test::eventually(10s, [] { return isBound("0.0.0.0", PEER_PORT); }));
+    UdpSocket client;
+    client.send("is_alive", "127.0.0.77", PEER_PORT);
     EXPECT_TRUE(pass.get());
     EXPECT_EQ(test::receiveTimeout(), 30s);
-    EXPECT_THAT(arrived(asker), ElementsAre("alive"));
+    EXPECT_THAT(arrived(client), ElementsAre("alive"));
 }
 
-TEST_F(ServerStartTest, APortThatIsTakenBreaksTheServerForGood) {
-    UdpSocket owner(kServer, kPeerPort);
-    localIP(kServer);
-    expectBroken("Failed to start socket serverAddress already in use");
+TEST_F(ServerStartTest, PortInUseFailsForGood) {
+    UdpSocket owner(SERVER, PEER_PORT);
+    localIP(SERVER);
+    expectFailure("Failed to start socket serverAddress already in use");
 
     owner = UdpSocket();
-    ASSERT_FALSE(isBound(kServer, kPeerPort));
+    ASSERT_FALSE(isBound(SERVER, PEER_PORT));
     EXPECT_FALSE(server(status));
-    EXPECT_FALSE(isBound(kServer, kPeerPort));
+    EXPECT_FALSE(isBound(SERVER, PEER_PORT));
 }
 
-TEST_F(ServerStartTest, AnAddressOfAnotherHostBreaksTheServer) {
+TEST_F(ServerStartTest, ForeignAddressFailsForGood) {
     localIP("192.0.2.1");
-    expectBroken("Failed to start socket serverCannot assign requested address");
-    localIP(kServer);
+    expectFailure("Failed to start socket serverCannot assign requested address");
+    localIP(SERVER);
     EXPECT_FALSE(server(status));
 }
 
-TEST_F(ServerStartTest, NoSocketBreaksTheServerAndBothLogsSaySo) {
+TEST_F(ServerStartTest, SocketFailureIsLoggedToBothLogs) {
     test::SystemLog systemLog;
-    localIP(kServer);
+    localIP(SERVER);
     {
         const test::FailingCall failing("socket", EMFILE);
         EXPECT_FALSE(server(status));
     }
     test::writeFile("/tmp/ha/ha.daemon.log", "");
-    expectBroken("Failed to start socket serverToo many open files");
+    expectFailure("Failed to start socket serverToo many open files");
     EXPECT_THAT(systemLog.texts(), ElementsAre(LogLine("chkstate.cpp", "Failed to set socket")));
 }
 
-TEST_F(ServerStartTest, NoTimeoutBreaksTheServer) {
+TEST_F(ServerStartTest, TimeoutOptionFailureFailsForGood) {
     test::SystemLog systemLog;
-    localIP(kServer);
+    localIP(SERVER);
     const test::FailingCall failing("setsockopt", EDOM);
-    expectBroken("Failed to start socket serverNumerical argument out of domain");
-    EXPECT_FALSE(isBound(kServer, kPeerPort));
+    expectFailure("Failed to start socket serverNumerical argument out of domain");
+    EXPECT_FALSE(isBound(SERVER, PEER_PORT));
     EXPECT_THAT(systemLog.texts(), IsEmpty());
 }
 

@@ -11,7 +11,7 @@ using namespace std::chrono_literals;
 
 namespace {
 
-TEST(ServerTimeoutTest, APassWithNothingArrivingReturnsTrueAfterThirtySecondsWithoutAWord) {
+TEST(ServerTimeoutTest, IdlePassReturnsTrueAfterThirtySeconds) {
     test::makeDirectories("/tmp/ha");
     localIP("127.0.0.2");
     TERN::HA::Daemon::Status status;
@@ -20,7 +20,7 @@ TEST(ServerTimeoutTest, APassWithNothingArrivingReturnsTrueAfterThirtySecondsWit
     EXPECT_GE(watch.elapsed(), 30s);
     EXPECT_LT(watch.elapsed(), 60s);
     EXPECT_EQ(test::bufferText(), "");
-    EXPECT_TRUE(test::isBound("127.0.0.2", test::kPeerPort));
+    EXPECT_TRUE(test::isBound("127.0.0.2", test::PEER_PORT));
 }
 
 }  // namespace

@@ -26,7 +26,7 @@ std::vector<unsigned int> asked;
 
 }  // namespace
 
-// The dynamic linker takes these before those of the C library, for every library of the process.
+// Interposed for every library of the process.
 
 int clock_gettime(clockid_t clock, timespec* now) noexcept {
     const int result = static_cast<int>(syscall(CLOCK_GETTIME, clock, now));
@@ -85,7 +85,7 @@ FixedTime::~FixedTime() {
     fixedTime = 0;
 }
 
-void stepClockAfterNextLook(std::chrono::seconds step) {
+void stepClockAfterNextRead(std::chrono::seconds step) {
     nextStep = step.count();
 }
 
@@ -102,7 +102,7 @@ std::chrono::milliseconds NoSleep::total() {
     return std::chrono::duration_cast<std::chrono::milliseconds>(slept.load());
 }
 
-int zoneLooks() {
+int timeZoneReads() {
     return looks;
 }
 

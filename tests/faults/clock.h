@@ -5,10 +5,10 @@
 #include <functional>
 #include <vector>
 
-/// The clocks of the library under test: put in front of the C library's functions.
+/// Clocks of the library under test: interposes functions of the C library.
 namespace test {
 
-/// While the object lives, time() is `now`.
+/// Makes time() return `now` for the lifetime of the object.
 class FixedTime {
  public:
     explicit FixedTime(std::time_t now);
@@ -18,11 +18,11 @@ class FixedTime {
     FixedTime& operator=(const FixedTime&) = delete;
 };
 
-/// The wall clock is set forward by `step`, back when that is negative, right after the process has looked at
-/// it for the next time.
-void stepClockAfterNextLook(std::chrono::seconds step);
+/// Step the wall clock by `step`, which may be negative, after the next time that the process reads
+/// it.
+void stepClockAfterNextRead(std::chrono::seconds step);
 
-/// While the object lives, nanosleep() returns at once.
+/// Makes nanosleep() return immediately for the lifetime of the object.
 class NoSleep {
  public:
     NoSleep();
@@ -31,14 +31,14 @@ class NoSleep {
     NoSleep(const NoSleep&) = delete;
     NoSleep& operator=(const NoSleep&) = delete;
 
-    /// How long these sleeps should have been, together.
+    /// Return the sum of the requested sleeps.
     static std::chrono::milliseconds total();
 };
 
-/// How often the process has looked at the machine's time zone.
-int zoneLooks();
+/// Return how often the process has read the machine's time zone.
+int timeZoneReads();
 
-/// While the object lives, sleep() returns at once after calling `onSleep` with the number of the call,
+/// Makes sleep() return immediately after calling `onSleep` with the number of the call, counted
 /// from 1.
 class FastSleep {
  public:
@@ -48,7 +48,7 @@ class FastSleep {
     FastSleep(const FastSleep&) = delete;
     FastSleep& operator=(const FastSleep&) = delete;
 
-    /// What was asked for, in seconds.
+    /// Return the requested sleeps in seconds.
     static std::vector<unsigned int> sleeps();
 };
 

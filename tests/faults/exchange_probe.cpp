@@ -1,4 +1,5 @@
-// Asks the peer at the address in the argument once. The two calls of getppid() mark the exchange in a trace.
+// Sends one liveness probe to the address in its argument. Calls of getppid() mark begin and end in
+// a trace.
 
 #include <unistd.h>
 

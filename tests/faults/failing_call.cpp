@@ -31,7 +31,7 @@ thread_local std::string failing;
 thread_local int countdown = 0;
 thread_local int failure = 0;
 
-// Counts the call, and tells whether it is one to fail; errno is set then.
+// Count the call and return whether it must fail; if so, errno is set.
 bool fails(const char* function) {
     if (counted != nullptr) {
         std::map<std::string, int>* const counts = std::exchange(counted, nullptr);
@@ -52,8 +52,7 @@ bool fails(const char* function) {
 
 }  // namespace
 
-// Puts a function in front of the C library's: it fails when `fails(KEY)` says so, and calls the real one
-// otherwise.
+// Defines an interposed function: it fails if `fails(KEY)`, and calls the real function otherwise.
 #define INTERPOSE(RESULT, NAME, KEY, FAILURE, PARAMETERS, ARGUMENTS, SPECIFIER) \
     RESULT NAME PARAMETERS SPECIFIER {                                          \
         static auto* const real = test::realFunction<RESULT PARAMETERS>(#NAME); \
@@ -86,7 +85,7 @@ INTERPOSE(int, pipe2, "pipe", -1, (int* ends, int flags), (ends, flags), noexcep
 INTERPOSE(FILE*, fdopen, "fdopen", nullptr, (int fd, const char* mode), (fd, mode), noexcept)
 // clang-format on
 
-// With 64-bit time on 32 bits these have other names.
+// The names with 64-bit time on 32-bit machines.
 
 int setsockopt(int fd, int level, int name, const void* value, socklen_t size) noexcept {
     static auto* const real =
@@ -108,7 +107,7 @@ int stat(const char* path, struct stat* info) noexcept {
     return fails("stat") ? -1 : real(path, info);
 }
 
-// Opened for the library with a mode only where it is made.
+// The mode is passed only with O_CREAT.
 int open64(const char* path, int flags, ...) {
     static auto* const real = test::realFunction<int(const char*, int, ...)>("open64");
     va_list arguments;

@@ -5,11 +5,11 @@
 #include <map>
 #include <string>
 
-/// Calls of the C library that a test can watch and let fail. They are put in front of the C library's own,
-/// for every library of the process; the library under test is as it is installed.
+/// Fault injection: functions of the C library that tests can count and make fail. They are
+/// interposed for every library of the process; the library under test is the installed one.
 namespace test {
 
-/// Counts the calls of this thread while it lives.
+/// Counts the calls of this thread for the lifetime of the object.
 class CallCounter {
  public:
     CallCounter();
@@ -18,17 +18,18 @@ class CallCounter {
     CallCounter(const CallCounter&) = delete;
     CallCounter& operator=(const CallCounter&) = delete;
 
-    /// How often each function was called so far.
+    /// Return the number of calls of each function so far.
     std::map<std::string, int> counts() const;
 };
 
-/// Lets calls of a function fail while it lives. One at a time.
+/// Makes calls of a function fail for the lifetime of the object. Only one object may exist at a
+/// time.
 class FailingCall {
  public:
-    /// Every call fails with `error`, in every thread.
+    /// Every call fails with the errno `error`, in every thread.
     FailingCall(const char* function, int error);
 
-    /// The `number`th call by this thread, counted from 1, fails with `error`.
+    /// The `number`th call of this thread, counted from 1, fails with the errno `error`.
     FailingCall(const std::string& function, int number, int error);
 
     ~FailingCall();
@@ -36,16 +37,17 @@ class FailingCall {
     FailingCall(const FailingCall&) = delete;
     FailingCall& operator=(const FailingCall&) = delete;
 
-    /// Whether the `number`th call has come.
+    /// Return whether the `number`th call has happened.
     bool hasFailed() const;
 };
 
-/// What a socket of this process was given last: the length of its queue (-1 when none was), and the time-out
-/// for receiving (-1 s).
+/// Return the last arguments of this process: backlog of listen() and receive time-out; -1 when
+/// unset.
 int backlog();
 std::chrono::seconds receiveTimeout();
 
-/// While the object lives, `onConnect` is called after each connection of a socket, before connect returns.
+/// Calls `onConnect` after each successful connect(), before it returns, for the lifetime of the
+/// object.
 class ConnectHook {
  public:
     explicit ConnectHook(std::function<void()> onConnect);

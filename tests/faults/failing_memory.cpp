@@ -13,7 +13,7 @@ namespace {
 
 thread_local int countdown = 0;
 
-// For a program that this is preloaded into: there is no memory while the file of this name exists.
+// For programs that preload this file: allocation fails while the file of this name exists.
 const char* const EXHAUSTED_WHILE = std::getenv("NO_MEMORY_WHILE");
 
 bool fails() {
@@ -23,7 +23,7 @@ bool fails() {
 
 }  // namespace
 
-// Taken by every library of the process before those of the standard library, whose other forms call these.
+// Interposed for every library of the process; the other forms of operator new call these.
 
 void* operator new(std::size_t size) {
     void* const memory = fails() ? nullptr : std::malloc(size == 0 ? 1 : size);
@@ -41,7 +41,7 @@ void operator delete(void* memory, std::size_t /*size*/) noexcept {
     std::free(memory);
 }
 
-// jsoncpp has the memory of strings from malloc, which otherwise belongs to the sanitizers.
+// jsoncpp allocates strings with malloc, which sanitizers interpose themselves.
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
 extern "C" void* malloc(std::size_t size) {
     static auto* const real = test::realFunction<void*(std::size_t)>("malloc");

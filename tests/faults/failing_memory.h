@@ -1,10 +1,10 @@
 #pragma once
 
-/// Memory that runs out at a chosen moment: stands in front of the operators that the library gets its memory
-/// by.
+/// Allocation failures: interposes operator new and malloc.
 namespace test {
 
-/// While the object lives, the `number`th request of this thread for memory, counted from 1, fails.
+/// Makes the `number`th allocation of this thread, counted from 1, fail for the lifetime of the
+/// object.
 class FailingMemory {
  public:
     explicit FailingMemory(int number);

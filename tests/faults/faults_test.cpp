@@ -24,9 +24,8 @@
 #include "support/system_log.h"
 #include "util.h"
 
-// Every call of the library into the system fails once, for each operation and each time that it makes the
-// call: the result and the log lines are the documented ones, nothing stays open, and the next time all is
-// well.
+// Each library call of each operation fails once. Result and log lines are as documented, nothing
+// stays open, and the next call succeeds.
 
 namespace {
 
@@ -38,13 +37,13 @@ using ::testing::Matcher;
 
 constexpr char TRIGGER[] = "/proc/sysrq-trigger";
 
-// What an operation with one failing call leaves.
+// The outcome of an operation with one failing call.
 struct Outcome {
     std::string result;
     std::vector<Matcher<const std::string&>> daemonLog = {};
 };
 
-// An operation, its result as a text, and what is to be seen when the Nth call of a function fails.
+// An operation, its result as text, and its outcome when the Nth call of a function fails.
 struct Operation {
     std::string name;
     std::function<void()> prepare;
@@ -52,7 +51,7 @@ struct Operation {
     std::string result;  // without a failure
     std::map<std::string, std::vector<Outcome>> failures;
     std::function<std::string()> look = [] { return std::string(); };  // what belongs to the result too
-    bool isOfTheLog = false;                                           // its lines are not messages
+    bool isLogOperation = false;                                       // its lines are not messages
 };
 
 std::string yesNo(bool value) {
@@ -63,7 +62,7 @@ Matcher<const std::string&> line(const char* file, const std::string& text) {
     return LogLine(file, text);
 }
 
-// The messages of the daemon log; those that are only in memory still, too.
+// Return the messages in the buffer of the daemon log.
 std::vector<std::string> logged() {
     return test::exists("/tmp/ha/ha.daemon.log") ? test::daemonLogMessages() : std::vector<std::string>();
 }
@@ -100,14 +99,14 @@ std::vector<Operation> localChecks() {
              test::writeFile("/sys/class/ata_port/ata1/error_handling", "1\n");
          },
          [] {
-             Json::Value disks("as it was");
+             Json::Value disks("unchanged");
              const bool isHandling = isDiskErrHandling(disks);
              return yesNo(isHandling) + " " +
                     (disks.isArray() ? std::to_string(disks.size()) : disks.asString());
          },
          "yes 1",
          {{"glob",
-           {{"no as it was", {line("checker.cpp", "Failed to set globBuf from /sys/class/ata_port/ata*")}}}},
+           {{"no unchanged", {line("checker.cpp", "Failed to set globBuf from /sys/class/ata_port/ata*")}}}},
           {"open",
            {{"no 0",
              {line("checker.cpp", "Failed to open sysfs file /sys/class/ata_port/ata1/error_handling")}}}},
@@ -182,12 +181,12 @@ std::vector<Operation> logs() {
          {{"stat", {{"0"}}}}},
     };
     for (Operation& operation : operations) {
-        operation.isOfTheLog = true;
+        operation.isLogOperation = true;
     }
     return operations;
 }
 
-// One log and no archive.
+// Rotate one log without archives.
 Operation rotation() {
     return {"rotate",
             [] {
@@ -213,8 +212,8 @@ Operation rotation() {
             }};
 }
 
-Operation orderedReboot() {
-    return {"the answer to an order to reboot",
+Operation rebootHandler() {
+    return {"the reboot handler",
             [] {
                 test::writeFile("/tmp/ha/ha.daemon.log", "one\ntwo\n");
                 test::writeFile("/tmp/ha/ha.daemon.record", "three\n");
@@ -229,7 +228,7 @@ Operation orderedReboot() {
             [] { return test::readFile(TRIGGER); }};
 }
 
-// Runs the operation once for each call that it makes, with that call failing.
+// Runs the operation once for each of its calls, with that call failing.
 class FaultsTest : public test::SandboxTest {
  protected:
     void SetUp() override {
@@ -270,12 +269,12 @@ class FaultsTest : public test::SandboxTest {
             EXPECT_TRUE(failing.hasFailed());
         }
         EXPECT_EQ(result + operation.look(), outcome.result);
-        if (!operation.isOfTheLog) {
+        if (!operation.isLogOperation) {
             EXPECT_THAT(logged(), ElementsAreArray(outcome.daemonLog));
         }
         begin(operation);
         result = operation.run();
-        EXPECT_EQ(result + operation.look(), operation.result) << "the next time";
+        EXPECT_EQ(result + operation.look(), operation.result) << "the next call";
     }
 
     void expectAll(const std::vector<Operation>& operations) {
@@ -293,7 +292,7 @@ class FaultsTest : public test::SandboxTest {
         }
     }
 
-    // The lines of the system log since they were forgotten.
+    // Return the lines of the system log since forgetSystemLog().
     std::vector<std::string> systemLines() {
         std::vector<std::string> all = systemLog->texts();
         all.erase(all.begin(), all.begin() + static_cast<std::ptrdiff_t>(forgotten));
@@ -306,20 +305,20 @@ class FaultsTest : public test::SandboxTest {
     std::size_t forgotten = 0;
 };
 
-TEST_F(FaultsTest, LocalChecks) {
+TEST_F(FaultsTest, LocalChecksRecoverFromEachFailingCall) {
     expectAll(localChecks());
 }
 
-TEST_F(FaultsTest, Programs) {
+TEST_F(FaultsTest, ProgramsRecoverFromEachFailingCall) {
     expectAll(programs());
 }
 
-TEST_F(FaultsTest, Logs) {
+TEST_F(FaultsTest, LogsRecoverFromEachFailingCall) {
     expectAll(logs());
 }
 
-// Files are read and written to the end, whatever signals the host gets meanwhile.
-TEST_F(FaultsTest, AnInterruptedCallIsRepeated) {
+// Files are read and written completely although signals interrupt the calls.
+TEST_F(FaultsTest, InterruptedCallIsRetried) {
     for (const auto& operations : {localChecks(), logs()}) {
         for (const Operation& operation : operations) {
             for (const auto& [function, count] : callsOf(operation)) {
@@ -337,9 +336,9 @@ TEST_F(FaultsTest, AnInterruptedCallIsRepeated) {
     }
 }
 
-// Whatever fails on the way, the machine is told to restart, but for the last step itself.
-TEST_F(FaultsTest, AnOrderedRebootHappensWhateverFails) {
-    const Operation reboot = orderedReboot();
+// Only a failure of the last step itself prevents the reboot.
+TEST_F(FaultsTest, RebootHappensWhicheverCallFails) {
+    const Operation reboot = rebootHandler();
     for (const auto& [function, count] : callsOf(reboot)) {
         for (int number = 1; number <= count; ++number) {
             SCOPED_TRACE(function + " number " + std::to_string(number));
@@ -355,8 +354,8 @@ TEST_F(FaultsTest, AnOrderedRebootHappensWhateverFails) {
     }
 }
 
-// A log is never lost by a rotation: what fails leaves it, compressed or not, and the next one takes it up.
-TEST_F(FaultsTest, ARotationLosesNothingWhateverFails) {
+// A failed rotation keeps the log, compressed or not, and the next rotation picks it up.
+TEST_F(FaultsTest, RotationLosesNothingWhicheverCallFails) {
     const Operation rotate = rotation();
     for (const auto& [function, count] : callsOf(rotate)) {
         for (int number = 1; number <= count; ++number) {
@@ -369,40 +368,40 @@ TEST_F(FaultsTest, ARotationLosesNothingWhateverFails) {
             }
             EXPECT_EQ(rotate.look(), rotate.result);
             rotate.run();
-            EXPECT_EQ(rotate.look(), rotate.result) << "the next time";
+            EXPECT_EQ(rotate.look(), rotate.result) << "the next call";
         }
     }
 }
 
-// ---- Exchanges ----
+// ---- Peer and control requests ----
 
-TEST_F(FaultsTest, AskingThePeer) {
-    remoteIP(test::kPeerAddress);
+TEST_F(FaultsTest, PeerRequestRecoversFromEachFailingCall) {
+    remoteIP(test::PEER_ADDRESS);
     test::FakePeer peer("alive");
-    const auto ask = [](const char* function, int number) {
+    const auto request = [](const char* function, int number) {
         const test::FailingCall failing(function, number, EIO);
         const bool isAlive = IsRemoteAlive()();
         EXPECT_TRUE(failing.hasFailed()) << function;
         return isAlive;
     };
-    EXPECT_FALSE(ask("socket", 1));
+    EXPECT_FALSE(request("socket", 1));
     EXPECT_THAT(logged(), ElementsAreArray({line("env_check.cpp", "Failed to start socket client")}));
     EXPECT_THAT(systemLines(), ::testing::SizeIs(1));
-    EXPECT_FALSE(ask("setsockopt", 1));
-    EXPECT_FALSE(ask("sendto", 1));  // after 3 seconds
-    EXPECT_FALSE(ask("recvfrom", 1));
-    EXPECT_TRUE(ask("close", 1));
+    EXPECT_FALSE(request("setsockopt", 1));
+    EXPECT_FALSE(request("sendto", 1));  // after 3 seconds
+    EXPECT_FALSE(request("recvfrom", 1));
+    EXPECT_TRUE(request("close", 1));
     EXPECT_TRUE(IsRemoteAlive()());
 }
 
-TEST_F(FaultsTest, AskingOverTheControlSocket) {
+TEST_F(FaultsTest, ControlClientRecoversFromEachFailingCall) {
     test::HandlerSocket server([](const Json::Value&, Json::Value& reply) {
         reply = true;
         return true;
     });
     ASSERT_TRUE(server.serverBind());
-    const auto ask = [&server](const char* function) {
-        Json::Value reply("as it was");
+    const auto request = [&server](const char* function) {
+        Json::Value reply("unchanged");
         const test::FailingCall failing(function, 1, EIO);
         test::HandlerSocket client({}, test::LOCAL_SOCKET, 5);
         std::thread serving([&server, isConnected = std::string(function) != "socket" &&
@@ -412,29 +411,29 @@ TEST_F(FaultsTest, AskingOverTheControlSocket) {
                 server.serverListen();
             }
         });
-        const bool isAnswered = client.clientSend("question", reply);
+        const bool hasReply = client.clientSend("request", reply);
         EXPECT_TRUE(failing.hasFailed() || std::string(function) == "close") << function;
-        EXPECT_EQ(reply, isAnswered ? Json::Value(true) : Json::Value("as it was")) << function;
-        EXPECT_EQ(client.hasError(), !isAnswered) << function;
-        return std::make_pair(isAnswered, std::move(serving));
+        EXPECT_EQ(reply, hasReply ? Json::Value(true) : Json::Value("unchanged")) << function;
+        EXPECT_EQ(client.hasError(), !hasReply) << function;
+        return std::make_pair(hasReply, std::move(serving));
     };
     for (const char* function : {"socket", "setsockopt", "connect"}) {
-        auto [isAnswered, serving] = ask(function);
-        EXPECT_FALSE(isAnswered) << function;
+        auto [hasReply, serving] = request(function);
+        EXPECT_FALSE(hasReply) << function;
         serving.join();
     }
     {
-        auto [isAnswered, serving] = ask("recv");
-        EXPECT_FALSE(isAnswered);
+        auto [hasReply, serving] = request("recv");
+        EXPECT_FALSE(hasReply);
         serving.join();
     }
-    auto [isAnswered, serving] = ask("close");
-    EXPECT_TRUE(isAnswered);
+    auto [hasReply, serving] = request("close");
+    EXPECT_TRUE(hasReply);
     serving.join();
     EXPECT_FALSE(server.hasError());
 }
 
-TEST_F(FaultsTest, ServingTheControlSocket) {
+TEST_F(FaultsTest, ControlServerRecoversFromEachFailingCall) {
     test::HandlerSocket server([](const Json::Value&, Json::Value& reply) {
         reply = true;
         return true;
@@ -456,7 +455,7 @@ TEST_F(FaultsTest, ServingTheControlSocket) {
         ASSERT_FALSE(systemLines().empty());
         EXPECT_THAT(systemLines()[0], LogLine("socket.cpp", text));
         EXPECT_FALSE(server.hasError());
-        // The next client, or the one that was not accepted, is served.
+        // The next client, or the one not accepted, is served.
         const test::RawClient next;
         next.send("2");
         EXPECT_TRUE(server.serverListen());
@@ -467,7 +466,7 @@ TEST_F(FaultsTest, ServingTheControlSocket) {
     }
 }
 
-TEST_F(FaultsTest, MakingAControlServer) {
+TEST_F(FaultsTest, ControlServerFailsToStartOnEachFailingCall) {
     for (const char* function : {"socket", "bind", "listen"}) {
         SCOPED_TRACE(function);
         const test::FailingCall failing(function, 1, EIO);
@@ -478,7 +477,7 @@ TEST_F(FaultsTest, MakingAControlServer) {
         EXPECT_FALSE(systemLines().empty());
         forgetSystemLog();
     }
-    // What is not there need not be removed.
+    // A missing socket file need not be removed.
     const test::FailingCall failing("unlink", 1, EIO);
     test::HandlerSocket server;
     test::removeTree(test::LOCAL_SOCKET);

@@ -28,9 +28,9 @@
 #include "support/udp.h"
 #include "util.h"
 
-// Memory runs out once in each operation, at each place where it asks for some: it ends with the result of a
-// failure or, where that is allowed, with std::bad_alloc; nothing stays open, locked or half done, and the
-// next time all is well.
+// Each allocation of each operation fails once. The operation returns its failure result or, where
+// that is allowed, throws std::bad_alloc; nothing stays open, locked or half done, and the next
+// call succeeds.
 
 namespace {
 
@@ -41,7 +41,7 @@ using test::LOG;
 constexpr char TRIGGER[] = "/proc/sysrq-trigger";
 constexpr char OUT_OF_MEMORY[] = "out of memory";
 
-// An operation, whose result is a text. What can be seen of it belongs to the result.
+// An operation, its result as text, and the state that it leaves behind.
 struct Operation {
     std::string name;
     std::function<void()> prepare;
@@ -58,7 +58,7 @@ std::string yesNo(bool value) {
     return value ? "yes" : "no";
 }
 
-// Final, because the class has no virtual destructor.
+// Final: the class has no virtual destructor.
 class Client final : public MonitordSocket {
  public:
     using MonitordSocket::MonitordSocket;
@@ -92,7 +92,7 @@ class MemoryTest : public test::SandboxTest {
         return result;
     }
 
-    static void expectWhole(const Operation& operation) {
+    static void expectCleanFailure(const Operation& operation) {
         bool hasFailed = true;
         for (int number = 1; hasFailed; ++number) {
             SCOPED_TRACE(operation.name + ", request number " + std::to_string(number));
@@ -105,26 +105,26 @@ class MemoryTest : public test::SandboxTest {
                 const std::string left = operation.look();
                 EXPECT_TRUE(left == operation.left || operation.leavings.count(left) == 1) << left;
                 operation.prepare();
-                EXPECT_EQ(operation.run(), operation.result) << "the next time";
+                EXPECT_EQ(operation.run(), operation.result) << "the next call";
             } else {
-                EXPECT_GT(number, 1) << "no need for memory";
+                EXPECT_GT(number, 1) << "no allocation";
                 EXPECT_EQ(result, operation.result);
             }
             EXPECT_EQ(operation.look(), operation.left);
         }
     }
 
-    static void expectWholeOrThrow(Operation operation) {
+    static void expectCleanFailureOrThrow(Operation operation) {
         operation.throws = true;
-        expectWhole(operation);
+        expectCleanFailure(operation);
     }
 
     std::unique_ptr<test::SystemLog> systemLog;
 };
 
-// ---- The checks of this node ----
+// ---- Local checks ----
 
-TEST_F(MemoryTest, LocalChecks) {
+TEST_F(MemoryTest, LocalChecksFailCleanly) {
     const std::string disk = "/sys/devices/pci0/ata1/host0/target0:0:0/0:0:0:0/block/sda";
     test::makeDirectories(disk);
     std::filesystem::create_symlink(disk, "/sys/block/sda");
@@ -132,32 +132,32 @@ TEST_F(MemoryTest, LocalChecks) {
     test::writeFile("/sys/class/ata_port/ata1/error_handling", "1\n");
     test::writeFile("/tmp/ha/info_hd.remote", R"({"3":{"HD_DEVNAME":"sda"}})");
 
-    expectWhole({"isDRBDConnect",
-                 [] { test::writeFile("/proc/drbd", " 0: cs:Connected\n"); },
-                 [] { return yesNo(isDRBDConnect()); },
-                 "yes",
-                 {"no"}});
-    expectWhole({"isDRBDConnect without a connection",
-                 [] { test::writeFile("/proc/drbd", " 0: cs:StandAlone ro:Primary/Unknown\n"); },
-                 [] { return yesNo(isDRBDConnect()); }, "no"});
-    expectWhole({"isDRBDConnect without DRBD", [] { test::removeTree("/proc/drbd"); },
-                 [] { return yesNo(isDRBDConnect()); }, "no"});
+    expectCleanFailure({"isDRBDConnect",
+                        [] { test::writeFile("/proc/drbd", " 0: cs:Connected\n"); },
+                        [] { return yesNo(isDRBDConnect()); },
+                        "yes",
+                        {"no"}});
+    expectCleanFailure({"isDRBDConnect without a connection",
+                        [] { test::writeFile("/proc/drbd", " 0: cs:StandAlone ro:Primary/Unknown\n"); },
+                        [] { return yesNo(isDRBDConnect()); }, "no"});
+    expectCleanFailure({"isDRBDConnect without DRBD", [] { test::removeTree("/proc/drbd"); },
+                        [] { return yesNo(isDRBDConnect()); }, "no"});
     Operation md{"isMDResync", [] {}, [] { return yesNo(isMDResync()); }, "yes", {"no"}};
-    expectWhole(md);
+    expectCleanFailure(md);
     md.name = "isMDResync without a resync";
     md.prepare = [] {
         test::writeFile("/sys/block/md0/md/sync_action", "no resync, but something longer\n");
     };
     md.result = "no";
-    expectWhole(md);
+    expectCleanFailure(md);
     md.name = "isMDResync without arrays";
     md.prepare = [] { test::removeTree("/sys/block/md0"); };
     md.result = "no";
-    expectWhole(md);
+    expectCleanFailure(md);
     md.name = "isSysfsValue of a file that is not there";
     const std::string missing = "/sys/block/md0/md/sync_action";
     md.run = [&missing] { return yesNo(isSysfsValue(missing, "resync")); };
-    expectWhole(md);
+    expectCleanFailure(md);
     Operation errors{"isDiskErrHandling",
                      [] {},
                      [] {
@@ -167,124 +167,125 @@ TEST_F(MemoryTest, LocalChecks) {
                      },
                      "yes 1",
                      {"no 0"}};
-    expectWhole(errors);
+    expectCleanFailure(errors);
     errors.name = "isDiskErrHandling without errors";
     errors.prepare = [] { test::writeFile("/sys/class/ata_port/ata1/error_handling", "0\n"); };
     errors.result = "no 0";
-    expectWhole(errors);
-    expectWholeOrThrow({"devListToHumanReadable",
-                        [] {},
-                        [] { return Util::devListToHumanReadable({"sda"}).at(0); },
-                        "Disk 3",
-                        {"sda"}});
+    expectCleanFailure(errors);
+    expectCleanFailureOrThrow({"devListToHumanReadable",
+                               [] {},
+                               [] { return Util::devListToHumanReadable({"sda"}).at(0); },
+                               "Disk 3",
+                               {"sda"}});
 }
 
 // ---- Programs ----
 
-TEST_F(MemoryTest, Programs) {
+TEST_F(MemoryTest, ProgramsFailCleanly) {
     remoteIP("127.0.0.2");
     drbdIF("eth1");
     test::replaceProgram("/bin/ping", "echo 'rtt min/avg/max/mdev = 0.1/2.5/0.3/0.4 ms'; exit 1");
-    // Names that need memory of their own.
+    // Names too long for the small-string optimisation.
     test::replaceProgram("/sbin/ifconfig",
                          "echo 'Iface MTU RX-OK-by-the-interface RX-ERR-by-the-interface'\n"
                          "echo 'eth1 1500 60 40'");
     test::replaceProgram("/bin/df", "echo disks");
 
-    expectWholeOrThrow({"heartbeatLatency",
-                        [] {},
-                        [] { return std::to_string(heartbeatLatency()); },
-                        "2.500000",
-                        {"0.000000"}});
-    expectWholeOrThrow({"networkNonOkRate",
-                        [] {},
-                        [] {
-                            InterfaceChecker interface;
-                            float rate = -1;
-                            const bool isKnown = interface.networkNonOkRate(rate);
-                            return yesNo(isKnown) + " " + std::to_string(rate);
-                        },
-                        "yes 0.400000",
-                        {"no -1.000000"}});
-    expectWholeOrThrow({"recordDF",
-                        [] { test::removeTree("/tmp/ha/ha.daemon.record"); },
-                        [] {
-                            recordDF();
-                            return "";
-                        },
-                        "",
-                        {},
-                        [] {
-                            const bool isThere = test::exists("/tmp/ha/ha.daemon.record");
-                            return isThere ? test::recordEntries().at(0) : std::string("none");
-                        },
-                        "\ndisks\n",
-                        {"none"}});
+    expectCleanFailureOrThrow({"heartbeatLatency",
+                               [] {},
+                               [] { return std::to_string(heartbeatLatency()); },
+                               "2.500000",
+                               {"0.000000"}});
+    expectCleanFailureOrThrow({"networkNonOkRate",
+                               [] {},
+                               [] {
+                                   InterfaceChecker interface;
+                                   float rate = -1;
+                                   const bool isKnown = interface.networkNonOkRate(rate);
+                                   return yesNo(isKnown) + " " + std::to_string(rate);
+                               },
+                               "yes 0.400000",
+                               {"no -1.000000"}});
+    expectCleanFailureOrThrow({"recordDF",
+                               [] { test::removeTree("/tmp/ha/ha.daemon.record"); },
+                               [] {
+                                   recordDF();
+                                   return "";
+                               },
+                               "",
+                               {},
+                               [] {
+                                   const bool isThere = test::exists("/tmp/ha/ha.daemon.record");
+                                   return isThere ? test::recordEntries().at(0) : std::string("none");
+                               },
+                               "\ndisks\n",
+                               {"none"}});
 }
 
 // ---- Logs ----
 
-TEST_F(MemoryTest, Logs) {
+TEST_F(MemoryTest, LogsFailCleanly) {
     const auto both = [] {
         return (test::exists(LOG) ? test::readFile(LOG) : "") + "|" + test::bufferText();
     };
-    expectWholeOrThrow({"set",
-                        [] { test::removeTree(BUFFER); },
-                        [] {
-                            daemonLog->set("a line that is longer than a string holds by itself");
-                            return "";
-                        },
-                        "",
-                        {},
-                        [] { return test::exists(BUFFER) ? test::daemonLogMessages().at(0) : "none"; },
-                        "a line that is longer than a string holds by itself",
-                        {"none"}});
-    expectWholeOrThrow({"writeLogToDisk",
-                        [] {
-                            test::removeTree(LOG);
-                            test::writeFile(BUFFER, "one\ntwo\n");
-                        },
-                        [] {
-                            daemonLog->writeLogToDisk();
-                            return "";
-                        },
-                        "",
-                        {},
-                        both,
-                        "one\ntwo\n|",
-                        {"|one\ntwo\n"}});
-    expectWholeOrThrow({"rotate",
-                        [] {
-                            for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
-                                std::filesystem::remove(entry);
-                            }
-                            test::writeFile(LOG, "lines\n");
-                        },
-                        [] {
-                            daemonLog->rotate();
-                            return "";
-                        },
-                        "",
-                        {},
-                        // What is compressed but not moved on yet is taken up by the next rotation.
-                        [] {
-                            std::string all;
-                            for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
-                                const std::string path = entry.path();
-                                all += entry.path().filename().string() + ": " +
-                                       (entry.path().extension() == ".xz"
-                                            ? test::run({"/bin/xz", "--decompress", "--stdout", path}).output
-                                            : test::readFile(path));
-                            }
-                            return all;
-                        },
-                        "ha.daemon.log.0.xz: lines\n",
-                        {"ha.daemon.log: lines\n", "ha.daemon.log.xz: lines\n"}});
+    expectCleanFailureOrThrow({"set",
+                               [] { test::removeTree(BUFFER); },
+                               [] {
+                                   daemonLog->set("a line that is longer than a string holds by itself");
+                                   return "";
+                               },
+                               "",
+                               {},
+                               [] { return test::exists(BUFFER) ? test::daemonLogMessages().at(0) : "none"; },
+                               "a line that is longer than a string holds by itself",
+                               {"none"}});
+    expectCleanFailureOrThrow({"writeLogToDisk",
+                               [] {
+                                   test::removeTree(LOG);
+                                   test::writeFile(BUFFER, "one\ntwo\n");
+                               },
+                               [] {
+                                   daemonLog->writeLogToDisk();
+                                   return "";
+                               },
+                               "",
+                               {},
+                               both,
+                               "one\ntwo\n|",
+                               {"|one\ntwo\n"}});
+    expectCleanFailureOrThrow(
+        {"rotate",
+         [] {
+             for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
+                 std::filesystem::remove(entry);
+             }
+             test::writeFile(LOG, "lines\n");
+         },
+         [] {
+             daemonLog->rotate();
+             return "";
+         },
+         "",
+         {},
+         // The next rotation picks up a log that is compressed but not renamed.
+         [] {
+             std::string all;
+             for (const auto& entry : std::filesystem::directory_iterator("/var/log/ha")) {
+                 const std::string path = entry.path();
+                 all += entry.path().filename().string() + ": " +
+                        (entry.path().extension() == ".xz"
+                             ? test::run({"/bin/xz", "--decompress", "--stdout", path}).output
+                             : test::readFile(path));
+             }
+             return all;
+         },
+         "ha.daemon.log.0.xz: lines\n",
+         {"ha.daemon.log: lines\n", "ha.daemon.log.xz: lines\n"}});
 }
 
-// ---- The record ----
+// ---- Status ----
 
-TEST_F(MemoryTest, TheRecord) {
+TEST_F(MemoryTest, StatusFailsCleanly) {
     static Status status;
     Json::Value disks(Json::arrayValue);
     disks.append("a disk with quite a long name");
@@ -296,27 +297,28 @@ TEST_F(MemoryTest, TheRecord) {
         }
         return all;
     };
-    expectWholeOrThrow({"setErrHandlingDisk",
-                        [] { status.setErrHandlingDisk(Json::Value()); },
-                        [disks] {
-                            status.setErrHandlingDisk(disks);
-                            return "";
-                        },
-                        "",
-                        {},
-                        names,
-                        "a disk with quite a long name,another disk with a long name,",
-                        {""}});
-    expectWholeOrThrow({"toJson", [] {},
-                        [] { return std::to_string(status.toJson()["diskErrorHandlingDisk"].size()); }, "2"});
-    expectWhole({"setRemoteAlive", [] { status.setRemoteAlive(false); },
-                 [] { return yesNo(status.setRemoteAlive(true) && status.isRemoteAlive()); }, "yes"});
+    expectCleanFailureOrThrow({"setErrHandlingDisk",
+                               [] { status.setErrHandlingDisk(Json::Value()); },
+                               [disks] {
+                                   status.setErrHandlingDisk(disks);
+                                   return "";
+                               },
+                               "",
+                               {},
+                               names,
+                               "a disk with quite a long name,another disk with a long name,",
+                               {""}});
+    expectCleanFailureOrThrow({"toJson", [] {},
+                               [] { return std::to_string(status.toJson()["diskErrorHandlingDisk"].size()); },
+                               "2"});
+    expectCleanFailure({"setRemoteAlive", [] { status.setRemoteAlive(false); },
+                        [] { return yesNo(status.setRemoteAlive(true) && status.isRemoteAlive()); }, "yes"});
 }
 
-// ---- Exchanges ----
+// ---- Peer and control requests ----
 
-TEST_F(MemoryTest, AskingThePeerForItsName) {
-    remoteIP(test::kPeerAddress);
+TEST_F(MemoryTest, HostnameRequestFailsCleanly) {
+    remoteIP(test::PEER_ADDRESS);
     test::FakePeer peer("a-host-with-quite-a-long-name");
     std::string hostname;
     Operation name{"GetRemoteHostname",
@@ -327,12 +329,12 @@ TEST_F(MemoryTest, AskingThePeerForItsName) {
                    [&hostname] { return hostname; },
                    "a-host-with-quite-a-long-name",
                    {""}};
-    expectWhole(name);
+    expectCleanFailure(name);
 }
 
-// What decides over a failover does not depend on memory.
-TEST_F(MemoryTest, AskingWhetherThePeerIsAlive) {
-    remoteIP(test::kPeerAddress);
+// Lack of memory must not look like a dead peer.
+TEST_F(MemoryTest, LivenessProbeAllocatesNothing) {
+    remoteIP(test::PEER_ADDRESS);
     test::FakePeer peer("alive");
     const test::FailingMemory memory(1);
     const bool isAlive = IsRemoteAlive()();
@@ -341,8 +343,8 @@ TEST_F(MemoryTest, AskingWhetherThePeerIsAlive) {
     EXPECT_FALSE(hasFailed);
 }
 
-// With an address so long that it needs some, lack of it is a missing answer.
-TEST_F(MemoryTest, AskingAPeerWithoutAnAddress) {
+// An address too long for the small-string optimisation: allocation failure counts as no reply.
+TEST_F(MemoryTest, LongPeerAddressFailsCleanly) {
     remoteIP("no address, and longer than a string holds by itself");
     IsRemoteAlive alive;
     IsRemoteMDResync resync;
@@ -355,96 +357,97 @@ TEST_F(MemoryTest, AskingAPeerWithoutAnAddress) {
     }
 }
 
-TEST_F(MemoryTest, AskingThePeerForItsDisks) {
-    remoteIP(test::kPeerAddress);
+TEST_F(MemoryTest, DisksRequestFailsCleanly) {
+    remoteIP(test::PEER_ADDRESS);
     for (const bool isHandling : {true, false}) {
         const std::string flag = isHandling ? "true" : "false";
         test::FakePeer peer(R"({"errHandlingDisk":["sda","sdb"],"isDiskErrHandling":)" + flag + "}");
         Json::Value disks;
-        expectWhole({"IsRemoteDiskErrHandling " + flag,
-                     [&disks] { disks = Json::Value(Json::arrayValue); },
-                     [&disks] { return yesNo(IsRemoteDiskErrHandling()(disks)); },
-                     yesNo(isHandling),
-                     {"no"},
-                     [&disks] { return std::to_string(disks.size()); },
-                     "2",
-                     {"0"}});
+        expectCleanFailure({"IsRemoteDiskErrHandling " + flag,
+                            [&disks] { disks = Json::Value(Json::arrayValue); },
+                            [&disks] { return yesNo(IsRemoteDiskErrHandling()(disks)); },
+                            yesNo(isHandling),
+                            {"no"},
+                            [&disks] { return std::to_string(disks.size()); },
+                            "2",
+                            {"0"}});
     }
 }
 
-TEST_F(MemoryTest, OrderingAReboot) {
-    remoteIP(test::kPeerAddress);
+TEST_F(MemoryTest, RebootRequestFailsCleanly) {
+    remoteIP(test::PEER_ADDRESS);
     test::FakePeer peer("");
     static Status status;
-    expectWhole({"RebootRemote",
-                 [] { status.delRemoteNodeState(NodeRebooting); },
-                 [] { return yesNo(RebootRemote()(status)); },
-                 "yes",
-                 {},
-                 [] { return std::to_string(status.getRemoteNodeState()); },
-                 std::to_string(NodeRebooting)});
+    expectCleanFailure({"RebootRemote",
+                        [] { status.delRemoteNodeState(NodeRebooting); },
+                        [] { return yesNo(RebootRemote()(status)); },
+                        "yes",
+                        {},
+                        [] { return std::to_string(status.getRemoteNodeState()); },
+                        std::to_string(NodeRebooting)});
 }
 
-// The server's socket stays open for good, so that it is made before the test begins.
-class AnswersWithoutMemoryTest : public MemoryTest {
+// The server socket stays open until the process ends: create it before the base counts
+// descriptors.
+class PeerServerMemoryTest : public MemoryTest {
  protected:
     void SetUp() override {
-        localIP(test::kPeerAddress);
+        localIP(test::PEER_ADDRESS);
         std::thread firstPass([] {
             Status status;
             SocketServer()(status);
         });
-        test::UdpSocket asker;
+        test::UdpSocket sender;
         do {
-            asker.send("is_alive", test::kPeerAddress, test::kPeerPort);
-        } while (!asker.receive(std::chrono::milliseconds(50)));
+            sender.send("is_alive", test::PEER_ADDRESS, test::PEER_PORT);
+        } while (!sender.receive(std::chrono::milliseconds(50)));
         firstPass.join();
         MemoryTest::SetUp();
     }
 };
 
-TEST_F(AnswersWithoutMemoryTest, AnsweringThePeer) {
+TEST_F(PeerServerMemoryTest, ServerPassFailsCleanly) {
     Status status;
     Json::Value disks(Json::arrayValue);
     disks.append("sda");
     status.setErrHandlingDisk(disks);
-    std::optional<test::UdpSocket> asker;
+    std::optional<test::UdpSocket> sender;
     SocketServer server;
-    expectWhole({"a pass of the server",
-                 [&asker] {
-                     asker.emplace();
-                     asker->send("is_disk_err_handling", test::kPeerAddress, test::kPeerPort);
-                 },
-                 [&server, &status] { return yesNo(server(status)); },
-                 "yes",
-                 {},
-                 [&asker] {
-                     std::string all;
-                     for (const std::string& answer : test::arrived(*asker)) {
-                         all += answer;
-                     }
-                     return all;
-                 },
-                 R"({"errHandlingDisk":["sda"],"isDiskErrHandling":false})",
-                 {""}});
+    expectCleanFailure({"a pass of the server",
+                        [&sender] {
+                            sender.emplace();
+                            sender->send("is_disk_err_handling", test::PEER_ADDRESS, test::PEER_PORT);
+                        },
+                        [&server, &status] { return yesNo(server(status)); },
+                        "yes",
+                        {},
+                        [&sender] {
+                            std::string all;
+                            for (const std::string& reply : test::arrived(*sender)) {
+                                all += reply;
+                            }
+                            return all;
+                        },
+                        R"({"errHandlingDisk":["sda"],"isDiskErrHandling":false})",
+                        {""}});
 }
 
-TEST_F(MemoryTest, RepliesOfTheChecks) {
+TEST_F(MemoryTest, RepliesOfTheChecksFailCleanly) {
     test::writeFile("/tmp/.ha.hostname.original", "a-host-with-quite-a-long-name\n");
     Status status;
-    expectWhole({"IsRemoteDiskErrHandling",
-                 [] {},
-                 [&status] { return IsRemoteDiskErrHandling().handle(status); },
-                 R"({"errHandlingDisk":[],"isDiskErrHandling":false})",
-                 {""}});
-    expectWhole({"GetRemoteHostname",
-                 [] {},
-                 [&status] { return GetRemoteHostname().handle(status); },
-                 "a-host-with-quite-a-long-name\n",
-                 {""}});
+    expectCleanFailure({"IsRemoteDiskErrHandling",
+                        [] {},
+                        [&status] { return IsRemoteDiskErrHandling().handle(status); },
+                        R"({"errHandlingDisk":[],"isDiskErrHandling":false})",
+                        {""}});
+    expectCleanFailure({"GetRemoteHostname",
+                        [] {},
+                        [&status] { return GetRemoteHostname().handle(status); },
+                        "a-host-with-quite-a-long-name\n",
+                        {""}});
 }
 
-TEST_F(MemoryTest, HandlingAControlRequest) {
+TEST_F(MemoryTest, ControlHandlerFailsCleanly) {
     Status status;
     MonitordSocket server(test::LOCAL_SOCKET, 0);
     server.setStatus(&status);
@@ -454,18 +457,18 @@ TEST_F(MemoryTest, HandlingAControlRequest) {
         Json::Value request;
         request["act"] = action;
         Json::Value reply;
-        expectWhole({action,
-                     [&reply] { reply = Json::Value(); },
-                     [&server, &request, &reply] {
-                         const bool isAnswered = server.serverHandle(request, reply);
-                         return yesNo(isAnswered) + " " + std::to_string(reply.size());
-                     },
-                     result,
-                     {"no 0"}});
+        expectCleanFailure({action,
+                            [&reply] { reply = Json::Value(); },
+                            [&server, &request, &reply] {
+                                const bool hasReply = server.serverHandle(request, reply);
+                                return yesNo(hasReply) + " " + std::to_string(reply.size());
+                            },
+                            result,
+                            {"no 0"}});
     }
 }
 
-TEST_F(MemoryTest, ServingTheControlSocket) {
+TEST_F(MemoryTest, ControlServerFailsCleanly) {
     Status status;
     MonitordSocket server(test::LOCAL_SOCKET, 0);
     server.setStatus(&status);
@@ -480,27 +483,27 @@ TEST_F(MemoryTest, ServingTheControlSocket) {
                     "yes",
                     {"no"},
                     [&client] {
-                        const std::string answer = client->receiveAll();
-                        const bool isWhole = !answer.empty() && answer.front() == '{' && answer.back() == '}';
-                        return answer.empty() ? "closed" : isWhole ? "whole" : answer;
+                        const std::string reply = client->receiveAll();
+                        const bool isWhole = !reply.empty() && reply.front() == '{' && reply.back() == '}';
+                        return reply.empty() ? "closed" : isWhole ? "whole" : reply;
                     },
                     "whole",
                     {"closed"}};
-    expectWhole(query);
+    expectCleanFailure(query);
 }
 
-TEST_F(MemoryTest, AskingOverTheControlSocket) {
+TEST_F(MemoryTest, ControlClientFailsCleanly) {
     test::HandlerSocket server([](const Json::Value&, Json::Value& reply) {
-        reply = "an answer that is longer than a string holds by itself";
+        reply = "a reply that is longer than a string holds by itself";
         return true;
     });
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
     std::optional<test::HandlerSocket> client;
-    const Json::Value request("question");
+    const Json::Value request("request");
     Json::Value reply;
     std::size_t lines = 0;
-    expectWhole(
+    expectCleanFailure(
         {"clientSend",
          [&] {
              client.emplace(test::HandlerSocket::Handler(), test::LOCAL_SOCKET, 5);
@@ -508,8 +511,8 @@ TEST_F(MemoryTest, AskingOverTheControlSocket) {
              lines = systemLog->texts().size();
          },
          [&client, &request, &reply] {
-             const bool isAnswered = client->clientSend(request, reply);
-             return yesNo(isAnswered) + (reply.isNull() ? " null" : " reply");
+             const bool hasReply = client->clientSend(request, reply);
+             return yesNo(hasReply) + (reply.isNull() ? " null" : " reply");
          },
          "yes reply",
          {"no null"},
@@ -518,7 +521,7 @@ TEST_F(MemoryTest, AskingOverTheControlSocket) {
          {"yes 1"}});
 }
 
-TEST_F(MemoryTest, AskingOverTheControlSocketWhetherThePeerReboots) {
+TEST_F(MemoryTest, ControlClientRebootQueryFailsCleanly) {
     test::HandlerSocket server([](const Json::Value&, Json::Value& reply) {
         reply["is_froce_reboot_remote"] = true;
         return true;
@@ -526,38 +529,39 @@ TEST_F(MemoryTest, AskingOverTheControlSocketWhetherThePeerReboots) {
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
     std::optional<Client> client;
-    expectWhole({"isRebootRemote",
-                 [&client] { client.emplace(test::LOCAL_SOCKET, 5); },
-                 [&client] { return yesNo(client->isRebootRemote()); },
-                 "yes",
-                 {"no"}});
+    expectCleanFailure({"isRebootRemote",
+                        [&client] { client.emplace(test::LOCAL_SOCKET, 5); },
+                        [&client] { return yesNo(client->isRebootRemote()); },
+                        "yes",
+                        {"no"}});
 }
 
-TEST_F(MemoryTest, AskingOverTheControlSocketWithoutAServer) {
+TEST_F(MemoryTest, ControlClientWithoutAServerFailsCleanly) {
     std::optional<Client> client;
     const auto prepare = [&client] { client.emplace("/tmp/nowhere", 5); };
     Json::Value status;
-    expectWhole({"rebootRemote", prepare, [&client] { return yesNo(client->rebootRemote()); }, "no"});
-    expectWhole({"getServerData", prepare, [&] { return yesNo(client->getServerData(status)); }, "no"});
+    expectCleanFailure({"rebootRemote", prepare, [&client] { return yesNo(client->rebootRemote()); }, "no"});
+    expectCleanFailure(
+        {"getServerData", prepare, [&] { return yesNo(client->getServerData(status)); }, "no"});
 }
 
 // ---- The reboot ----
 
-// A node without memory is one to be restarted.
-TEST_F(MemoryTest, AnOrderedRebootHappens) {
+// A node out of memory must still reboot.
+TEST_F(MemoryTest, RebootHappensWithoutMemory) {
     test::writeFile(TRIGGER, "");
     Status status;
-    expectWhole({"the answer to an order to reboot",
-                 [] {
-                     test::writeFile(BUFFER, "one\ntwo\n");
-                     test::writeFile("/tmp/ha/ha.daemon.record", "three\n");
-                     test::writeFile(TRIGGER, "");
-                 },
-                 [&status] { return RebootRemote().handle(status); },
-                 "",
-                 {},
-                 [] { return test::readFile(TRIGGER); },
-                 "b"});
+    expectCleanFailure({"the reboot handler",
+                        [] {
+                            test::writeFile(BUFFER, "one\ntwo\n");
+                            test::writeFile("/tmp/ha/ha.daemon.record", "three\n");
+                            test::writeFile(TRIGGER, "");
+                        },
+                        [&status] { return RebootRemote().handle(status); },
+                        "",
+                        {},
+                        [] { return test::readFile(TRIGGER); },
+                        "b"});
 }
 
 }  // namespace

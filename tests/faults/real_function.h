@@ -4,8 +4,8 @@
 
 namespace test {
 
-// The C library's own function, for a test that puts one of the same name in front of it. With 64-bit time on
-// 32 bits some have another name.
+// Return the C library's function of a name that a test interposes. Some have another name with
+// 64-bit time on 32-bit machines.
 template <class Function>
 Function* realFunction(const char* name, const char* nameWith64BitTime = nullptr) {
     void* symbol = nullptr;

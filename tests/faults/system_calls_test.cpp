@@ -17,10 +17,10 @@ using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::StartsWith;
 
-// What the kernel is asked to do, where that is the point: how much it costs, and in which order it happens.
+// System calls where their number or order matters.
 class SystemCallsTest : public test::SandboxTest {
  protected:
-    // The calls of a program, and of those that it starts, as strace writes them down without process
+    // Return the system calls of a program and its children as strace prints them, without process
     // numbers.
     static std::vector<std::string> trace(const std::vector<std::string>& options,
                                           const std::vector<std::string>& program) {
@@ -43,7 +43,7 @@ class SystemCallsTest : public test::SandboxTest {
     static constexpr char FILE[] = "/tmp/trace";
 };
 
-TEST_F(SystemCallsTest, ALogLineIsOneOpenOneWriteAndOneClose) {
+TEST_F(SystemCallsTest, LogLineIsOneOpenWriteAndClose) {
     std::vector<std::string> names;
     for (const std::string& call : trace({"-P", "/tmp/ha/probe.log"}, {LOG_PROBE, "3"})) {
         names.push_back(call.substr(0, call.find('(')));
@@ -52,15 +52,15 @@ TEST_F(SystemCallsTest, ALogLineIsOneOpenOneWriteAndOneClose) {
                                    "close"));
 }
 
-// A machine that restarts in the middle leaves whole lines.
-TEST_F(SystemCallsTest, AMovedLineIsAWriteOfItsOwn) {
+// A reboot in the middle of a move leaves whole lines.
+TEST_F(SystemCallsTest, MoveWritesEachLineSeparately) {
     test::writeFile("/tmp/ha/probe.log", "one\ntwo\nthree");
     EXPECT_THAT(
         trace({"-P", "/var/log/ha/probe.log", "-e", "trace=write"}, {LOG_PROBE, "move"}),
         ElementsAre(HasSubstr("\"one\\n\", 4"), HasSubstr("\"two\\n\", 4"), HasSubstr("\"three\\n\", 6")));
 }
 
-TEST_F(SystemCallsTest, XzIsRunWithoutOptionsOnEachFileThatIsThereTheLogFirst) {
+TEST_F(SystemCallsTest, XzRunsWithoutOptionsOnTheLogThenTheArchives) {
     const std::string log = "/var/log/ha/probe.log";
     for (const char* suffix : {".39", ".10", ".0", ""}) {
         test::writeFile(log + suffix, "content");
@@ -75,13 +75,13 @@ TEST_F(SystemCallsTest, XzIsRunWithoutOptionsOnEachFileThatIsThereTheLogFirst) {
 }
 
 #ifdef __SANITIZE_ADDRESS__
-// The sanitizer looks at memory through a pipe: pipe2, write and two times close.
+// The sanitizer probes memory through a pipe: pipe2, write and two calls of close.
 constexpr std::size_t SANITIZERS_CALLS = 4;
 #else
 constexpr std::size_t SANITIZERS_CALLS = 0;
 #endif
 
-// The calls between the probe's two marks.
+// Return the calls between the probe's two marks.
 std::vector<std::string> exchange(const std::vector<std::string>& all) {
     const auto isMark = [](const std::string& call) { return call.rfind("getppid(", 0) == 0; };
     const auto begin = std::find_if(all.begin(), all.end(), isMark);
@@ -103,9 +103,9 @@ std::vector<std::string> exchange(const std::vector<std::string>& all) {
     return calls;
 }
 
-TEST_F(SystemCallsTest, AnExchangeWithThePeerIsFiveCalls) {
+TEST_F(SystemCallsTest, PeerRequestIsFiveCalls) {
     test::FakePeer peer("alive");
-    EXPECT_THAT(exchange(trace({"-e", "trace=!%memory"}, {EXCHANGE_PROBE, test::kPeerAddress})),
+    EXPECT_THAT(exchange(trace({"-e", "trace=!%memory"}, {EXCHANGE_PROBE, test::PEER_ADDRESS})),
                 ElementsAre(StartsWith("socket(AF_INET, SOCK_DGRAM|SOCK_CLOEXEC, IPPROTO_IP) ="),
                             AllOf(StartsWith("setsockopt("), HasSubstr("SO_RCVTIMEO")),
                             AllOf(StartsWith("sendto("),
@@ -115,7 +115,7 @@ TEST_F(SystemCallsTest, AnExchangeWithThePeerIsFiveCalls) {
                             StartsWith("close(")));
 }
 
-TEST_F(SystemCallsTest, ARebootSavesTheDaemonLogTheRecordLogAndTheDisksBeforeTheTrigger) {
+TEST_F(SystemCallsTest, RebootSyncsLogsAndDisksBeforeTheTrigger) {
     test::writeFile("/tmp/ha/ha.daemon.log", "a\n");
     test::writeFile("/tmp/ha/ha.daemon.record", "b\n");
     const std::vector<std::string> calls = trace({"-e", "trace=openat,write,sync"}, {REBOOT_PROBE});

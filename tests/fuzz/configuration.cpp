@@ -8,7 +8,7 @@
 
 int LLVMFuzzerInitialize(int* /*argc*/, char*** /*argv*/) {
     fuzz::prepareLog();
-    // The messages about what is wrong would drown the fuzzer's own.
+    // Error messages would drown those of the fuzzer.
     dup2(open("/dev/null", O_WRONLY | O_CLOEXEC), STDOUT_FILENO);
     return 0;
 }

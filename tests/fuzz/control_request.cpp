@@ -1,4 +1,4 @@
-// Requests to the control socket, through the real one.
+// Requests over a real control socket.
 #include <json/json.h>
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -34,7 +34,7 @@ int LLVMFuzzerInitialize(int* /*argc*/, char*** /*argv*/) {
 }
 
 int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-    // An empty request would be waited for, and an order to reboot waits for the peer.
+    // An empty request would block, and a reboot request waits for the peer.
     if (size == 0 || size > 4000 || fuzz::text(data, size).find('R') != std::string::npos ||
         fuzz::text(data, size).find('\\') != std::string::npos) {
         return 0;

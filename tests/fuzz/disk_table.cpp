@@ -1,4 +1,4 @@
-// The table of the peer's disks.
+// The disk table.
 #include <algorithm>
 
 #include "fuzz/fuzz.h"

@@ -43,9 +43,8 @@ void programsPrint(const std::string& text) {
 
 }  // namespace fuzz
 
-// A program for each input would cost a thousand times what it is given to. The platform library is where the
-// library starts programs, and these take the place of its functions: a program's output is a stream either
-// way.
+// Starting a program for each input would take most of the time. These functions interpose those of
+// the platform library that start programs; the library reads a stream either way.
 
 FILE* PLATPopenv(const char* /*path*/, const char* mode, const char* const* /*argv*/) {
     static char nothing[1] = {};

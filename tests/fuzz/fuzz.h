@@ -6,15 +6,15 @@
 #include <cstdlib>
 #include <string>
 
-// What the fuzz targets share. Each hands its input to the library as the outside would, in a private root
-// whose log leads nowhere, and ends the process when a promise is broken.
+// Shared by the fuzz targets. Each passes its input to the library in a sandbox that discards the
+// log, and aborts when an invariant is violated.
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size);
 extern "C" int LLVMFuzzerInitialize(int* argc, char*** argv);
 
 namespace fuzz {
 
-// Ends the process when a promise is broken.
+// Abort unless `condition` holds.
 inline void require(bool holds, const char* promise) {
     if (!holds) {
         std::fprintf(stderr, "broken: %s\n", promise);
@@ -26,13 +26,13 @@ inline std::string text(const std::uint8_t* data, std::size_t size) {
     return {reinterpret_cast<const char*>(data), size};
 }
 
-// Makes the directories of the log, and the log a way to nowhere: it would grow with every input.
+// Create the directories of the log and discard its lines, which would grow without bound.
 void prepareLog();
 
-// Replaces the content of the file, whose directory is made if need be.
+// Replace the content of the file; create its directory if needed.
 void writeFile(const char* path, const std::string& content);
 
-// From now on each program that the library starts prints this, and ends with exit code 0.
+// Make each program that the library starts print this and exit with 0.
 void programsPrint(const std::string& output);
 
 }  // namespace fuzz

@@ -1,4 +1,4 @@
-// /proc/drbd and the files of md arrays and ATA ports. The first byte chooses the file.
+// /proc/drbd and the files of md arrays and ATA ports. The first byte selects the file.
 #include <json/value.h>
 
 #include <array>

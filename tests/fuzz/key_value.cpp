@@ -1,4 +1,4 @@
-// The key-value file that holds the name of the pair.
+// The key-value file with the hostname of the pair.
 #include "fuzz/fuzz.h"
 #include "util.h"
 

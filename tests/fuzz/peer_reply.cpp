@@ -1,4 +1,4 @@
-// What the peer answers, to each of the questions that have an answer. The first byte chooses the question.
+// Replies of the peer. The first byte selects the request.
 #include <arpa/inet.h>
 #include <dlfcn.h>
 #include <json/value.h>
@@ -13,9 +13,9 @@
 
 namespace {
 
-std::string answer;
+std::string reply;
 
-// The peer's socket. It answers at once, in the middle of the asking side's sendto: no thread, no wait.
+// The peer's socket. The reply is sent within the requester's sendto(): no thread, no wait.
 int peerSocket() {
     static const int fd = [] {
         const int made = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
@@ -38,12 +38,12 @@ ssize_t sendto(int fd, const void* data, std::size_t size, int flags, const sock
         test::realFunction<ssize_t(int, const void*, std::size_t, int, const sockaddr*, socklen_t)>("sendto");
     peerSocket();
     const ssize_t sent = realSendto(fd, data, size, flags, address, length);
-    std::array<char, 64> question;
+    std::array<char, 64> request;
     sockaddr_in from = {};
     socklen_t fromLength = sizeof from;
-    recvfrom(peerSocket(), question.data(), question.size(), 0, reinterpret_cast<sockaddr*>(&from),
+    recvfrom(peerSocket(), request.data(), request.size(), 0, reinterpret_cast<sockaddr*>(&from),
              &fromLength);
-    realSendto(peerSocket(), answer.data(), answer.size(), 0, reinterpret_cast<sockaddr*>(&from), fromLength);
+    realSendto(peerSocket(), reply.data(), reply.size(), 0, reinterpret_cast<sockaddr*>(&from), fromLength);
     return sent;
 }
 
@@ -58,8 +58,8 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     if (size == 0 || size > 1000) {
         return 0;
     }
-    answer = fuzz::text(data + 1, size - 1);
-    const std::string arrived = answer.substr(0, 63).c_str();  // without what follows a zero byte
+    reply = fuzz::text(data + 1, size - 1);
+    const std::string arrived = reply.substr(0, 63).c_str();  // without what follows a zero byte
     switch (data[0] % 4) {
         case 0:
             fuzz::require(IsRemoteAlive()() == (arrived == "alive"), "only \"alive\" is alive");
@@ -68,19 +68,19 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
             fuzz::require(IsRemoteMDResync()() == (arrived == "resync"), "only \"resync\" is a resync");
             break;
         case 2: {
-            std::string name = "as it was";
-            fuzz::require(GetRemoteHostname()(name), "every answer is a name");
+            std::string name = "unchanged";
+            fuzz::require(GetRemoteHostname()(name), "every reply is a name");
             fuzz::require(name == arrived, "the name is what arrived");
             break;
         }
         default: {
-            const Json::Value before("as it was");
+            const Json::Value before("unchanged");
             Json::Value disks = before;
             const bool isHandling = IsRemoteDiskErrHandling()(disks);
-            fuzz::require(!isHandling || disks != before, "trouble comes with its list");
+            fuzz::require(!isHandling || disks != before, "error handling comes with its disks");
             fuzz::require(!isHandling || arrived.find("isDiskErrHandling") != std::string::npos ||
                               arrived.find('\\') != std::string::npos,
-                          "trouble is told by name");
+                          "error handling is named");
         }
     }
     return 0;

@@ -1,4 +1,4 @@
-// What ifconfig and ping print. The first byte chooses the program.
+// Output of ifconfig and ping. The first byte selects the program.
 #include <cmath>
 
 #include "checker.h"
@@ -20,7 +20,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     fuzz::programsPrint(output);
     if (data[0] % 2 == 0) {
         const float latency = heartbeatLatency();
-        // With any space around its words.
+        // Any whitespace may surround its words.
         fuzz::require(latency == 0.0F || output.find("min/avg/max/mdev") != std::string::npos,
                       "a latency comes from ping's summary");
         return 0;
@@ -28,7 +28,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     InterfaceChecker checker;
     float rate = -1;
     const bool isKnown = checker.networkNonOkRate(rate);
-    fuzz::require(isKnown || rate == -1.0F, "a rate that is not known stays as it was");
+    fuzz::require(isKnown || rate == -1.0F, "a rate that is not known stays unchanged");
     fuzz::require(!isKnown || !std::isnan(rate), "a rate that is known is a number");
     fuzz::require(!isKnown || rate == 0.0F || output.rfind("Iface", 0) == 0,
                   "a rate other than 0 has a title to it");

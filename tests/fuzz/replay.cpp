@@ -1,4 +1,4 @@
-// Hands all files of the target's corpus to it, in a build without the fuzzer.
+// Runs the target on each file of its corpus, in a build without the fuzzer.
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -8,7 +8,7 @@
 
 namespace {
 
-TEST(CorpusTest, EveryInputIsTaken) {
+TEST(CorpusTest, EveryInputIsAccepted) {
     LLVMFuzzerInitialize(nullptr, nullptr);
     int count = 0;
     for (const auto& entry : std::filesystem::directory_iterator(CORPUS)) {

@@ -18,8 +18,8 @@ using ::testing::ElementsAre;
 
 namespace {
 
-// The source files that logged, each with whether the number in every line is that of the source's line that
-// holds the beginning of the text.
+// Return the source files that logged, each with whether the logged line numbers are those of the
+// source lines that hold the text.
 std::map<std::string, bool> callSites(const std::vector<std::string>& messages) {
     std::map<std::string, bool> found;
     for (const std::string& message : messages) {
@@ -37,8 +37,8 @@ std::map<std::string, bool> callSites(const std::vector<std::string>& messages) 
 
 class CallSiteTest : public test::SandboxTest {};
 
-// One message of each source file that logs; the call site is passed by the same two means everywhere.
-TEST_F(CallSiteTest, MessagesNameTheLineOfTheSourceThatLogsThem) {
+// One message of each source file that logs: all use the same two macros.
+TEST_F(CallSiteTest, LogLinesNameTheirCallSite) {
     Status status;
     Json::Value reply;
     test::SystemLog systemLog;

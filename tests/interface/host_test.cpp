@@ -1,4 +1,4 @@
-// The host daemon that docs/integrating.md shows.
+// The host daemon of docs/integrating.md.
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -54,7 +54,7 @@ struct Machine {
     std::vector<std::string> argv;
 };
 
-TEST(ExampleHostTest, TwoOfThemFindEachOtherAndSeeWhatTheOtherDoes) {
+TEST(ExampleHostTest, TwoHostsExchangeTheirState) {
     Machine a("node-a", "10.0.0.1", "10.0.0.2");
     Machine b("node-b", "10.0.0.2", "10.0.0.1");
     test::connect(a.node, "10.0.0.1", b.node, "10.0.0.2");
@@ -72,7 +72,7 @@ TEST(ExampleHostTest, TwoOfThemFindEachOtherAndSeeWhatTheOtherDoes) {
 
 class OneExampleHostTest : public test::SandboxTest {};
 
-TEST_F(OneExampleHostTest, EndsAtOnceWithItsLogOnDisk) {
+TEST_F(OneExampleHostTest, FlushesItsLogAndExitsOnSigterm) {
     test::Process host(command("127.0.0.1", "127.0.0.2"));
     EXPECT_TRUE(test::eventually(20s, [] { return !statusAt(CONTROL).isNull(); })) << host.error();
     const test::Stopwatch stopwatch;
@@ -83,7 +83,7 @@ TEST_F(OneExampleHostTest, EndsAtOnceWithItsLogOnDisk) {
     EXPECT_EQ(test::readFile(BUFFER), "");
 }
 
-TEST_F(OneExampleHostTest, EndsWhenItCannotAnswerThePeer) {
+TEST_F(OneExampleHostTest, ExitsWhenThePortIsInUse) {
     const test::UdpSocket taken("127.0.0.1", 7499);
     test::Process host(command("127.0.0.1", "127.0.0.2"));
     EXPECT_EQ(exitCode(host), 1);
@@ -92,7 +92,7 @@ TEST_F(OneExampleHostTest, EndsWhenItCannotAnswerThePeer) {
         Contains(test::LogLine("env_check.cpp", "Failed to start socket serverAddress already in use")));
 }
 
-TEST_F(OneExampleHostTest, RefusesAWrongCommandLine) {
+TEST_F(OneExampleHostTest, RejectsAWrongCommandLine) {
     test::Process host({EXAMPLE_HOST});
     EXPECT_EQ(exitCode(host), 2);
 }

@@ -12,8 +12,8 @@
 #include "socket.h"
 #include "status.h"
 
-// Host daemons are built against these layouts: whatever moves here breaks every one of them that is not
-// built again. This file is compiled without access control, to see private fields.
+// Host daemons are compiled against these layouts: a change breaks all that are not rebuilt. This
+// file is compiled without access control, to reach private fields.
 
 #pragma GCC diagnostic ignored "-Winvalid-offsetof"
 
@@ -23,7 +23,7 @@ using namespace TERN::HA::Daemon;
 
 static_assert(sizeof(void*) == 8 || sizeof(void*) == 4);
 
-// What holds for 64-bit machines and for 32-bit ARM.
+// Select the value for 64-bit machines or 32-bit ARM.
 constexpr std::size_t bits(std::size_t for64, std::size_t for32) {
     return sizeof(void*) == 8 ? for64 : for32;
 }
@@ -133,7 +133,8 @@ TEST(ObjectLayout, InterfaceChecker) {
     EXPECT_EQ(offsetof(InterfaceChecker, _lastNonOkTotal), bits(8, 8));
 }
 
-// The place of a virtual operation in its class's table, from 1 on; 0 for an operation that is not virtual.
+// Return the index of a virtual function in its class's table, from 1; 0 for a function that is not
+// virtual.
 template <class Member>
 std::size_t slot(Member member) {
     std::ptrdiff_t words[2] = {};

@@ -13,13 +13,13 @@ namespace {
 
 using ::testing::ElementsAreArray;
 
-// The symbols that a library exports, as nm prints them, without addresses and types.
+// Return the exported symbols of a library as nm prints them, without addresses and types.
 std::set<std::string> exportedBy(const char* library) {
     const auto nm = test::run({NM, "--dynamic", "--demangle", "--defined-only", "--format=posix", library});
     EXPECT_EQ(nm.exitCode, 0) << nm.error;
     std::set<std::string> symbols;
     for (const std::string& line : test::lines(nm.output)) {
-        // NAME TYPE VALUE SIZE: a demangled name has blanks of its own.
+        // NAME TYPE VALUE SIZE; a demangled name may contain blanks.
         std::string name = line;
         for (int i = 0; i < 3; ++i) {
             name.erase(name.find_last_of(' '));
@@ -34,16 +34,16 @@ std::set<std::string> listed(const char* file) {
     return {symbols.begin(), symbols.end()};
 }
 
-TEST(ExportedSymbols, OfTheLibraryAreExactlyThoseListed) {
+TEST(ExportedSymbols, OfTheLibraryMatchTheList) {
     EXPECT_THAT(exportedBy(HADAEMON_LIBRARY), ElementsAreArray(listed(LISTS_DIR "/libternhadaemon.symbols")));
 }
 
-TEST(ExportedSymbols, OfThePlatformStandInAreExactlyThoseListed) {
+TEST(ExportedSymbols, OfThePlatformStubMatchTheList) {
     EXPECT_THAT(exportedBy(TERNCORE_LIBRARY), ElementsAreArray(listed(LISTS_DIR "/libterncore.symbols")));
 }
 
-// The last name in a symbol, as a test would write it: the operation, or the class of a constructor, a
-// destructor or a call operator.
+// Return the last name in a symbol as a test would write it: the function, or the class of a
+// constructor, destructor or call operator.
 std::string nameToLookFor(std::string symbol) {
     const std::size_t callOperator = symbol.find("::operator()");
     symbol = symbol.substr(0, callOperator != std::string::npos ? callOperator : symbol.find_first_of("[("));
@@ -68,7 +68,7 @@ bool mentions(const std::string& text, const std::string& name) {
     return false;
 }
 
-TEST(ExportedSymbols, EachFunctionIsNamedByATest) {
+TEST(ExportedSymbols, OfFunctionsAreEachNamedByATest) {
     std::string tests;
     for (const auto& entry : std::filesystem::recursive_directory_iterator(TESTS_DIR)) {
         if (entry.path().extension() == ".cpp" && entry.path().filename() != "layout_test.cpp") {
@@ -77,7 +77,7 @@ TEST(ExportedSymbols, EachFunctionIsNamedByATest) {
     }
     for (const std::string& symbol : listed(LISTS_DIR "/libternhadaemon.symbols")) {
         const std::string name = nameToLookFor(symbol);
-        // The steps behind the public operations cannot be called by a test.
+        // Tests cannot call private functions.
         const bool isFunction = symbol.find('(') != std::string::npos && symbol.rfind("vtable", 0) != 0;
         if (isFunction && name.front() != '_') {
             EXPECT_TRUE(mentions(tests, name)) << "no test names " << symbol;

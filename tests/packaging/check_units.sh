@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
-# Checks the units in the packages of DIRECTORY for mistakes and for what an attacker could reach from the
-# services: check_units.sh DIRECTORY ARCHITECTURE, in a sandbox.
+# Checks the units in the packages of DIRECTORY for mistakes and for what an attacker could reach
+# from the services: check_units.sh DIRECTORY ARCHITECTURE, in a sandbox.
 set -euo pipefail
 [ -e /.ternha-sandbox ] || { echo "check_units.sh: not in a sandbox" >&2; exit 99; }
 

@@ -26,7 +26,7 @@ class GeneratorTest : public ::testing::Test {
     }
 };
 
-TEST_F(GeneratorTest, LetsInThePeerAlone) {
+TEST_F(GeneratorTest, AllowsThePeerOnly) {
     const auto result = generate("local-ip = 10.0.0.1\nremote-ip = 10.0.0.2\ninterface = eth1\n");
     EXPECT_EQ(result.exitCode, 0);
     EXPECT_EQ(result.error, "");
@@ -61,10 +61,10 @@ void PrintTo(const WrongConfiguration& wrong, std::ostream* stream) {
     *stream << wrong.name;
 }
 
-class WrongConfigurationTest : public GeneratorTest,
-                               public ::testing::WithParamInterface<WrongConfiguration> {};
+class InvalidConfigurationTest : public GeneratorTest,
+                                 public ::testing::WithParamInterface<WrongConfiguration> {};
 
-TEST_P(WrongConfigurationTest, IsRefusedWithoutARule) {
+TEST_P(InvalidConfigurationTest, IsRejectedWithoutRules) {
     const auto result = generate(GetParam().text);
     EXPECT_EQ(result.exitCode, 1);
     EXPECT_EQ(result.output, "");
@@ -72,7 +72,7 @@ TEST_P(WrongConfigurationTest, IsRefusedWithoutARule) {
 }
 
 INSTANTIATE_TEST_SUITE_P(
-    Configurations, WrongConfigurationTest,
+    Configurations, InvalidConfigurationTest,
     ::testing::Values(
         WrongConfiguration{"NoPeer", "local-ip = 10.0.0.1\ninterface = eth1\n", "remote-ip is missing"},
         WrongConfiguration{"NothingButComments", "#local-ip = 10.0.0.1\n", "local-ip is missing"},
@@ -92,7 +92,7 @@ INSTANTIATE_TEST_SUITE_P(
                            "remote-ip is the same address as local-ip"}),
     [](const auto& wrong) { return wrong.param.name; });
 
-TEST_F(GeneratorTest, NamesAConfigurationThatCannotBeRead) {
+TEST_F(GeneratorTest, ReportsAnUnreadableConfiguration) {
     const auto result = test::run({TERNHA_FIREWALL, "--config", "/nowhere.conf"});
     EXPECT_EQ(result.exitCode, 1);
     EXPECT_EQ(result.output, "");
@@ -108,13 +108,13 @@ class FilterTest : public ::testing::Test {
                            "peer", "name", "eth2", "netns", std::to_string(third.pid())}));
         succeed(node.run({"ip", "address", "add", "10.0.1.1/24", "dev", "eth2"}));
         succeed(node.run({"ip", "link", "set", "eth2", "up"}));
-        // The third host has an address of its own and the peer's.
+        // The third host has its own address and that of the peer.
         succeed(third.run({"ip", "address", "add", "10.0.1.3/24", "dev", "eth2"}));
         succeed(third.run({"ip", "address", "add", "10.0.0.2/32", "dev", "eth2"}));
         succeed(third.run({"ip", "link", "set", "eth2", "up"}));
         succeed(third.run({"ip", "route", "add", "10.0.0.1/32", "dev", "eth2"}));
-        // Whether a forged sender reaches the daemon shall depend on the rules alone: neither do the kernels
-        // refuse it, nor is the third host's neighbour to be asked for.
+        // Only the rules may decide whether a forged sender reaches the daemon: disable the
+        // kernel's source address checks and preset the neighbour.
         for (const char* interface : {"all", "eth2"}) {
             succeed(node.run(
                 {"sh", "-c", std::string("echo 0 > /proc/sys/net/ipv4/conf/") + interface + "/rp_filter"}));
@@ -145,7 +145,7 @@ class FilterTest : public ::testing::Test {
         succeed(node.run({TERNHA_FIREWALL, "--config", CONFIG, action}));
     }
 
-    // Sends a datagram to the daemon from a host's address.
+    // Send a datagram to the daemon from an address of a host.
     static void send(test::Node& host, const std::string& sender, const std::string& text) {
         EXPECT_EQ(host.call([&] {
             test::UdpSocket(sender).send(text, "10.0.0.1", PORT);
@@ -154,17 +154,17 @@ class FilterTest : public ::testing::Test {
                   0);
     }
 
-    // Whether the daemon answers a question of a host within a second.
+    // Return whether the daemon replies to a host within a second.
     static bool isAnswered(test::Node& host, const std::string& sender) {
         return host.call([&] {
             test::UdpSocket socket(sender);
             socket.send("is_alive", "10.0.0.1", PORT);
-            const auto answer = socket.receive(1s);
-            return answer && answer->bytes == "alive" ? 0 : 1;
+            const auto reply = socket.receive(1s);
+            return reply && reply->bytes == "alive" ? 0 : 1;
         }) == 0;
     }
 
-    // An unknown request ends a daemon that it reaches.
+    // An unknown request aborts the daemon if it arrives.
     bool isEnded(std::chrono::milliseconds deadline) {
         const auto status = daemon->waitFor(deadline);
         return status && WIFSIGNALED(*status) && WTERMSIG(*status) == SIGABRT;
@@ -188,7 +188,7 @@ class FilterTest : public ::testing::Test {
     std::optional<test::Process> daemon;
 };
 
-TEST_F(FilterTest, WithoutRulesAThirdHostReachesTheDaemon) {
+TEST_F(FilterTest, ThirdHostReachesTheDaemonWithoutRules) {
     EXPECT_TRUE(isAnswered(third, "10.0.1.3"));
     send(third, "10.0.1.3", "nonsense");
     EXPECT_TRUE(isEnded(10s));
@@ -197,7 +197,7 @@ TEST_F(FilterTest, WithoutRulesAThirdHostReachesTheDaemon) {
     EXPECT_TRUE(isEnded(10s)) << "a forged sender";
 }
 
-TEST_F(FilterTest, WithRulesNothingOfAThirdHostReachesTheDaemonWhileThePeerDoes) {
+TEST_F(FilterTest, RulesDropAThirdHostButNotThePeer) {
     firewall("--apply");
     EXPECT_FALSE(isAnswered(third, "10.0.1.3"));
     send(third, "10.0.1.3", "nonsense");
@@ -209,7 +209,7 @@ TEST_F(FilterTest, WithRulesNothingOfAThirdHostReachesTheDaemonWhileThePeerDoes)
     EXPECT_EQ(test::readFile(node.path("/proc/sysrq-trigger")), "");
 }
 
-TEST_F(FilterTest, WithRulesAnotherHostOnTheLinkAndTheNodeItselfAreDropped) {
+TEST_F(FilterTest, RulesDropOtherHostsOnTheLinkAndTheNodeItself) {
     firewall("--apply");
     succeed(peer.run({"ip", "address", "add", "10.0.0.3/24", "dev", "eth1"}));
     send(peer, "10.0.0.3", "nonsense");
@@ -218,7 +218,7 @@ TEST_F(FilterTest, WithRulesAnotherHostOnTheLinkAndTheNodeItselfAreDropped) {
     EXPECT_TRUE(isAnswered(peer, "10.0.0.2"));
 }
 
-TEST_F(FilterTest, AreReplacedAsAWholeAndRemoved) {
+TEST_F(FilterTest, RulesAreReplacedAtomicallyAndRemoved) {
     firewall("--remove");
     firewall("--apply");
     firewall("--apply");
@@ -230,7 +230,7 @@ TEST_F(FilterTest, AreReplacedAsAWholeAndRemoved) {
     EXPECT_TRUE(isAnswered(third, "10.0.1.3"));
 }
 
-TEST_F(FilterTest, StayAsTheyAreWhenTheConfigurationIsWrong) {
+TEST_F(FilterTest, RulesAreKeptWhenTheConfigurationIsInvalid) {
     firewall("--apply");
     test::writeFile(node.path(CONFIG), "local-ip = 10.0.0.1\ninterface = eth1\n");
     const auto result = node.run({TERNHA_FIREWALL, "--config", CONFIG, "--apply"});

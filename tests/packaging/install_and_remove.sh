@@ -1,6 +1,7 @@
 #!/usr/bin/env bash
-# Installs the packages of DIRECTORY on a system like this one, runs the daemon from them, and removes them:
-# install_and_remove.sh DIRECTORY ARCHITECTURE, in a sandbox that has /var/lib/dpkg of the machine.
+# Installs the packages of DIRECTORY on a system like this one, runs the daemon from them, and
+# removes them: install_and_remove.sh DIRECTORY ARCHITECTURE, in a sandbox that has /var/lib/dpkg of
+# the machine.
 set -euo pipefail
 [ -e /.ternha-sandbox ] || { echo "install_and_remove.sh: not in a sandbox" >&2; exit 99; }
 packages=$1 architecture=$2
@@ -17,8 +18,8 @@ eventually() { # LIMIT_IN_SECONDS COMMAND...
     done
 }
 
-# The machine's programs are read-only here: changes go into a layer above them. Libraries of the other
-# architecture that the machine lacks lie in one below.
+# The machine's programs are read-only here: changes go into a layer above them. Libraries of the
+# other architecture that the machine lacks lie in one below.
 layers=/run/layers
 sysroot=
 [ "$architecture" = "$(dpkg --print-architecture)" ] || sysroot=$("${0%/*}/../../script/debian-root" sysroot)
@@ -33,8 +34,8 @@ for directory in /usr/*; do
     mount -t overlay overlay -o "lowerdir=$lower,upperdir=$layer/upper,workdir=$layer/work" "$directory"
 done
 
-# All that is not the machine's own. Directories that dpkg has only opened are in the layers too. The build tree,
-# where other tests write, is a file system of its own wherever it is.
+# All that is not the machine's own. Directories that dpkg has only opened are in the layers too.
+# The build tree, where other tests write, is a file system of its own wherever it is.
 changes() {
     {
         find /etc /var /tmp /run -xdev \( -path /var/lib/dpkg -o -path "$layers" -o -path /run/dpkg \) -prune -o -print

@@ -1,7 +1,7 @@
 #!/usr/bin/env bash
-# Installs the build tree into a prefix of its own, moves that somewhere else, and builds and runs a host daemon
-# against it: install_and_use.sh BUILD_DIRECTORY WORK_DIRECTORY CXX SANDBOX_LAUNCHER. What was built runs in the
-# sandbox only.
+# Installs the build tree into a prefix of its own, moves that somewhere else, and builds and runs a
+# host daemon against it: install_and_use.sh BUILD_DIRECTORY WORK_DIRECTORY CXX SANDBOX_LAUNCHER.
+# What was built runs in the sandbox only.
 set -euo pipefail
 here=$(cd "$(dirname "$0")" && pwd)
 build=$1 work=$2 cxx=$3 launcher=$4

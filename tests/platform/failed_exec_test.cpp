@@ -5,7 +5,7 @@
 namespace platform_test {
 namespace {
 
-// Programs that look as if they could run.
+// Executable files that fail to execute.
 class FailedExecTest : public test::SandboxTest {
  protected:
     void expectNotStarted(const std::string& content, int expectedErrno) {
@@ -23,11 +23,11 @@ class FailedExecTest : public test::SandboxTest {
     }
 };
 
-TEST_F(FailedExecTest, ReportsAFileThatIsNoProgram) {
+TEST_F(FailedExecTest, ReportsAFileOfUnknownFormat) {
     expectNotStarted("neither a program nor a script\n", ENOEXEC);
 }
 
-TEST_F(FailedExecTest, ReportsAScriptWithoutItsInterpreter) {
+TEST_F(FailedExecTest, ReportsAMissingInterpreter) {
     expectNotStarted("#!/no/such/shell\n", ENOENT);
 }
 

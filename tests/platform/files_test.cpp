@@ -44,18 +44,18 @@ TEST_F(KeyValueTest, QuotedValue) {
     EXPECT_EQ(lookUp("ha_hostname=\" pair 1 \"\n"), (Lookup{1, " pair 1 "}));
 }
 
-TEST_F(KeyValueTest, SingleQuotationMarkBelongsToTheValue) {
+TEST_F(KeyValueTest, UnpairedQuoteBelongsToTheValue) {
     EXPECT_EQ(lookUp("ha_hostname=\"pair1\n"), (Lookup{1, "\"pair1"}));
     EXPECT_EQ(lookUp("ha_hostname=pair1\"\n"), (Lookup{1, "pair1\""}));
     EXPECT_EQ(lookUp("ha_hostname=\"\n"), (Lookup{1, "\""}));
 }
 
-TEST_F(KeyValueTest, BlanksAroundDoNotCount) {
+TEST_F(KeyValueTest, SurroundingBlanksAreIgnored) {
     EXPECT_EQ(lookUp(" \tha_hostname \t= \tpair 1 \t\n"), (Lookup{1, "pair 1"}));
     EXPECT_EQ(lookUp("ha_hostname = \"pair1\" \n"), (Lookup{1, "pair1"}));
 }
 
-TEST_F(KeyValueTest, CommentsAndOtherLinesDoNotCount) {
+TEST_F(KeyValueTest, CommentsAndOtherLinesAreIgnored) {
     EXPECT_EQ(lookUp("#ha_hostname=a\n  # ha_hostname=b\n\n \nha_hostname\nha_hostname=pair1\n"),
               (Lookup{1, "pair1"}));
     EXPECT_EQ(lookUp("#ha_hostname=a\n"), MISSING);
@@ -63,33 +63,33 @@ TEST_F(KeyValueTest, CommentsAndOtherLinesDoNotCount) {
     EXPECT_EQ(lookUpIn(CONFIG, "#key"), MISSING);
 }
 
-TEST_F(KeyValueTest, OnlyTheWholeKeyCounts) {
+TEST_F(KeyValueTest, KeyMustMatchWhole) {
     EXPECT_EQ(lookUp("ha_hostname2=a\nxha_hostname=b\nHA_HOSTNAME=c\nha=d\n=e\n"), MISSING);
 }
 
-TEST_F(KeyValueTest, ValueReachesFromTheFirstEqualsSign) {
+TEST_F(KeyValueTest, ValueBeginsAfterTheFirstEqualsSign) {
     EXPECT_EQ(lookUp("ha_hostname=a=b#c\n"), (Lookup{1, "a=b#c"}));
 }
 
-TEST_F(KeyValueTest, EmptyValueIsAValue) {
+TEST_F(KeyValueTest, EmptyValueIsFound) {
     EXPECT_EQ(lookUp("ha_hostname=\n"), (Lookup{1, ""}));
     EXPECT_EQ(lookUp("ha_hostname= \"\" \n"), (Lookup{1, ""}));
 }
 
-TEST_F(KeyValueTest, FirstOfTwoLinesCounts) {
+TEST_F(KeyValueTest, FirstOfTwoEqualKeysWins) {
     EXPECT_EQ(lookUp("ha_hostname=first\nha_hostname=second\n"), (Lookup{1, "first"}));
 }
 
-TEST_F(KeyValueTest, CarriageReturnBelongsToTheLineEnd) {
+TEST_F(KeyValueTest, CarriageReturnIsStripped) {
     EXPECT_EQ(lookUp("ha_hostname=pair1\r\n"), (Lookup{1, "pair1"}));
     EXPECT_EQ(lookUp("other=a\r\n\r\nha_hostname=\"pair1\"\r\n"), (Lookup{1, "pair1"}));
 }
 
-TEST_F(KeyValueTest, LastLineNeedsNoEnd) {
+TEST_F(KeyValueTest, LastLineNeedsNoNewline) {
     EXPECT_EQ(lookUp("other=a\nha_hostname=pair1"), (Lookup{1, "pair1"}));
 }
 
-TEST_F(KeyValueTest, KeyFarDownInALongFile) {
+TEST_F(KeyValueTest, KeyFarDownInALongFileIsFound) {
     std::string content;
     for (int i = 0; i < 2000; ++i) {
         content += "key" + std::to_string(i) + "=value" + std::to_string(i) + "\n";
@@ -101,17 +101,17 @@ TEST_F(KeyValueTest, KeyFarDownInALongFile) {
     }
 }
 
-TEST_F(KeyValueTest, MissingKeyIsZero) {
+TEST_F(KeyValueTest, MissingKeyReturnsZero) {
     EXPECT_EQ(lookUp("other=a\n"), MISSING);
     EXPECT_EQ(lookUp(""), MISSING);
 }
 
-TEST_F(KeyValueTest, FileThatCannotBeReadIsAFailure) {
+TEST_F(KeyValueTest, UnreadableFileIsAFailure) {
     EXPECT_EQ(lookUpIn("/tmp/no-such-file"), (Lookup{-1, ""}));
     EXPECT_EQ(lookUpIn("/tmp"), (Lookup{-1, ""}));
 }
 
-TEST_F(KeyValueTest, LongValueIsCutAndTerminated) {
+TEST_F(KeyValueTest, LongValueIsTruncatedAndTerminated) {
     for (const char* const line : {"ha_hostname=abcdefgh\n", "ha_hostname=\"abcdefgh\"\n"}) {
         test::writeFile(CONFIG, line);
         for (const std::size_t size : {1U, 2U, 8U, 9U, 10U}) {
@@ -181,7 +181,7 @@ class AtaPortTest : public test::SandboxTest {
         std::filesystem::create_symlink("../" + device, "/sys/block/" + name);
     }
 
-    // The name that the port has, "none" for a port without one.
+    // Return the disk name of the port, or "none".
     static std::string nameAt(const char* port) {
         std::string buffer(8, UNTOUCHED);
         const int result = TERNDiskGetDevnamebyAtaPort(buffer.data(), static_cast<int>(buffer.size()), port);
@@ -194,14 +194,14 @@ class AtaPortTest : public test::SandboxTest {
     }
 };
 
-TEST_F(AtaPortTest, GivesTheDiskOnThePort) {
+TEST_F(AtaPortTest, ReturnsTheDiskOnThePort) {
     addDevice("sda", "ata3");
     addDevice("sdb", "ata4");
     EXPECT_EQ(nameAt("ata3"), "sda");
     EXPECT_EQ(nameAt("ata4"), "sdb");
 }
 
-TEST_F(AtaPortTest, OnlyTheWholeNameOfThePortCounts) {
+TEST_F(AtaPortTest, PortNameMustMatchWhole) {
     addDevice("sda", "ata10");
     for (const char* const port : {"ata1", "ata", "ta10", "10", "ata100", "ata10/", "/ata10"}) {
         EXPECT_EQ(nameAt(port), "none") << port;
@@ -211,7 +211,7 @@ TEST_F(AtaPortTest, OnlyTheWholeNameOfThePortCounts) {
     EXPECT_EQ(nameAt("ata10"), "sda");
 }
 
-TEST_F(AtaPortTest, GivesNoOpticalDrive) {
+TEST_F(AtaPortTest, OpticalDriveIsSkipped) {
     addDevice("sr0", "ata2", OPTICAL_DRIVE);
     EXPECT_EQ(nameAt("ata2"), "none");
     addDevice("sr1", "ata3", OPTICAL_DRIVE);
@@ -219,21 +219,21 @@ TEST_F(AtaPortTest, GivesNoOpticalDrive) {
     EXPECT_EQ(nameAt("ata3"), "sra");
 }
 
-TEST_F(AtaPortTest, GivesTheFirstDiskByName) {
+TEST_F(AtaPortTest, ReturnsTheFirstDiskByName) {
     addDevice("sdc", "ata3");
     addDevice("sdb", "ata3");
     addDevice("sdd", "ata3");
     EXPECT_EQ(nameAt("ata3"), "sdb");
 }
 
-TEST_F(AtaPortTest, GivesOnlyANameThatFits) {
+TEST_F(AtaPortTest, NameLongerThanTheBufferIsAFailure) {
     addDevice("sdabcde", "ata3");
     addDevice("sdabcdef", "ata4");
     EXPECT_EQ(nameAt("ata3"), "sdabcde");
     EXPECT_EQ(nameAt("ata4"), "none");
 }
 
-TEST_F(AtaPortTest, PassesOverDevicesOfOtherKinds) {
+TEST_F(AtaPortTest, OtherDevicesAreSkipped) {
     test::makeDirectories("/sys/block/loop0/ata3");
     test::makeDirectories("/sys/devices/virtual/block/md0");
     std::filesystem::create_symlink("../devices/virtual/block/md0", "/sys/block/md0");

@@ -21,7 +21,7 @@ namespace platform_test {
 
 constexpr std::chrono::seconds PATIENCE{30};
 
-/// Null-terminated argument vector. It keeps the texts.
+/// Owns a null-terminated argument vector.
 class Arguments {
  public:
     Arguments(std::initializer_list<std::string> texts) : _texts(texts) {
@@ -46,7 +46,7 @@ struct Output {
     int status = -1;  ///< as PLATPclose gives it
 };
 
-/// Runs a program behind a stream and reads all that it says.
+/// Run a program with PLATPopenv and read its whole output.
 inline Output outputOf(const Arguments& arguments) {
     FILE* const stream = PLATPopenv(arguments.path(), "r", arguments.vector());
     if (stream == nullptr) {
@@ -60,19 +60,19 @@ inline Output outputOf(const Arguments& arguments) {
     return output;
 }
 
-/// True when this process has no child, neither a running nor an ended one.
+/// Return whether this process has neither a running child nor a zombie.
 inline bool hasNoChild() {
     return waitpid(-1, nullptr, WNOHANG) == -1 && errno == ECHILD;
 }
 
-/// Holds up a shell program that runs `Gate::PASS` until the test opens it.
+/// Blocks a shell script at `Gate::PASS` until the test opens the gate.
 class Gate {
  public:
     static constexpr char PASS[] = "read line < /tmp/gate";
 
     Gate() { EXPECT_EQ(mkfifo("/tmp/gate", 0600), 0); }
 
-    /// Waits for the program to come to the gate; false when it does not.
+    /// Wait until the script reaches the gate; false on time-out.
     static bool open() {
         return test::eventually(PATIENCE, [] {
             const int fd = ::open("/tmp/gate", O_WRONLY | O_NONBLOCK | O_CLOEXEC);

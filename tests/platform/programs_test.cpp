@@ -17,26 +17,26 @@ using ::testing::MatchesRegex;
 
 class ProgramsTest : public test::SandboxTest {};
 
-TEST_F(ProgramsTest, ExecGivesZeroForAProgramThatSucceeds) {
+TEST_F(ProgramsTest, ExecReturnsZeroOnSuccess) {
     EXPECT_EQ(PLATExec("/bin/sh", "-c", "exit 0", nullptr), 0);
     const Arguments arguments = {"/bin/sh", "-c", "exit 0"};
     EXPECT_EQ(PLATExecv(arguments.path(), arguments.vector(), 1), 0);
 }
 
-TEST_F(ProgramsTest, ExecGivesNonZeroForAProgramThatFails) {
+TEST_F(ProgramsTest, ExecReturnsNonZeroOnFailure) {
     EXPECT_NE(PLATExec("/bin/sh", "-c", "exit 1", nullptr), 0);
     EXPECT_NE(PLATExec("/bin/sh", "-c", "exit 255", nullptr), 0);
     const Arguments arguments = {"/bin/sh", "-c", "exit 1"};
     EXPECT_NE(PLATExecv(arguments.path(), arguments.vector(), 1), 0);
 }
 
-TEST_F(ProgramsTest, ExecGivesNonZeroForAProgramThatASignalEnds) {
+TEST_F(ProgramsTest, ExecReturnsNonZeroOnSignal) {
     EXPECT_NE(PLATExec("/bin/sh", "-c", "kill -KILL $$", nullptr), 0);
     const Arguments arguments = {"/bin/sh", "-c", "kill -KILL $$"};
     EXPECT_NE(PLATExecv(arguments.path(), arguments.vector(), 1), 0);
 }
 
-TEST_F(ProgramsTest, ExecHasWaitedForTheEndOfTheProgram) {
+TEST_F(ProgramsTest, ExecWaitsForTheProgram) {
     constexpr char SLOW[] = "sleep 0.3; echo done > /tmp/done";
     EXPECT_EQ(PLATExec("/bin/sh", "-c", SLOW, nullptr), 0);
     EXPECT_TRUE(test::exists("/tmp/done"));
@@ -63,7 +63,7 @@ TEST_F(ProgramsTest, ExecvPassesItsArgumentVector) {
     EXPECT_EQ(test::readFile("/tmp/arguments"), "zero|a b||*|");
 }
 
-TEST_F(ProgramsTest, ExecGivesNonZeroForAProgramThatCannotBeStarted) {
+TEST_F(ProgramsTest, ExecReturnsNonZeroWhenTheProgramCannotStart) {
     test::writeFile("/tmp/text", "#!/bin/sh\n");
     for (const char* const path :
          {"/bin/no-such-program", "/tmp", "/tmp/text", "", static_cast<const char*>(nullptr)}) {
@@ -80,7 +80,7 @@ TEST_F(ProgramsTest, ExecGivesNonZeroForAProgramThatCannotBeStarted) {
     EXPECT_TRUE(hasNoChild());
 }
 
-TEST_F(ProgramsTest, ExecvWithoutWaitLeavesARunningProgramAndNoChild) {
+TEST_F(ProgramsTest, ExecvWithoutWaitLeavesNoChild) {
     const Gate gate;
     const Arguments arguments = {"/bin/sh", "-c", std::string(Gate::PASS) + "; echo done > /tmp/done"};
     EXPECT_EQ(PLATExecv(arguments.path(), arguments.vector(), 0), 0);
@@ -91,20 +91,20 @@ TEST_F(ProgramsTest, ExecvWithoutWaitLeavesARunningProgramAndNoChild) {
     EXPECT_TRUE(hasNoChild());
 }
 
-TEST_F(ProgramsTest, ExecvWithoutWaitDoesNotReportHowTheProgramEnds) {
+TEST_F(ProgramsTest, ExecvWithoutWaitIgnoresTheExitStatus) {
     const Arguments arguments = {"/bin/false"};
     EXPECT_EQ(PLATExecv(arguments.path(), arguments.vector(), 0), 0);
 }
 
 TEST_F(ProgramsTest, InheritOnlyTheStandardDescriptors) {
-    // Not close-on-exec, as other code of a host may open its files.
+    // Not close-on-exec, like files of other code in a host daemon.
     const test::Descriptor file(open("/dev/null", O_RDONLY), "cannot open /dev/null");
     const test::Descriptor high(fcntl(file.get(), F_DUPFD, 100), "cannot copy a descriptor");
     const Arguments cat = {"/bin/cat"};
     FILE* const stream = PLATPopenv(cat.path(), "w", cat.vector());
     ASSERT_NE(stream, nullptr);
 
-    // The last one is the listing's own.
+    // The last one belongs to the listing itself.
     constexpr char STANDARD_ONLY[] = "0\n1\n2\n3\n";
     EXPECT_EQ(outputOf({"/bin/ls", "/proc/self/fd"}).text, STANDARD_ONLY);
     EXPECT_EQ(PLATExec("/bin/sh", "-c", "exec ls /proc/self/fd > /tmp/waited", nullptr), 0);
@@ -125,7 +125,8 @@ TEST_F(ProgramsTest, InheritNeitherBlockedNorIgnoredSignals) {
         ASSERT_NE(std::signal(number, SIG_IGN), SIG_ERR);
     }
 
-    // The C library has signals of its own, above the 31 standard ones, ignored in what it starts.
+    // posix_spawn leaves signals above the 31 standard ones, which the C library uses itself,
+    // ignored.
     const auto hasNoSignal = MatchesRegex("SigBlk:\t0{16}\nSigIgn:\t[0-9a-f]{8}[08]0{7}\n");
     EXPECT_THAT(outputOf({"/bin/grep", "-E", "^Sig(Blk|Ign)", "/proc/self/status"}).text, hasNoSignal);
     EXPECT_EQ(
@@ -139,7 +140,7 @@ TEST_F(ProgramsTest, InheritNeitherBlockedNorIgnoredSignals) {
     EXPECT_THAT(test::readFile("/tmp/detached"), hasNoSignal);
 }
 
-TEST_F(ProgramsTest, ExecvLeavesTheCallersSignalMaskAsItIs) {
+TEST_F(ProgramsTest, ExecvKeepsTheCallersSignalMask) {
     sigset_t blocked;
     sigemptyset(&blocked);
     sigaddset(&blocked, SIGUSR2);
@@ -165,7 +166,7 @@ void tellStrangers(int /*signal*/) {
     }
 }
 
-TEST_F(ProgramsTest, ExecvWithoutWaitRunsNoSignalHandlerInAnotherProcess) {
+TEST_F(ProgramsTest, ExecvWithoutWaitRunsNoSignalHandlerInTheChild) {
     int ends[2] = {-1, -1};
     ASSERT_EQ(pipe2(ends, O_CLOEXEC | O_NONBLOCK), 0);
     const test::Descriptor readEnd(ends[0], "pipe");
@@ -195,7 +196,7 @@ bool isAsleep(pid_t thread) {
     return stat.substr(stat.rfind(')') + 2, 1) == "S";
 }
 
-// Signals come while a program is waited for.
+// Signals arrive during the wait for a program.
 class InterruptedWaitTest : public test::SandboxTest {
  protected:
     void SetUp() override {
@@ -205,7 +206,8 @@ class InterruptedWaitTest : public test::SandboxTest {
         ASSERT_EQ(sigaction(SIGUSR1, &action, nullptr), 0);
     }
 
-    // Interrupts the thread that runs `waitForProgram`, then lets the program end. Returns the call's result.
+    // Interrupt the thread that runs `waitForProgram`, then let the program end; return the call's
+    // result.
     int interrupted(const std::function<int()>& waitForProgram) const {
         std::atomic<pid_t> id{0};
         int result = -1;
@@ -233,16 +235,16 @@ class InterruptedWaitTest : public test::SandboxTest {
     const Gate _gate;
 };
 
-TEST_F(InterruptedWaitTest, ExecGoesOnWaiting) {
+TEST_F(InterruptedWaitTest, ExecKeepsWaiting) {
     EXPECT_EQ(interrupted([] { return PLATExec("/bin/sh", "-c", programWithExit(0).c_str(), nullptr); }), 0);
 }
 
-TEST_F(InterruptedWaitTest, ExecvGoesOnWaiting) {
+TEST_F(InterruptedWaitTest, ExecvKeepsWaiting) {
     const Arguments arguments = {"/bin/sh", "-c", programWithExit(0)};
     EXPECT_EQ(interrupted([&] { return PLATExecv(arguments.path(), arguments.vector(), 1); }), 0);
 }
 
-TEST_F(InterruptedWaitTest, PcloseGoesOnWaiting) {
+TEST_F(InterruptedWaitTest, PcloseKeepsWaiting) {
     const Arguments arguments = {"/bin/sh", "-c", programWithExit(3)};
     FILE* const stream = PLATPopenv(arguments.path(), "r", arguments.vector());
     ASSERT_NE(stream, nullptr);

@@ -32,14 +32,14 @@ TEST_F(StreamsTest, PassTheArgumentVectorWithoutAShell) {
     EXPECT_EQ(PLATPclose(stream), 0);
 }
 
-TEST_F(StreamsTest, PcloseGivesTheRawWaitStatus) {
+TEST_F(StreamsTest, PcloseReturnsTheRawWaitStatus) {
     EXPECT_EQ(outputOf({"/bin/sh", "-c", "exit 1"}).status, 256);
     EXPECT_EQ(outputOf({"/bin/sh", "-c", "exit 255"}).status, 255 * 256);
     EXPECT_EQ(outputOf({"/bin/sh", "-c", "kill -KILL $$"}).status, SIGKILL);
     EXPECT_EQ(outputOf({"/bin/sh", "-c", "kill -TERM $$"}).status, SIGTERM);
 }
 
-TEST_F(StreamsTest, PcloseWaitsForTheEndOfTheProgram) {
+TEST_F(StreamsTest, PcloseWaitsForTheProgram) {
     const Arguments arguments = {"/bin/sh", "-c", "exec > /dev/null; sleep 0.3; echo done > /tmp/done"};
     FILE* const stream = PLATPopenv(arguments.path(), "r", arguments.vector());
     ASSERT_THAT(stream, NotNull());
@@ -49,7 +49,7 @@ TEST_F(StreamsTest, PcloseWaitsForTheEndOfTheProgram) {
     EXPECT_TRUE(hasNoChild());
 }
 
-TEST_F(StreamsTest, ReadMoreThanAPipeHolds) {
+TEST_F(StreamsTest, ReadMoreThanThePipeCapacity) {
     std::string expected;
     for (int number = 1; number <= 100000; ++number) {
         expected += std::to_string(number) + "\n";
@@ -59,7 +59,7 @@ TEST_F(StreamsTest, ReadMoreThanAPipeHolds) {
     EXPECT_EQ(output.status, 0);
 }
 
-TEST_F(StreamsTest, EndAWriterWhenTheyAreClosedEarly) {
+TEST_F(StreamsTest, ClosingEarlyEndsTheProgramBySigpipe) {
     ASSERT_NE(std::signal(SIGPIPE, SIG_IGN), SIG_ERR);
     const Arguments arguments = {"/usr/bin/yes"};
     FILE* const stream = PLATPopenv(arguments.path(), "r", arguments.vector());
@@ -80,7 +80,7 @@ TEST_F(StreamsTest, WriteToTheStandardInput) {
     EXPECT_TRUE(test::readFile("/tmp/copy") == text + "end");
 }
 
-TEST_F(StreamsTest, AreNullForAProgramThatCannotBeStarted) {
+TEST_F(StreamsTest, AreNullWhenTheProgramCannotStart) {
     test::writeFile("/tmp/text", "#!/bin/sh\n");
     const struct {
         const char* path;
@@ -122,7 +122,7 @@ TEST_F(StreamsTest, AreNullForInvalidArguments) {
     EXPECT_EQ(errno, EINVAL);
 }
 
-TEST_F(StreamsTest, AreNullWhenNoDescriptorIsLeft) {
+TEST_F(StreamsTest, AreNullWithoutFreeDescriptors) {
     rlimit before = {};
     ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &before), 0);
     rlimit limit = before;
@@ -138,7 +138,7 @@ TEST_F(StreamsTest, AreNullWhenNoDescriptorIsLeft) {
     EXPECT_TRUE(hasNoChild());
 }
 
-TEST_F(StreamsTest, PcloseRefusesAStreamThatIsNotItsOwn) {
+TEST_F(StreamsTest, PcloseRejectsAForeignStream) {
     FILE* const file = std::tmpfile();
     ASSERT_THAT(file, NotNull());
     errno = 0;
@@ -149,7 +149,7 @@ TEST_F(StreamsTest, PcloseRefusesAStreamThatIsNotItsOwn) {
     EXPECT_EQ(PLATPclose(nullptr), -1);
 }
 
-TEST_F(StreamsTest, PcloseRefusesAStreamThatIsClosed) {
+TEST_F(StreamsTest, PcloseRejectsAClosedStream) {
     const Arguments arguments = {"/bin/true"};
     FILE* const stream = PLATPopenv(arguments.path(), "r", arguments.vector());
     ASSERT_THAT(stream, NotNull());
@@ -157,7 +157,7 @@ TEST_F(StreamsTest, PcloseRefusesAStreamThatIsClosed) {
     EXPECT_EQ(PLATPclose(stream), -1);
 }
 
-TEST_F(StreamsTest, OfOneThreadAreClosedInAnyOrder) {
+TEST_F(StreamsTest, MayBeClosedInAnyOrder) {
     std::vector<FILE*> streams;
     for (const char* const code : {"1", "2", "3"}) {
         const Arguments arguments = {"/bin/sh", "-c", std::string("exit ") + code};
@@ -169,7 +169,7 @@ TEST_F(StreamsTest, OfOneThreadAreClosedInAnyOrder) {
     EXPECT_EQ(PLATPclose(streams[0]), 1 * 256);
 }
 
-TEST_F(StreamsTest, OfManyThreadsDoNotMixUp) {
+TEST_F(StreamsTest, OfConcurrentThreadsAreSeparate) {
     constexpr int THREADS = 8;
     constexpr int RUNS = 25;
     std::vector<std::thread> threads;
@@ -193,7 +193,7 @@ TEST_F(StreamsTest, OfManyThreadsDoNotMixUp) {
     EXPECT_TRUE(hasNoChild());
 }
 
-// Closes standard descriptors for as long as it lives.
+// Closes standard descriptors for the lifetime of the object.
 class WithoutDescriptors {
  public:
     explicit WithoutDescriptors(const std::set<int>& descriptors) {
@@ -216,7 +216,7 @@ class WithoutDescriptors {
     std::vector<std::pair<int, int>> _copies;
 };
 
-// The streams' own descriptors may then be standard ones.
+// The descriptors of streams may then be standard ones.
 class MissingDescriptorsTest : public test::SandboxTest,
                                public ::testing::WithParamInterface<std::set<int>> {};
 
@@ -245,13 +245,13 @@ TEST_P(MissingDescriptorsTest, WriteToTheStandardInput) {
     EXPECT_EQ(test::readFile("/tmp/copy"), "text");
 }
 
-TEST_P(MissingDescriptorsTest, ProgramsGetNoEndOfTheirPipeInstead) {
+TEST_P(MissingDescriptorsTest, PipeEndsDoNotBecomeStandardDescriptors) {
     Output output;
     {
         const WithoutDescriptors missing(GetParam());
         output = outputOf({"/bin/ls", "/proc/self/fd"});
     }
-    // Those that the test has, the stream's, and the lowest free one for the listing itself.
+    // Those of the test and the stream, and the lowest free one for the listing itself.
     std::set<int> expected = {0, 1, 2};
     for (const int fd : GetParam()) {
         expected.erase(fd);

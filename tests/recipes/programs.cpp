@@ -16,8 +16,7 @@ namespace test {
 
 namespace {
 
-// Directories that both have: those of the programs above those of the machine, in a layer that can be
-// written.
+// Overlay the directories of the programs on those of the machine, writably.
 void layOver(const fs::path& directory) {
     const fs::path layer = "/run/layers" + directory.string();
     makeDirectories(layer / "upper");

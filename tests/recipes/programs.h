@@ -4,11 +4,11 @@
 
 namespace test {
 
-// Puts the programs of the recipes, and ternhad and ternhactl where their package has them, beside the
-// machine's: from then on, and in nodes made afterwards.
+// Add the programs of the recipes, and ternhad and ternhactl at their installed paths, to the
+// sandbox and to nodes created afterwards.
 void installPrograms();
 
-// The file that docs/recipes.md shows under its path, as in "`/etc/x` ...:".
+// Return the file that docs/recipes.md shows after its path, as in "`/etc/x` ...:".
 std::string recipe(const std::string& path);
 
 }  // namespace test

@@ -24,13 +24,13 @@ void writeProgram(const std::string& path, const std::string& text) {
     ASSERT_EQ(chmod(path.c_str(), 0755), 0);
 }
 
-// Gives the node an empty directory of its own below /etc, in place of the machine's.
+// Mount an empty directory of the node over one of /etc.
 void makeEmpty(test::Machine& machine, const std::string& directory) {
     ASSERT_EQ(machine.node.run({"/bin/sh", "-c", "rm -rf " + directory + " && mkdir " + directory}).exitCode,
               0);
 }
 
-// Gives the node a user with a group of the same number; the machine may have another of that name.
+// Add a user and a group of the same number to the node.
 void addUser(test::Machine& machine, const std::string& user, const std::string& group,
              const std::string& id) {
     const std::string entry = ':' + id + ':' + id + "::/:/bin/sh";
@@ -49,7 +49,7 @@ class RecipesTest : public ::testing::Test {
     RecipesTest() { test::installPrograms(); }
 };
 
-// Two machines of the cluster with ternhad on both.
+// Two nodes of the cluster, each with ternhad.
 class Cluster {
  public:
     Cluster() {
@@ -75,14 +75,14 @@ class Cluster {
     test::Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
 };
 
-TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhereThatIsSafe) {
+TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhenSafe) {
     writeProgram("/usr/local/sbin/ternha-role.recipe", test::recipe("/usr/local/sbin/ternha-role"));
     writeProgram("/usr/local/sbin/ternha-role",
                  "#!/bin/sh\n/usr/local/sbin/ternha-role.recipe \"$@\"\necho \"$3 $?\" >>/tmp/role\n");
     writeProgram("/usr/sbin/drbdadm", "#!/bin/sh\necho \"$*\" >>/tmp/drbdadm\n");
     Cluster cluster;
     test::Machine& a = cluster.a;
-    // The service network: its only other member never answers.
+    // The service network, whose only other member never replies.
     ASSERT_EQ(a.node.run({"ip", "link", "add", "eth0", "type", "veth", "peer", "name", "cable"}).exitCode, 0);
     for (const char* device : {"eth0", "cable"}) {
         ASSERT_EQ(a.node.run({"ip", "link", "set", device, "up"}).exitCode, 0);
@@ -109,7 +109,7 @@ TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhereThatIsSafe) {
     EXPECT_THAT(test::readFile(a.node.path("/tmp/drbdadm")),
                 ::testing::EndsWith("primary r0\nsecondary r0\n"));
 
-    // DRBD is down and the peer alive: it may be writing.
+    // DRBD is disconnected and the peer alive: it may be writing.
     a.write("/proc/drbd", " 0: cs:WFConnection ro:Secondary/Unknown ds:UpToDate/DUnknown C r-----\n");
     ASSERT_TRUE(test::eventually(20s, [&a] { return a.sees("isDRBDConnect", false); }));
     a.write(SYNC_ACTION, "idle\n");
@@ -117,7 +117,7 @@ TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhereThatIsSafe) {
     EXPECT_TRUE(cluster.eventuallyContains("/tmp/role", "MASTER 1\n"));
     EXPECT_THAT(test::readFile(a.node.path("/tmp/drbdadm")), Not(::testing::EndsWith("primary r0\n")));
 
-    // Once it is dead, this node may.
+    // Once it is dead, this node may promote.
     a.write(SYNC_ACTION, "resync\n");
     EXPECT_TRUE(hasAddress(false));
     cluster.b.daemon->signal(SIGKILL);
@@ -133,7 +133,7 @@ TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhereThatIsSafe) {
 
 class NrpeTest : public RecipesTest {
  protected:
-    // The answer of the node's NRPE with this configuration of the check.
+    // Return the reply of the node's NRPE with this configuration of the check.
     static test::CommandResult ask(Cluster& cluster, const std::string& configuration) {
         test::Machine& a = cluster.a;
         a.write("/etc/hosts", "127.0.0.1 localhost node-a\n");
@@ -157,7 +157,7 @@ class NrpeTest : public RecipesTest {
     }
 };
 
-TEST_F(NrpeTest, SudoLetsNagiosRunTheCheckAndNothingElse) {
+TEST_F(NrpeTest, SudoAllowsNagiosOnlyTheCheck) {
     Cluster cluster;
     test::Machine& a = cluster.a;
     addUser(a, "nagios", "nagios", "990");
@@ -292,7 +292,7 @@ system {
 }
 )";
 
-TEST_F(RecipesTest, PacemakerKnowsWhetherTheNodeIsFit) {
+TEST_F(RecipesTest, PacemakerLearnsWhetherTheNodeIsFit) {
     writeProgram("/usr/local/sbin/ternha-attribute", test::recipe("/usr/local/sbin/ternha-attribute"));
     Cluster cluster;
     test::Machine& a = cluster.a;

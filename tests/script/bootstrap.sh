@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
-# script/bootstrap on machines that lack packages, rights or an index: bootstrap.sh BOOTSTRAP, in a sandbox. The
-# programs that it calls are stubs.
+# script/bootstrap on machines that lack packages, rights or an index: bootstrap.sh BOOTSTRAP, in a
+# sandbox. The programs that it calls are stubs.
 set -uo pipefail
 [ -e /.ternha-sandbox ] || { echo "bootstrap.sh: not in a sandbox" >&2; exit 99; }
 bootstrap=$1
@@ -36,7 +36,8 @@ bootstrap_as 1000 demo
 [ "$code$calls" = 1 ] || fail "without rights: exit code $code"
 says "apt-get install --no-install-recommends bubblewrap cmake g++ "
 
-# One library is there for the other architecture only, one for this one only; the index is fetched with errors.
+# One library is there for the other architecture only, one for this one only; the index is fetched
+# with errors.
 stub dpkg-query 'case $3 in
     libgtest-dev:armhf) exit 1 ;;
     libjsoncpp-dev | *:armhf) echo installed armhf ;;

@@ -19,25 +19,25 @@ using ::testing::IsEmpty;
 
 class ClientSocketTest : public test::SocketTest {
  protected:
-    Json::Value request{"question"};
-    Json::Value reply{"as it was"};
+    Json::Value request{"request"};
+    Json::Value reply{"unchanged"};
 };
 
-TEST_F(ClientSocketTest, SendsOneRequestAndTakesItsReply) {
-    HandlerSocket server([](const Json::Value& asked, Json::Value& answer) {
-        answer["got"] = asked;
+TEST_F(ClientSocketTest, SendsOneRequestAndReceivesItsReply) {
+    HandlerSocket server([](const Json::Value& received, Json::Value& result) {
+        result["got"] = received;
         return true;
     });
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
     HandlerSocket client({}, test::LOCAL_SOCKET, 5);
     EXPECT_TRUE(client.clientSend(request, reply));
-    EXPECT_EQ(reply["got"], "question");
+    EXPECT_EQ(reply["got"], "request");
     EXPECT_FALSE(client.hasError());
     EXPECT_THAT(systemLog(), IsEmpty());
 }
 
-TEST_F(ClientSocketTest, ASecondRequestOnOneObjectFailsForGood) {
+TEST_F(ClientSocketTest, SecondRequestFailsForGood) {
     HandlerSocket server([](const Json::Value&, Json::Value&) { return true; });
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
@@ -56,11 +56,11 @@ TEST_F(ClientSocketTest, ASecondRequestOnOneObjectFailsForGood) {
                     test::LogLine("socket.cpp", "Failed to send content: has error")));
 }
 
-TEST_F(ClientSocketTest, WithoutAServerTwoLinesSaySo) {
+TEST_F(ClientSocketTest, ConnectFailureLogsTwoLines) {
     HandlerSocket client;
     EXPECT_FALSE(client.clientSend(request, reply));
     EXPECT_TRUE(client.hasError());
-    EXPECT_EQ(reply, "as it was");
+    EXPECT_EQ(reply, "unchanged");
     EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp",
                                                        "Failed to connect socket /tmp/control.sock: No "
                                                        "such file or directory"),
@@ -69,7 +69,7 @@ TEST_F(ClientSocketTest, WithoutAServerTwoLinesSaySo) {
                                                        "or directory")));
 }
 
-TEST_F(ClientSocketTest, ATimeoutThatCannotBeSetTwoLinesSaySo) {
+TEST_F(ClientSocketTest, TimeoutOptionFailureLogsTwoLines) {
     HandlerSocket client({}, test::LOCAL_SOCKET, 5);
     const test::FailingCall failing("setsockopt", EDOM);
     EXPECT_FALSE(client.clientSend(request, reply));
@@ -80,7 +80,7 @@ TEST_F(ClientSocketTest, ATimeoutThatCannotBeSetTwoLinesSaySo) {
                                                        "argument out of domain")));
 }
 
-TEST_F(ClientSocketTest, GivesUpAfterItsTimeout) {
+TEST_F(ClientSocketTest, TimesOut) {
     const test::SilentServer server;
     HandlerSocket client({}, test::LOCAL_SOCKET, 5);
     const test::Stopwatch stopwatch;
@@ -88,12 +88,12 @@ TEST_F(ClientSocketTest, GivesUpAfterItsTimeout) {
     EXPECT_GE(stopwatch.elapsed(), 5s);
     EXPECT_EQ(test::receiveTimeout(), 5s);
     EXPECT_TRUE(client.hasError());
-    EXPECT_EQ(reply, "as it was");
+    EXPECT_EQ(reply, "unchanged");
     EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp",
                                                        "Failed to recv , Resource temporarily unavailable")));
 }
 
-TEST_F(ClientSocketTest, SendsACompactTextWithoutAnEndMark) {
+TEST_F(ClientSocketTest, RequestIsCompactAndUnterminated) {
     request = Json::Value(Json::objectValue);
     request["b"].append(1);
     request["a"] = true;
@@ -105,7 +105,7 @@ TEST_F(ClientSocketTest, SendsACompactTextWithoutAnEndMark) {
 
 class NoTimeoutTest : public ClientSocketTest, public ::testing::WithParamInterface<unsigned int> {};
 
-TEST_P(NoTimeoutTest, WaitsForEver) {
+TEST_P(NoTimeoutTest, SetsNoSocketOption) {
     test::HandlerSocket client({}, "/tmp/nowhere", GetParam());
     const test::FailingCall failing("setsockopt", EDOM);  // no time-out is set at all
     EXPECT_FALSE(client.clientSend(request, reply));
@@ -115,22 +115,22 @@ TEST_P(NoTimeoutTest, WaitsForEver) {
 
 INSTANTIATE_TEST_SUITE_P(Timeouts, NoTimeoutTest, ::testing::Values(0U, 2147483648U, 4294967295U));
 
-TEST_F(ClientSocketTest, ARefusedRequestFailsToParse) {
+TEST_F(ClientSocketTest, RefusedRequestFailsToParse) {
     HandlerSocket server([](const Json::Value&, Json::Value&) { return false; });
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
     HandlerSocket client;
     EXPECT_FALSE(client.clientSend(request, reply));
     EXPECT_TRUE(client.hasError());
-    EXPECT_EQ(reply, "as it was");
+    EXPECT_EQ(reply, "unchanged");
     EXPECT_THAT(systemLog(), ::testing::UnorderedElementsAre(
-                                 test::LogLine("socket.cpp", "Failed to handle input data: \"question\""),
+                                 test::LogLine("socket.cpp", "Failed to handle input data: \"request\""),
                                  HasSubstr(" Failed to parse , ")));
 }
 
-TEST_F(ClientSocketTest, AReplyOf2095BytesIsWhole) {
-    HandlerSocket server([](const Json::Value&, Json::Value& answer) {
-        answer = std::string(2093, 'y');
+TEST_F(ClientSocketTest, ReplyOf2095BytesIsReceivedWhole) {
+    HandlerSocket server([](const Json::Value&, Json::Value& result) {
+        result = std::string(2093, 'y');
         return true;
     });
     ASSERT_TRUE(server.serverBind());
@@ -140,9 +140,9 @@ TEST_F(ClientSocketTest, AReplyOf2095BytesIsWhole) {
     EXPECT_EQ(reply, std::string(2093, 'y'));
 }
 
-TEST_F(ClientSocketTest, ALongerReplyIsCutAndFailsToParse) {
-    HandlerSocket server([](const Json::Value&, Json::Value& answer) {
-        answer = std::string(2094, 'y');
+TEST_F(ClientSocketTest, LongerReplyIsTruncatedAndFailsToParse) {
+    HandlerSocket server([](const Json::Value&, Json::Value& result) {
+        result = std::string(2094, 'y');
         return true;
     });
     ASSERT_TRUE(server.serverBind());
@@ -150,22 +150,21 @@ TEST_F(ClientSocketTest, ALongerReplyIsCutAndFailsToParse) {
     HandlerSocket client;
     EXPECT_FALSE(client.clientSend(request, reply));
     EXPECT_TRUE(client.hasError());
-    EXPECT_EQ(reply, "as it was");
+    EXPECT_EQ(reply, "unchanged");
     EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to parse \"" + std::string(2094, 'y') + ", ")));
 }
 
-TEST_F(ClientSocketTest, AServerThatGoesBeforeTheRequestDoesNotEndTheClient) {
+TEST_F(ClientSocketTest, ServerClosingBeforeTheRequestRaisesNoSigpipe) {
     std::optional<test::SilentServer> server(std::in_place);
     const test::ConnectHook leave([&server] { server.reset(); });
     HandlerSocket client({}, test::LOCAL_SOCKET, 5);
     EXPECT_FALSE(client.clientSend(request, reply));
     EXPECT_TRUE(client.hasError());
-    EXPECT_EQ(reply, "as it was");
-    EXPECT_THAT(systemLog(),
-                ElementsAre(test::LogLine("socket.cpp", "Failed to send content: \"question\"")));
+    EXPECT_EQ(reply, "unchanged");
+    EXPECT_THAT(systemLog(), ElementsAre(test::LogLine("socket.cpp", "Failed to send content: \"request\"")));
 }
 
-TEST_F(ClientSocketTest, AServerThatGoesBeforeItsReplyIsReported) {
+TEST_F(ClientSocketTest, ServerClosingBeforeItsReplyIsLogged) {
     const test::SilentServer server;
     std::thread leaving([&server] { server.dropRequest(); });
     HandlerSocket client({}, test::LOCAL_SOCKET, 60);

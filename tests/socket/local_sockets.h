@@ -11,12 +11,12 @@
 #include "socket.h"
 #include "support/descriptor.h"
 
-// Both ends of the control socket as tests see them.
+// Both ends of the control socket for tests.
 namespace test {
 
 constexpr char LOCAL_SOCKET[] = "/tmp/control.sock";
 
-// Answers by a function of the test.
+// Replies by a function of the test.
 class HandlerSocket final : public TERN::HA::Daemon::DaemonLocalSocket {
  public:
     using Handler = std::function<bool(const Json::Value& request, Json::Value& reply)>;
@@ -32,7 +32,7 @@ class HandlerSocket final : public TERN::HA::Daemon::DaemonLocalSocket {
     Handler _handler;
 };
 
-// Serves in a thread of its own until the object goes.
+// Serves in its own thread for the lifetime of the object.
 class ServingThread {
  public:
     explicit ServingThread(TERN::HA::Daemon::DaemonLocalSocket& server, std::string path = LOCAL_SOCKET);
@@ -47,19 +47,19 @@ class ServingThread {
     std::thread _thread;
 };
 
-// The bare client's end.
+// A client without the library.
 class RawClient {
  public:
     // `flags` are added to the type of the socket. Throws std::system_error when it cannot connect.
     explicit RawClient(const std::string& path = LOCAL_SOCKET, int flags = 0);
 
-    // Sends; false when the server has closed its end.
+    // Send; false when the server has closed its end.
     bool send(const std::string& bytes) const;
 
-    // What comes until the server closes the connection.
+    // Return everything received until the server closes the connection.
     std::string receiveAll() const;
 
-    // Ends its sending; the server reads an end of file.
+    // Shut down sending: the server reads end of file.
     void finish() const;
 
     void close();
@@ -68,25 +68,25 @@ class RawClient {
     Descriptor _fd;
 };
 
-// Sends one request and returns the whole answer.
+// Send one request and return the whole reply.
 std::string exchange(const std::string& request);
 
-// Listens without ever answering.
+// Listens and never replies.
 class SilentServer {
  public:
     explicit SilentServer(const std::string& path = LOCAL_SOCKET);
 
-    // What the next client has sent, up to now or, when it has left, in all.
+    // Accept the next client and return what it has sent so far.
     std::string received() const;
 
-    // Waits for a client's request and closes the connection without having read it.
+    // Wait for a client's request and close the connection without reading it.
     void dropRequest() const;
 
  private:
     Descriptor _fd;
 };
 
-// While the object lives, SIGALRM comes every few milliseconds and interrupts what waits.
+// Interrupts blocking calls with SIGALRM every 20 ms for the lifetime of the object.
 class Interruptions {
  public:
     Interruptions();
@@ -96,7 +96,7 @@ class Interruptions {
     Interruptions& operator=(const Interruptions&) = delete;
 };
 
-// While the object lives, no new descriptor is to be had.
+// Makes opening of descriptors fail with EMFILE for the lifetime of the object.
 class NoDescriptors {
  public:
     NoDescriptors();

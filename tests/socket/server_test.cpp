@@ -40,7 +40,7 @@ bool echo(const Json::Value& request, Json::Value& reply) {
 
 class ServerSocketTest : public test::SocketTest {};
 
-TEST_F(ServerSocketTest, AnswersARequestWithOneCompactTextAndCloses) {
+TEST_F(ServerSocketTest, SendsACompactReplyAndCloses) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     const test::RawClient client;
@@ -52,7 +52,7 @@ TEST_F(ServerSocketTest, AnswersARequestWithOneCompactTextAndCloses) {
     EXPECT_THAT(systemLog(), IsEmpty());
 }
 
-TEST_F(ServerSocketTest, ARequestOf2095BytesIsWhole) {
+TEST_F(ServerSocketTest, RequestOf2095BytesIsReceivedWhole) {
     HandlerSocket server([](const Json::Value& request, Json::Value& reply) {
         reply = Json::Value::UInt64{request["x"].asString().size()};
         return true;
@@ -64,7 +64,7 @@ TEST_F(ServerSocketTest, ARequestOf2095BytesIsWhole) {
     EXPECT_EQ(client.receiveAll(), "2087");
 }
 
-TEST_F(ServerSocketTest, ALongerRequestIsCutAndFailsToParse) {
+TEST_F(ServerSocketTest, LongerRequestIsTruncatedAndFailsToParse) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     const std::string request = R"({"x":")" + std::string(2096 - 8, 'y') + R"("})";
@@ -77,7 +77,7 @@ TEST_F(ServerSocketTest, ALongerRequestIsCutAndFailsToParse) {
                                   HasSubstr(" Failed to parse " + request.substr(0, 2095) + ", "))));
 }
 
-TEST_F(ServerSocketTest, ARequestInTwoWritesMayBeReadHalf) {
+TEST_F(ServerSocketTest, RequestIsReadWithASingleCall) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     const test::RawClient client;
@@ -88,7 +88,7 @@ TEST_F(ServerSocketTest, ARequestInTwoWritesMayBeReadHalf) {
     EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to parse {\"act\":, ")));
 }
 
-TEST_F(ServerSocketTest, ARefusedRequestGetsNoReply) {
+TEST_F(ServerSocketTest, RefusedRequestGetsNoReply) {
     HandlerSocket server([](const Json::Value&, Json::Value& reply) {
         reply = "not to be sent";
         return false;
@@ -103,7 +103,7 @@ TEST_F(ServerSocketTest, ARefusedRequestGetsNoReply) {
     EXPECT_FALSE(server.hasError());
 }
 
-TEST_F(ServerSocketTest, AHandlerWithoutMemoryRefusesTheRequest) {
+TEST_F(ServerSocketTest, OutOfMemoryInTheHandlerRefusesTheRequest) {
     bool isJsons = false;
     HandlerSocket server([&isJsons](const Json::Value&, Json::Value&) -> bool {
         if (isJsons) {
@@ -124,7 +124,7 @@ TEST_F(ServerSocketTest, AHandlerWithoutMemoryRefusesTheRequest) {
     EXPECT_FALSE(server.hasError());
 }
 
-TEST_F(ServerSocketTest, AnErrorOfTheHandlerIsNotSilenced) {
+TEST_F(ServerSocketTest, OtherExceptionsOfTheHandlerPropagate) {
     HandlerSocket server([](const Json::Value&, Json::Value&) -> bool { throw std::logic_error("handler"); });
     ASSERT_TRUE(server.serverBind());
     const test::RawClient client;
@@ -133,7 +133,7 @@ TEST_F(ServerSocketTest, AnErrorOfTheHandlerIsNotSilenced) {
     EXPECT_EQ(client.receiveAll(), "");
 }
 
-TEST_F(ServerSocketTest, TheReplyBeginsAsNull) {
+TEST_F(ServerSocketTest, ReplyIsInitiallyNull) {
     HandlerSocket server([](const Json::Value&, Json::Value& reply) { return reply.isNull(); });
     ASSERT_TRUE(server.serverBind());
     const test::RawClient client;
@@ -142,7 +142,7 @@ TEST_F(ServerSocketTest, TheReplyBeginsAsNull) {
     EXPECT_EQ(client.receiveAll(), "null");
 }
 
-// ---- What clients may do to a server ----
+// ---- Hostile and broken clients ----
 
 struct HostileRequest {
     const char* name;
@@ -193,7 +193,7 @@ TEST_F(ServerSocketTest, DeepNestingWithinTheLimitIsServed) {
     EXPECT_EQ(client.receiveAll(), "{\"got\":" + nested + "}");
 }
 
-TEST_F(ServerSocketTest, ValuesThatAreNoObjectsAreTheHandlersBusiness) {
+TEST_F(ServerSocketTest, NonObjectsArePassedToTheHandler) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     for (const std::string request : {"[1,2]", "7", "\"I\"", "null", "true"}) {
@@ -204,7 +204,7 @@ TEST_F(ServerSocketTest, ValuesThatAreNoObjectsAreTheHandlersBusiness) {
     }
 }
 
-TEST_F(ServerSocketTest, TheTextEndsAtAZeroByte) {
+TEST_F(ServerSocketTest, RequestEndsAtFirstZeroByte) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     const test::RawClient client;
@@ -213,7 +213,7 @@ TEST_F(ServerSocketTest, TheTextEndsAtAZeroByte) {
     EXPECT_EQ(client.receiveAll(), R"({"got":{}})");
 }
 
-TEST_F(ServerSocketTest, AnEarlierRequestLeavesNothingBehind) {
+TEST_F(ServerSocketTest, ShortRequestOverwritesALongerOne) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     for (const std::string request : {"[\"a long request comes first\"]", "[]"}) {
@@ -224,7 +224,7 @@ TEST_F(ServerSocketTest, AnEarlierRequestLeavesNothingBehind) {
     }
 }
 
-TEST_F(ServerSocketTest, AnEmptyConnectionFailsToParse) {
+TEST_F(ServerSocketTest, EmptyConnectionFailsToParse) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     test::RawClient{};
@@ -233,7 +233,7 @@ TEST_F(ServerSocketTest, AnEmptyConnectionFailsToParse) {
     EXPECT_FALSE(server.hasError());
 }
 
-TEST_F(ServerSocketTest, ASilentClientHoldsUpTheNextUntilItLeaves) {
+TEST_F(ServerSocketTest, SilentClientBlocksTheNextUntilItCloses) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     const test::ServingThread serving(server);
@@ -249,7 +249,7 @@ TEST_F(ServerSocketTest, ASilentClientHoldsUpTheNextUntilItLeaves) {
     next.join();
 }
 
-// ---- A client that has left before its reply ----
+// ---- A client that disconnects before its reply ----
 
 std::atomic<int> signals{0};
 
@@ -263,7 +263,7 @@ bool isPending(int signal) {
     return sigismember(&pending, signal) == 1;
 }
 
-class LeavingClientTest : public ServerSocketTest {
+class DisconnectedClientTest : public ServerSocketTest {
  protected:
     void SetUp() override {
         ServerSocketTest::SetUp();
@@ -294,7 +294,7 @@ class LeavingClientTest : public ServerSocketTest {
     std::optional<test::RawClient> _client;
 };
 
-TEST_F(LeavingClientTest, CostsTwoLinesAndDoesNotEndTheProcess) {
+TEST_F(DisconnectedClientTest, LogsTwoLinesAndRaisesNoSigpipe) {
     EXPECT_FALSE(serve());
     EXPECT_THAT(systemLog(),
                 ElementsAre(test::LogLine("socket.cpp", "Failed to send output data: Broken pipe"),
@@ -302,7 +302,7 @@ TEST_F(LeavingClientTest, CostsTwoLinesAndDoesNotEndTheProcess) {
     EXPECT_FALSE(isPending(SIGPIPE));
 }
 
-TEST_F(LeavingClientTest, DoesNotReachTheHostsOwnHandlerNorChangeIt) {
+TEST_F(DisconnectedClientTest, LeavesTheHostsSigpipeHandlerAlone) {
     struct sigaction action = {};
     action.sa_handler = countSignal;
     sigaction(SIGPIPE, &action, nullptr);
@@ -314,7 +314,7 @@ TEST_F(LeavingClientTest, DoesNotReachTheHostsOwnHandlerNorChangeIt) {
     EXPECT_EQ(signals, 1);
 }
 
-TEST_F(LeavingClientTest, LeavesASignalThatWasPendingBefore) {
+TEST_F(DisconnectedClientTest, KeepsAnEarlierPendingSigpipe) {
     struct sigaction action = {};
     action.sa_handler = countSignal;
     sigaction(SIGPIPE, &action, nullptr);
@@ -330,7 +330,7 @@ TEST_F(LeavingClientTest, LeavesASignalThatWasPendingBefore) {
     EXPECT_EQ(signals, 1);
 }
 
-TEST_F(LeavingClientTest, LeavesTheSignalBlockedAndNothingPendingWhereTheHostBlocksIt) {
+TEST_F(DisconnectedClientTest, KeepsSigpipeBlockedAndLeavesNonePending) {
     sigset_t mask;
     sigemptyset(&mask);
     sigaddset(&mask, SIGPIPE);
@@ -341,7 +341,7 @@ TEST_F(LeavingClientTest, LeavesTheSignalBlockedAndNothingPendingWhereTheHostBlo
     EXPECT_EQ(sigismember(&mask, SIGPIPE), 1);
 }
 
-TEST_F(LeavingClientTest, DoesNotHoldUpAHostThatIgnoresTheSignal) {
+TEST_F(DisconnectedClientTest, DoesNotBlockAHostThatIgnoresSigpipe) {
     std::signal(SIGPIPE, SIG_IGN);
     EXPECT_FALSE(serve());
     EXPECT_EQ(std::signal(SIGPIPE, SIG_DFL), SIG_IGN);
@@ -349,7 +349,7 @@ TEST_F(LeavingClientTest, DoesNotHoldUpAHostThatIgnoresTheSignal) {
 
 // ---- Binding ----
 
-TEST_F(ServerSocketTest, ReplacesASocketFileThatWasLeft) {
+TEST_F(ServerSocketTest, ReplacesAStaleSocketFile) {
     {
         HandlerSocket earlier(echo);
         ASSERT_TRUE(earlier.serverBind());
@@ -361,7 +361,7 @@ TEST_F(ServerSocketTest, ReplacesASocketFileThatWasLeft) {
     EXPECT_EQ(test::exchange("{}"), R"({"got":{}})");
 }
 
-TEST_F(ServerSocketTest, ALongPathIsCutTo107Characters) {
+TEST_F(ServerSocketTest, LongPathIsTruncatedTo107Characters) {
     const std::string path = "/tmp/" + std::string(115, 'x');
     const std::string cut = path.substr(0, 107);
     for (int run = 0; run < 2; ++run) {  // the second finds the file of the first
@@ -379,7 +379,7 @@ TEST_F(ServerSocketTest, ALongPathIsCutTo107Characters) {
                 Each(HasSubstr(" Failed to parse , ")));  // the last, empty connections
 }
 
-TEST_F(ServerSocketTest, AHundredConnectionsWaitAndMoreAreHeldOff) {
+TEST_F(ServerSocketTest, BacklogIsOneHundred) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     std::vector<std::unique_ptr<test::RawClient>> waiting;
@@ -393,7 +393,7 @@ TEST_F(ServerSocketTest, AHundredConnectionsWaitAndMoreAreHeldOff) {
     EXPECT_EQ(waiting.size(), 101U);  // the kernel takes one more than it is told
 }
 
-TEST_F(ServerSocketTest, APathThatCannotBeBoundIsAnErrorForGood) {
+TEST_F(ServerSocketTest, BindFailureIsAPermanentError) {
     HandlerSocket server(echo, "/tmp/nowhere/control.sock");
     EXPECT_FALSE(server.serverBind());
     EXPECT_TRUE(server.hasError());
@@ -405,7 +405,7 @@ TEST_F(ServerSocketTest, APathThatCannotBeBoundIsAnErrorForGood) {
                             test::LogLine("socket.cpp", "Failed to send content: has error")));
 }
 
-TEST_F(ServerSocketTest, AFailureToListenIsAnErrorForGood) {
+TEST_F(ServerSocketTest, ListenFailureIsAPermanentError) {
     HandlerSocket server(echo);
     {
         const test::FailingCall failing("listen", EADDRINUSE);
@@ -418,7 +418,7 @@ TEST_F(ServerSocketTest, AFailureToListenIsAnErrorForGood) {
                             test::LogLine("socket.cpp", "Failed to send content: has error")));
 }
 
-TEST_F(ServerSocketTest, WithoutADescriptorThereIsNoSocket) {
+TEST_F(ServerSocketTest, SocketFailureIsAPermanentError) {
     std::optional<HandlerSocket> server;
     {
         const test::FailingCall failing("socket", EMFILE);
@@ -438,7 +438,7 @@ TEST_F(ServerSocketTest, WithoutADescriptorThereIsNoSocket) {
 
 // ---- Interruptions ----
 
-TEST_F(ServerSocketTest, ASignalEndsTheWaitForAConnectionWithoutHarm) {
+TEST_F(ServerSocketTest, SignalInterruptsAccept) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     {
@@ -452,7 +452,7 @@ TEST_F(ServerSocketTest, ASignalEndsTheWaitForAConnectionWithoutHarm) {
     EXPECT_EQ(test::exchange("{}"), R"({"got":{}})");
 }
 
-TEST_F(ServerSocketTest, ASignalEndsTheWaitForARequestWithoutHarm) {
+TEST_F(ServerSocketTest, SignalInterruptsRecv) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     const test::RawClient silent;
@@ -465,7 +465,7 @@ TEST_F(ServerSocketTest, ASignalEndsTheWaitForARequestWithoutHarm) {
     EXPECT_FALSE(server.hasError());
 }
 
-TEST_F(ServerSocketTest, WithoutADescriptorForAConnectionTheNextCallMaySucceed) {
+TEST_F(ServerSocketTest, AcceptFailureIsTemporary) {
     HandlerSocket server(echo);
     ASSERT_TRUE(server.serverBind());
     const test::RawClient client;
@@ -480,7 +480,7 @@ TEST_F(ServerSocketTest, WithoutADescriptorForAConnectionTheNextCallMaySucceed) 
     EXPECT_EQ(client.receiveAll(), R"({"got":{}})");
 }
 
-TEST_F(ServerSocketTest, NoSocketIsInheritedByPrograms) {
+TEST_F(ServerSocketTest, SocketsAreCloseOnExec) {
     int sockets = 0;
     int inherited = 0;
     HandlerSocket server([&](const Json::Value&, Json::Value&) {

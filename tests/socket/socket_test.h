@@ -13,7 +13,7 @@
 
 namespace test {
 
-// A test that reads what local sockets write to the system log: all of it errors.
+// A test that collects the system log of local sockets, which holds only errors.
 class SocketTest : public SandboxTest {
  protected:
     void SetUp() override {

@@ -21,7 +21,7 @@ Json::Value disks(const char* name) {
     return array;
 }
 
-// Another thread that holds a mutex until the object goes.
+// Holds a mutex in another thread for the lifetime of the object.
 class Holder {
  public:
     explicit Holder(std::timed_mutex& mutex) {
@@ -51,8 +51,8 @@ class StatusLockTest : public test::SandboxTest {
         status.setErrHandlingDiskRemote(disks("sdb"));
     }
 
-    // The operation waits five seconds for `mutex`, goes ahead, and leaves the mutex to its holder.
-    void expectToGoAhead(std::timed_mutex& mutex, const std::function<void()>& operation) {
+    // The operation waits five seconds for `mutex`, proceeds, and leaves the mutex to its holder.
+    void expectToProceed(std::timed_mutex& mutex, const std::function<void()>& operation) {
         {
             const Holder holder(mutex);
             const test::Stopwatch stopwatch;
@@ -68,71 +68,71 @@ class StatusLockTest : public test::SandboxTest {
     Status status;
 };
 
-TEST_F(StatusLockTest, DisksAreReadWithoutTheLock) {
-    expectToGoAhead(status.errHandlingDiskMutex,
+TEST_F(StatusLockTest, GetDisksProceedsWithoutTheLock) {
+    expectToProceed(status.errHandlingDiskMutex,
                     [&] { EXPECT_EQ(status.getErrHandlingDisk(), disks("sda")); });
 }
 
-TEST_F(StatusLockTest, DisksAreReplacedWithoutTheLock) {
-    expectToGoAhead(status.errHandlingDiskMutex,
+TEST_F(StatusLockTest, SetDisksProceedsWithoutTheLock) {
+    expectToProceed(status.errHandlingDiskMutex,
                     [&] { EXPECT_TRUE(status.setErrHandlingDisk(disks("sdx"))); });
     EXPECT_EQ(status.getErrHandlingDisk(), disks("sdx"));
 }
 
-TEST_F(StatusLockTest, AWaitIsAsLongWhenTheWallClockIsSetForward) {
-    test::stepClockAfterNextLook(1h);
-    expectToGoAhead(status.errHandlingDiskMutex,
+TEST_F(StatusLockTest, WaitIsUnaffectedByAForwardClockStep) {
+    test::stepClockAfterNextRead(1h);
+    expectToProceed(status.errHandlingDiskMutex,
                     [&] { EXPECT_EQ(status.getErrHandlingDisk(), disks("sda")); });
 }
 
 // The thread sanitizer's mutexes wait on the wall clock, see cmake/thread_sanitizer.h.
 #ifdef _GLIBCXX_USE_PTHREAD_MUTEX_CLOCKLOCK
-TEST_F(StatusLockTest, AWaitIsAsLongWhenTheWallClockIsSetBack) {
-    test::stepClockAfterNextLook(-1h);
-    expectToGoAhead(status.errHandlingDiskMutex,
+TEST_F(StatusLockTest, WaitIsUnaffectedByABackwardClockStep) {
+    test::stepClockAfterNextRead(-1h);
+    expectToProceed(status.errHandlingDiskMutex,
                     [&] { EXPECT_EQ(status.getErrHandlingDisk(), disks("sda")); });
 }
 #endif
 
-TEST_F(StatusLockTest, TheWaitIsFiveSeconds) {
+TEST_F(StatusLockTest, WaitIsFiveSeconds) {
     EXPECT_EQ(status.lockTimeout, 5);
 }
 
-TEST_F(StatusLockTest, ThePeersDisksAreReadWithoutTheLock) {
-    expectToGoAhead(status.errHandlingDiskRemoteMutex,
+TEST_F(StatusLockTest, GetPeerDisksProceedsWithoutTheLock) {
+    expectToProceed(status.errHandlingDiskRemoteMutex,
                     [&] { EXPECT_EQ(status.getErrHandlingDiskRemote(), disks("sdb")); });
 }
 
-TEST_F(StatusLockTest, ThePeersDisksAreReplacedWithoutTheLock) {
-    expectToGoAhead(status.errHandlingDiskRemoteMutex,
+TEST_F(StatusLockTest, SetPeerDisksProceedsWithoutTheLock) {
+    expectToProceed(status.errHandlingDiskRemoteMutex,
                     [&] { EXPECT_TRUE(status.setErrHandlingDiskRemote(disks("sdx"))); });
     EXPECT_EQ(status.getErrHandlingDiskRemote(), disks("sdx"));
 }
 
-TEST_F(StatusLockTest, BitsAreSetWithoutTheLock) {
-    expectToGoAhead(status.remoteNodeStateMutex,
+TEST_F(StatusLockTest, AddStateProceedsWithoutTheLock) {
+    expectToProceed(status.remoteNodeStateMutex,
                     [&] { EXPECT_TRUE(status.addRemoteNodeState(NodeRebooting)); });
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 
-TEST_F(StatusLockTest, BitsAreClearedWithoutTheLock) {
+TEST_F(StatusLockTest, DelStateProceedsWithoutTheLock) {
     status.addRemoteNodeState(NodeAlive | NodeRebooting);
-    expectToGoAhead(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.delRemoteNodeState(NodeAlive)); });
+    expectToProceed(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.delRemoteNodeState(NodeAlive)); });
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 
-TEST_F(StatusLockTest, LifeIsRecordedWithoutTheLock) {
-    expectToGoAhead(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.setRemoteAlive(true)); });
+TEST_F(StatusLockTest, SetAliveProceedsWithoutTheLock) {
+    expectToProceed(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.setRemoteAlive(true)); });
     EXPECT_TRUE(status.isRemoteAlive());
 }
 
-TEST_F(StatusLockTest, DeathIsRecordedWithoutTheLock) {
+TEST_F(StatusLockTest, SetDeadProceedsWithoutTheLock) {
     status.setRemoteAlive(true);
-    expectToGoAhead(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.setRemoteAlive(false)); });
+    expectToProceed(status.remoteNodeStateMutex, [&] { EXPECT_TRUE(status.setRemoteAlive(false)); });
     EXPECT_FALSE(status.isRemoteAlive());
 }
 
-TEST_F(StatusLockTest, TheEndOfARebootIsRecordedAfterAWaitForEachBit) {
+TEST_F(StatusLockTest, ClearingRebootingWaitsForEachBit) {
     status.addRemoteNodeState(NodeRebooting);
     const Holder holder(status.remoteNodeStateMutex);
     const test::Stopwatch stopwatch;
@@ -142,11 +142,11 @@ TEST_F(StatusLockTest, TheEndOfARebootIsRecordedAfterAWaitForEachBit) {
     EXPECT_EQ(status.getRemoteNodeState(), NodeAlive);
 }
 
-TEST_F(StatusLockTest, TheJsonFormComesAfterTheWait) {
-    expectToGoAhead(status.errHandlingDiskMutex, [&] { EXPECT_EQ(status.toJson().size(), 10U); });
+TEST_F(StatusLockTest, ToJsonProceedsWithoutTheLock) {
+    expectToProceed(status.errHandlingDiskMutex, [&] { EXPECT_EQ(status.toJson().size(), 10U); });
 }
 
-TEST_F(StatusLockTest, TheJsonFormWaitsForOneListAfterTheOther) {
+TEST_F(StatusLockTest, ToJsonWaitsForEachDiskList) {
     const Holder own(status.errHandlingDiskMutex);
     const Holder remote(status.errHandlingDiskRemoteMutex);
     const test::Stopwatch stopwatch;
@@ -157,7 +157,7 @@ TEST_F(StatusLockTest, TheJsonFormWaitsForOneListAfterTheOther) {
     EXPECT_EQ(json["diskErrorHandlingDiskRemote"], disks("sdb"));
 }
 
-TEST_F(StatusLockTest, ReadingTheLifeCycleDoesNotLock) {
+TEST_F(StatusLockTest, ReadingTheStateDoesNotLock) {
     const Holder holder(status.remoteNodeStateMutex);
     const test::Stopwatch stopwatch;
     EXPECT_FALSE(status.isRemoteAlive());
@@ -166,7 +166,7 @@ TEST_F(StatusLockTest, ReadingTheLifeCycleDoesNotLock) {
     EXPECT_LT(stopwatch.elapsed(), 4s);
 }
 
-TEST_F(StatusLockTest, OneMutexDoesNotHoldUpTheOthers) {
+TEST_F(StatusLockTest, MutexesAreIndependent) {
     const Holder holder(status.errHandlingDiskMutex);
     const test::Stopwatch stopwatch;
     status.setErrHandlingDiskRemote(disks("sdc"));

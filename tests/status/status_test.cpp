@@ -28,7 +28,7 @@ class StatusTest : public test::SandboxTest {
     Status status;
 };
 
-TEST_F(StatusTest, ANewRecordHasOnlyTheDrbdLinkUp) {
+TEST_F(StatusTest, InitiallyOnlyDrbdIsConnected) {
     EXPECT_TRUE(status.isDRBDConnect);
     EXPECT_FALSE(status.isRemoteMDResync);
     EXPECT_FALSE(status.isRemoteDiskErrHandling);
@@ -45,7 +45,7 @@ TEST_F(StatusTest, ANewRecordHasOnlyTheDrbdLinkUp) {
         "diskErrorHandlingDiskRemote":[]})"));
 }
 
-TEST_F(StatusTest, TheJsonFormHasEveryField) {
+TEST_F(StatusTest, JsonHasEveryField) {
     status.setRemoteAlive(true);
     status.isRemoteMDResync = true;
     status.isRemoteDiskErrHandling = true;
@@ -83,9 +83,9 @@ TEST_F(StatusTest, EachFlagHasItsOwnKey) {
     }
 }
 
-// ---- The peer's life cycle ----
+// ---- State of the peer ----
 
-TEST_F(StatusTest, OnlyAChangeOfLifeIsLogged) {
+TEST_F(StatusTest, OnlyTransitionsAreLogged) {
     EXPECT_TRUE(status.setRemoteAlive(false));
     EXPECT_THAT(test::daemonLogMessages(), IsEmpty());
     EXPECT_TRUE(status.setRemoteAlive(true));
@@ -97,8 +97,8 @@ TEST_F(StatusTest, OnlyAChangeOfLifeIsLogged) {
                             LogLine("status.cpp", "Remote server status changed to dead")));
 }
 
-TEST_F(StatusTest, AChangeOfLifeIsLoggedBeforeItIsRecorded) {
-    ASSERT_EQ(mkfifo(test::BUFFER, 0600), 0);  // the writer of a FIFO waits for its reader
+TEST_F(StatusTest, TransitionIsLoggedBeforeItIsStored) {
+    ASSERT_EQ(mkfifo(test::BUFFER, 0600), 0);  // opening a FIFO blocks until it has a reader
     std::atomic<pid_t> thread{0};
     std::thread change([&] {
         thread = gettid();
@@ -112,7 +112,7 @@ TEST_F(StatusTest, AChangeOfLifeIsLoggedBeforeItIsRecorded) {
     EXPECT_TRUE(status.isRemoteAlive());
 }
 
-TEST_F(StatusTest, LifeSetsAndClearsItsBitAlone) {
+TEST_F(StatusTest, SetRemoteAliveChangesOnlyTheAliveBit) {
     status.setRemoteAlive(true);
     EXPECT_TRUE(status.isRemoteAlive());
     EXPECT_EQ(status.getRemoteNodeState(), NodeAlive);
@@ -121,7 +121,7 @@ TEST_F(StatusTest, LifeSetsAndClearsItsBitAlone) {
     EXPECT_EQ(status.getRemoteNodeState(), 0U);
 }
 
-TEST_F(StatusTest, APendingRebootCountsAsRebootingAndOutlivesASignOfLife) {
+TEST_F(StatusTest, PendingRebootSurvivesAnAlivePeer) {
     status.addRemoteNodeState(NodeRebootPending);
     EXPECT_TRUE(status.isRemoteRebooting());
     status.setRemoteAlive(true);
@@ -129,13 +129,13 @@ TEST_F(StatusTest, APendingRebootCountsAsRebootingAndOutlivesASignOfLife) {
     EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebootPending);
 }
 
-TEST_F(StatusTest, ASignOfLifeEndsARebootButNotAPendingOne) {
+TEST_F(StatusTest, AlivePeerClearsRebootingButNotPending) {
     status.addRemoteNodeState(NodeRebooting | NodeRebootPending);
     status.setRemoteAlive(true);
     EXPECT_EQ(status.getRemoteNodeState(), NodeAlive | NodeRebootPending);
 }
 
-TEST_F(StatusTest, ARebootEndsAlsoWhenThePeerWasNeverSeenDead) {
+TEST_F(StatusTest, RebootingIsClearedEvenIfThePeerWasNeverDead) {
     status.setRemoteAlive(true);
     status.addRemoteNodeState(NodeRebooting);
     EXPECT_TRUE(status.isRemoteRebooting());
@@ -143,7 +143,7 @@ TEST_F(StatusTest, ARebootEndsAlsoWhenThePeerWasNeverSeenDead) {
     EXPECT_FALSE(status.isRemoteRebooting());
 }
 
-TEST_F(StatusTest, DeathLeavesTheRebootBits) {
+TEST_F(StatusTest, DeadPeerKeepsTheRebootBits) {
     status.addRemoteNodeState(NodeAlive | NodeRebootPending | NodeRebooting);
     status.setRemoteAlive(false);
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebootPending | NodeRebooting);
@@ -162,7 +162,7 @@ TEST_F(StatusTest, SeveralBitsAreSetAndClearedAtOnce) {
 
 // ---- Disks ----
 
-TEST_F(StatusTest, DisksAreSortedAndListedOnce) {
+TEST_F(StatusTest, DisksAreSortedAndDeduplicated) {
     EXPECT_TRUE(status.setErrHandlingDisk(parsed(R"(["sdb","sda","sdb"])")));
     EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["sda","sdb"])"));
     EXPECT_TRUE(status.setErrHandlingDiskRemote(parsed(R"(["sdaa","sdb","sdB"])")));
@@ -170,13 +170,13 @@ TEST_F(StatusTest, DisksAreSortedAndListedOnce) {
     EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["sda","sdb"])"));
 }
 
-TEST_F(StatusTest, NewDisksReplaceTheOldOnes) {
+TEST_F(StatusTest, NewDisksReplacePreviousOnes) {
     status.setErrHandlingDisk(parsed(R"(["sda","sdb"])"));
     status.setErrHandlingDisk(parsed(R"(["sdc"])"));
     EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["sdc"])"));
 }
 
-TEST_F(StatusTest, NoDisksAreAnEmptyArray) {
+TEST_F(StatusTest, ValueWithoutElementsIsAnEmptyArray) {
     for (const char* nothing : {"null", "[]", "{}", "\"sda\"", "7", "true"}) {
         status.setErrHandlingDisk(parsed(R"(["sda"])"));
         status.setErrHandlingDiskRemote(parsed(R"(["sda"])"));
@@ -187,24 +187,24 @@ TEST_F(StatusTest, NoDisksAreAnEmptyArray) {
     }
 }
 
-TEST_F(StatusTest, ElementsThatCannotBeReadAsStringsArePassedOver) {
+TEST_F(StatusTest, ElementsNotConvertibleToStringsAreSkipped) {
     EXPECT_TRUE(status.setErrHandlingDisk(parsed(R"(["sda",["sdb"],{"x":"sdc"},7,"sdd"])")));
     EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["7","sda","sdd"])"));
 }
 
-TEST_F(StatusTest, NumbersFlagsAndNullAreReadAsStrings) {
+TEST_F(StatusTest, NumbersBooleansAndNullAreConvertedToStrings) {
     status.setErrHandlingDisk(parsed(R"([7,true,null,-1])"));
     EXPECT_EQ(status.getErrHandlingDisk(), parsed(R"(["","-1","7","true"])"));
 }
 
-TEST_F(StatusTest, OfAnObjectTheValuesCount) {
+TEST_F(StatusTest, ObjectYieldsItsValues) {
     status.setErrHandlingDiskRemote(parsed(R"({"a":"sdb","b":"sda","c":"sdb"})"));
     EXPECT_EQ(status.getErrHandlingDiskRemote(), parsed(R"(["sda","sdb"])"));
 }
 
 // ---- Threads ----
 
-TEST_F(StatusTest, NoBitIsLostAndNoSetIsSeenHalfReplaced) {
+TEST_F(StatusTest, ConcurrentUpdatesAreAtomic) {
     const Json::Value few = parsed(R"(["sda"])");
     const Json::Value many = parsed(R"(["sdb","sdc","sdd","sde"])");
     status.setErrHandlingDisk(few);

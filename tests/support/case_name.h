@@ -6,7 +6,7 @@
 
 namespace test {
 
-// Names the cases of a parameterized test by the member `name` of their parameters.
+// Names parameterized tests by the member `name` of their parameters.
 struct CaseName {
     template <typename Parameter>
     std::string operator()(const ::testing::TestParamInfo<Parameter>& info) const {

@@ -9,7 +9,7 @@
 
 namespace test {
 
-/// Throws std::system_error with an error number, by default the current one, unless `done`.
+/// Throw std::system_error with an error number, by default errno, unless `done`.
 inline void check(bool done, const std::string& what, int error = errno) {
     if (!done) {
         throw std::system_error(error, std::generic_category(), what);
@@ -21,7 +21,7 @@ class Descriptor {
  public:
     Descriptor() = default;
 
-    /// Takes over the result of a system call; throws std::system_error with the current errno when it is -1.
+    /// Take over the result of a system call; throw std::system_error with errno when it is -1.
     Descriptor(int descriptor, const std::string& what) : _descriptor(descriptor) {
         check(descriptor != -1, what);
     }

@@ -6,25 +6,25 @@
 /// Files of the sandbox. Paths are absolute; failures throw std::system_error.
 namespace test {
 
-/// Replaces the content of `path`; missing parent directories are made.
+/// Replace the content of `path`; create missing parent directories.
 void writeFile(const std::string& path, const std::string& text);
 
-/// Adds to the end of `path`; the file and its parent directories are made when missing.
+/// Append to `path`; create the file and its parent directories if missing.
 void appendFile(const std::string& path, const std::string& text);
 
-/// The whole content, byte for byte.
+/// Return the whole content.
 std::string readFile(const std::string& path);
 
-/// Whether there is a file of any kind; a dangling link counts.
+/// Return whether a file of any kind exists; a dangling link counts.
 bool exists(const std::string& path);
 
-/// Makes the directory and its missing parents.
+/// Create the directory and its missing parents.
 void makeDirectories(const std::string& path);
 
-/// Removes a file, or a directory with all in it. Nothing happens when there is none.
+/// Remove a file or a directory tree, if it exists.
 void removeTree(const std::string& path);
 
-/// The lines of `text` without their line ends. A last line without an end counts too.
+/// Split `text` into lines without newlines. An unterminated last line counts.
 std::vector<std::string> lines(const std::string& text);
 
 }  // namespace test

@@ -25,7 +25,7 @@ void cover(const std::string& path, const std::string& by) {
     check(mount(by.c_str(), program.c_str(), "", MS_BIND, nullptr) == 0, "cannot cover " + program);
 }
 
-// Reads from the start and leaves the position, which the writer shares, where it is.
+// Read from the start without moving the position, which the writer shares.
 std::string collected(const Descriptor& file) {
     std::string text;
     char block[4096];
@@ -36,16 +36,16 @@ std::string collected(const Descriptor& file) {
     return text;
 }
 
-// Forks; the child runs `body`, which ends it or returns the errno of its failure. With `node`, the child
-// belongs to that node. Throws when there is no child, or when it has failed before it closed the descriptor
-// of its report.
+// Fork; the child, in `node` if given, runs `body`, which does not return or returns the errno of
+// its failure. Throws if fork fails or the child fails before it closes the descriptor of its
+// report.
 pid_t spawn(int node, const std::function<int(int report)>& body) {
     int ends[2] = {-1, -1};
     check(pipe2(ends, O_CLOEXEC) == 0, "cannot make a pipe");
     const Descriptor readEnd(ends[0], "pipe");
     Descriptor writeEnd(ends[1], "pipe");
 
-    // A pid namespace takes in only the children of who enters it; the rest only who has no other thread.
+    // A pid namespace applies only to children; the others require a single-threaded process.
     const Descriptor own(open("/proc/self/ns/pid", O_RDONLY | O_CLOEXEC), "cannot open the pid namespace");
     check(node == -1 || setns(node, CLONE_NEWPID) == 0, "cannot enter the node's processes");
     const pid_t child = fork();
@@ -70,7 +70,7 @@ pid_t spawn(int node, const std::function<int(int report)>& body) {
     return child;
 }
 
-// Runs in a process just forked: no more than system calls.
+// Runs after fork: only system calls are safe.
 int becomeProgram(const std::vector<char*>& argv, int input, int output, int error) {
     sigset_t none;
     sigemptyset(&none);

@@ -10,20 +10,20 @@
 
 #include "support/descriptor.h"
 
-/// Programs of the sandbox: real ones to run, and stubs in their place. Failures throw std::system_error.
+/// Programs and stubs in the sandbox. Failures throw std::system_error.
 namespace test {
 
-/// Covers an existing program by a script until the test ends or restoreProgram(). A script that does not
-/// begin with "#!" is one for /bin/sh. Nodes made afterwards have it too.
+/// Covers an existing program by a script until the test ends or restoreProgram(). A script that
+/// does not begin with "#!" is one for /bin/sh. Nodes made afterwards have it too.
 void replaceProgram(const std::string& path, const std::string& script);
 
-/// Makes an existing program impossible to start (EACCES) until the test ends or restoreProgram().
+/// Make starting an existing program fail with EACCES until the test ends or restoreProgram().
 void hideProgram(const std::string& path);
 
-/// Takes the latest cover off an existing program.
+/// Undo the latest replacement of a program.
 void restoreProgram(const std::string& path);
 
-/// Writes an executable script to a path where there is no program of the machine.
+/// Create an executable script at an unused path.
 void createProgram(const std::string& path, const std::string& script);
 
 struct CommandResult {
@@ -33,15 +33,16 @@ struct CommandResult {
     std::string error;
 };
 
-/// A process that runs beside the test. It is killed and reaped with its object.
+/// A child process; the destructor kills and reaps it.
 class Process {
  public:
-    /// Starts argv[0], looked up in PATH when it has no slash, with standard input from /dev/null. Standard
-    /// output and error are collected. `node` is a process descriptor of a node's first process, or -1.
+    /// Start argv[0], looked up in PATH if it has no slash, with standard input from /dev/null.
+    /// Standard output and error are collected. `node` is a process descriptor of a node's first
+    /// process, or -1.
     explicit Process(const std::vector<std::string>& argv, int node = -1);
 
-    /// Calls a function in a copy of this process inside a node. Its result is the exit code; an exception or
-    /// a failed expectation turns 0 into 1.
+    /// Run a function in a forked process inside a node. Its result is the exit code; an exception
+    /// or a failed expectation turns 0 into 1.
     Process(const std::function<int()>& function, int node);
 
     Process(Process&& other) noexcept { *this = std::move(other); }
@@ -50,16 +51,16 @@ class Process {
 
     pid_t pid() const { return _pid; }
 
-    /// Sends a signal; nothing happens when the process has ended.
+    /// Send a signal, unless the process has ended.
     void signal(int number) const;
 
-    /// The wait status as waitpid() gives it, or nothing when the process still runs after `deadline`.
+    /// Return the wait status, or nothing if the process still runs after `deadline`.
     std::optional<int> waitFor(std::chrono::milliseconds deadline);
 
-    /// Waits for the end without a limit and returns the wait status.
+    /// Wait without a deadline and return the wait status.
     int wait();
 
-    /// What it has written to its standard output (error) up to now.
+    /// Return its standard output (error) so far.
     std::string output() const;
     std::string error() const;
 
@@ -72,10 +73,10 @@ class Process {
     std::optional<int> _status;
 };
 
-/// Runs a program to its end.
+/// Run a program and wait for it.
 CommandResult run(const std::vector<std::string>& argv);
 
-/// Waits for the end of a process and collects what it said.
+/// Wait for a process and collect its output.
 CommandResult resultOf(Process process);
 
 }  // namespace test

@@ -13,7 +13,7 @@ namespace fs = std::filesystem;
 namespace test {
 namespace {
 
-// What each open descriptor leads to. The one that lists them is gone when its link is read.
+// Return the target of each open descriptor, without that of the listing itself.
 std::map<std::string, std::string> openDescriptors() {
     std::vector<fs::path> paths;
     for (const auto& entry : fs::directory_iterator("/proc/self/fd")) {
@@ -34,7 +34,7 @@ std::string contentOrNothing(const std::string& path) {
     return exists(path) ? readFile(path) : std::string();
 }
 
-// The length of the time stamp at the start of a line with the blank after it; 0 when there is none.
+// Return the length of the time stamp and blank at the start of a line; 0 without one.
 std::size_t timeStampLength(const std::string& line) {
     static const std::regex STAMP("^\\d{4}-\\d\\d-\\d\\dT\\d\\d:\\d\\d:\\d\\d[+-]\\d\\d:\\d\\d ");
     const std::string start = line.substr(0, sizeof "2026-11-15T09:23:41+01:00 " - 1);
@@ -52,7 +52,7 @@ void SandboxTest::SetUp() {
 }
 
 void SandboxTest::TearDown() {
-    // The C library keeps its connection to the system log.
+    // The C library keeps its connection to the system log open.
     closelog();
     for (const auto& [descriptor, target] : openDescriptors()) {
         const auto before = _descriptors.find(descriptor);

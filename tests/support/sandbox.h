@@ -9,9 +9,9 @@
 
 namespace test {
 
-/// A test with the directories of the log in place (/tmp/ha and /var/log/ha, mode 0700). After it, every
-/// descriptor that was opened since SetUp() must be closed again: a fixture that opens something in its own
-/// SetUp() closes it before it calls this TearDown().
+/// A test with the log directories /tmp/ha and /var/log/ha (mode 0700). TearDown() fails the test
+/// if a descriptor opened since SetUp() is still open: a fixture must close what it opened before
+/// it calls this TearDown().
 class SandboxTest : public ::testing::Test {
  protected:
     void SetUp() override;
@@ -21,28 +21,28 @@ class SandboxTest : public ::testing::Test {
     std::map<std::string, std::string> _descriptors;
 };
 
-/// Where the daemon log's lines go, and where they are buffered until they are moved there.
+/// The daemon log and its buffer.
 inline constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
 inline constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";
 
-/// The content of the buffer file of the daemon log (the record log), /tmp/ha/ha.daemon.log (.record); empty
-/// when there is none.
+/// Return the buffer of the daemon log (record log), /tmp/ha/ha.daemon.log (.record); empty if
+/// missing.
 std::string bufferText();
 std::string recordText();
 
-/// The lines of a log's text without their time stamps, as in "checker.cpp:88 Failed to get meminfo". A line
-/// that does not begin with a time stamp such as "2026-11-15T09:23:41+01:00 " fails the test.
+/// Return the lines of a log without their time stamps, as in "checker.cpp:88 Failed to get
+/// meminfo". A line without a time stamp such as "2026-11-15T09:23:41+01:00 " fails the test.
 std::vector<std::string> messages(const std::string& logText);
 
-/// The messages in the daemon log's buffer file.
+/// Return the messages in the buffer of the daemon log.
 std::vector<std::string> daemonLogMessages();
 
-/// The entries of the record log's buffer file without their time stamps. An entry reaches to the next line
-/// that begins with a time stamp; the line end that closes the entry is not part of it. Text before the first
-/// time stamp fails the test.
+/// Return the entries of the record log's buffer without their time stamps. An entry extends to the
+/// next line with a time stamp, without its final newline. Text before the first time stamp fails
+/// the test.
 std::vector<std::string> recordEntries();
 
-/// True when `message` begins with the place that logged it, as in "checker.cpp:88 Failed to get meminfo".
+/// Return whether `message` begins with a call site, as in "checker.cpp:88 Failed to get meminfo".
 bool hasCallSite(const std::string& message);
 
 /// Matches exactly FILE + ":" + a decimal number + " " + MESSAGE.

@@ -2,12 +2,11 @@
 
 namespace test {
 
-/// script/sandbox, as each of its sandboxes has it.
+/// Path of script/sandbox inside each sandbox.
 inline constexpr char SANDBOX[] = "/.machine/sandbox";
 
-/// Ends the process with a message and exit code 99 when it does not run in a private root that
-/// `script/sandbox` made. Every program of the tests calls it first, so that none can reach the machine
-/// itself.
+/// Exit with a message and code 99 unless the process runs in a sandbox of `script/sandbox`. Every
+/// test program calls it first, so that none can reach the machine itself.
 void requireSandbox();
 
 }  // namespace test

@@ -55,7 +55,7 @@ SystemLog::~SystemLog() {
     unlink(_path.c_str());
 }
 
-// Received under the lock, so that nothing is between the socket and the entries while somebody looks.
+// Received under the lock: readers then miss no datagram in flight.
 std::vector<SystemLog::Entry> SystemLog::entries() {
     const std::lock_guard lock(_mutex);
     char datagram[16384];

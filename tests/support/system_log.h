@@ -11,8 +11,8 @@
 
 namespace test {
 
-/// Stands in for the system log: receives what syslog(3) sends. Datagrams are taken off the socket at once,
-/// so that no writer is ever held up.
+/// A stub system log that collects what syslog(3) sends. It reads continuously, so that writers
+/// never block.
 class SystemLog {
  public:
     struct Entry {
@@ -21,20 +21,20 @@ class SystemLog {
         std::string text;
     };
 
-    /// `path` is the log socket; Node::path("/dev/log") makes it the log of a node.
+    /// `path` is the log socket; pass Node::path("/dev/log") to collect the log of a node.
     explicit SystemLog(const std::string& path = "/dev/log");
     SystemLog(const SystemLog&) = delete;
     SystemLog& operator=(const SystemLog&) = delete;
     ~SystemLog();
 
-    /// All entries up to now. What a syslog() call sent before this call is among them. An entry that does
-    /// not have the form that syslog(3) gives it has priority -1 and its whole datagram as text.
+    /// Return all entries so far, including those of every completed syslog() call. A malformed
+    /// entry has priority -1 and the whole datagram as text.
     std::vector<Entry> entries();
 
-    /// The texts of entries().
+    /// Return the texts of entries().
     std::vector<std::string> texts();
 
-    /// Waits until there are at least `count` entries; returns whether there are.
+    /// Wait for at least `count` entries; return whether they arrived.
     bool waitFor(std::size_t count, std::chrono::milliseconds deadline = std::chrono::seconds(10));
 
  private:

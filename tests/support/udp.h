@@ -15,17 +15,17 @@ struct Datagram {
     uint16_t port = 0;    ///< sender
 };
 
-/// A UDP peer for tests: sends and receives exact bytes over IPv4. Failures throw std::system_error.
+/// A UDP socket over IPv4. Failures throw std::system_error.
 class UdpSocket {
  public:
-    /// Binds to an address of this network namespace; port 0 takes a free one.
+    /// Bind to an address of this network namespace; port 0 selects a free one.
     explicit UdpSocket(const std::string& address = "127.0.0.1", uint16_t port = 0);
 
     uint16_t port() const;
 
     void send(const std::string& bytes, const std::string& address, uint16_t port);
 
-    /// The next datagram, or nothing when none has come before the deadline.
+    /// Return the next datagram, or nothing if none arrives before the deadline.
     std::optional<Datagram> receive(std::chrono::milliseconds deadline);
 
  private:

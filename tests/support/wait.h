@@ -10,8 +10,8 @@
 
 namespace test {
 
-/// Asks `predicate` every few milliseconds until it holds or `deadline` has passed on the monotonic clock.
-/// Returns whether it held; it is asked at least once.
+/// Poll `predicate`, at least once, until it holds or `deadline` has passed on the monotonic clock.
+/// Return whether it held.
 template <typename Predicate>
 bool eventually(std::chrono::milliseconds deadline, Predicate&& predicate) {
     constexpr std::chrono::milliseconds INTERVAL{3};
@@ -25,13 +25,13 @@ bool eventually(std::chrono::milliseconds deadline, Predicate&& predicate) {
     return true;
 }
 
-/// Whether a thread of this process waits in the kernel.
+/// Return whether a thread of this process is blocked in the kernel.
 inline bool isAsleep(pid_t thread) {
     const std::string stat = readFile("/.kernel/proc/self/task/" + std::to_string(thread) + "/stat");
     return stat.find(") S ") != std::string::npos;
 }
 
-/// Measures on the monotonic clock from its construction on.
+/// Measures the time since its construction on the monotonic clock.
 class Stopwatch {
  public:
     std::chrono::nanoseconds elapsed() const { return std::chrono::steady_clock::now() - _start; }

@@ -11,7 +11,7 @@ using ::testing::ElementsAre;
 
 namespace {
 
-constexpr const char* kConfig = "/usr/tern/etc/packages/FailoverPair/ha.conf";
+constexpr const char* HA_CONFIG = "/usr/tern/etc/packages/FailoverPair/ha.conf";
 
 class HaHostnameTest : public test::SandboxTest {
  protected:
@@ -22,42 +22,42 @@ class HaHostnameTest : public test::SandboxTest {
 };
 
 TEST_F(HaHostnameTest, IsReadFromThePackageConfiguration) {
-    writeFile(kConfig, "ha_ip=10.0.0.9\nha_hostname=pair1\nother=x\n");
+    writeFile(HA_CONFIG, "ha_ip=10.0.0.9\nha_hostname=pair1\nother=x\n");
     EXPECT_EQ(getHAHostname(), "pair1");
     EXPECT_EQ(test::bufferText(), "");
 }
 
 TEST_F(HaHostnameTest, IsReadOnEveryCall) {
-    writeFile(kConfig, "ha_hostname=pair1\n");
+    writeFile(HA_CONFIG, "ha_hostname=pair1\n");
     EXPECT_EQ(getHAHostname(), "pair1");
-    writeFile(kConfig, "ha_hostname=pair2\n");
+    writeFile(HA_CONFIG, "ha_hostname=pair2\n");
     EXPECT_EQ(getHAHostname(), "pair2");
 }
 
-TEST_F(HaHostnameTest, AMissingKeyLeavesOneLineInTheLog) {
-    writeFile(kConfig, "hostname=pair1\nha_hostname2=pair2\n");
+TEST_F(HaHostnameTest, MissingKeyIsLogged) {
+    writeFile(HA_CONFIG, "hostname=pair1\nha_hostname2=pair2\n");
     expectNone();
 }
 
-TEST_F(HaHostnameTest, AMissingFileLeavesOneLineInTheLog) {
+TEST_F(HaHostnameTest, MissingFileIsLogged) {
     expectNone();
 }
 
-TEST_F(HaHostnameTest, ADirectoryInThePlaceOfTheFileLeavesOneLineInTheLog) {
-    test::makeDirectories(kConfig);
+TEST_F(HaHostnameTest, DirectoryInPlaceOfTheFileIsLogged) {
+    test::makeDirectories(HA_CONFIG);
     expectNone();
 }
 
-TEST_F(HaHostnameTest, AnEmptyValueIsNoFailure) {
-    writeFile(kConfig, "ha_hostname=\n");
+TEST_F(HaHostnameTest, EmptyValueIsNoFailure) {
+    writeFile(HA_CONFIG, "ha_hostname=\n");
     EXPECT_EQ(getHAHostname(), "");
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(HaHostnameTest, HasAtMost63Characters) {
-    writeFile(kConfig, "ha_hostname=" + std::string(63, 'p') + "\n");
+TEST_F(HaHostnameTest, IsTruncatedTo63Characters) {
+    writeFile(HA_CONFIG, "ha_hostname=" + std::string(63, 'p') + "\n");
     EXPECT_EQ(getHAHostname(), std::string(63, 'p'));
-    writeFile(kConfig, "ha_hostname=" + std::string(63, 'p') + "air\n");
+    writeFile(HA_CONFIG, "ha_hostname=" + std::string(63, 'p') + "air\n");
     EXPECT_EQ(getHAHostname(), std::string(63, 'p'));
     EXPECT_EQ(test::bufferText(), "");
 }

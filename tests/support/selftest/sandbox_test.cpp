@@ -31,7 +31,7 @@ std::string ownProgram() {
     return std::filesystem::read_symlink("/proc/self/exe");
 }
 
-// The tests of script/sandbox make a sandbox inside their own, which then stands for the machine.
+// Tests of script/sandbox nest a sandbox in their own, which plays the machine.
 class SandboxScriptTest : public SandboxTest {
  protected:
     static Words command(const std::string& script, const Words& options = {}) {
@@ -46,7 +46,7 @@ class SandboxScriptTest : public SandboxTest {
     static std::string processList() { return run({"ps", "-eo", "args"}).output; }
 };
 
-TEST_F(SandboxScriptTest, PassesOutputAndExitCodeOnAsAShellDoes) {
+TEST_F(SandboxScriptTest, PassesOutputAndExitCodeLikeAShell) {
     const CommandResult result = inside("echo out; echo err >&2; exit 7");
     EXPECT_EQ(result.output, "out\n");
     EXPECT_EQ(result.error, "err\n");
@@ -55,13 +55,13 @@ TEST_F(SandboxScriptTest, PassesOutputAndExitCodeOnAsAShellDoes) {
     EXPECT_EQ(inside("kill -SEGV $$").exitCode, 128 + SIGSEGV);
 }
 
-TEST_F(SandboxScriptTest, ReportsAProgramThatCannotBeStarted) {
+TEST_F(SandboxScriptTest, ReportsAStartFailure) {
     const CommandResult result = run({SANDBOX, "--", "/no/such/program"});
     EXPECT_EQ(result.exitCode, 127);
     EXPECT_THAT(result.error, HasSubstr("/no/such/program"));
 }
 
-TEST_F(SandboxScriptTest, ExplainsItselfAndRejectsWrongUse) {
+TEST_F(SandboxScriptTest, PrintsHelpAndRejectsWrongOptions) {
     EXPECT_THAT(run({SANDBOX, "--help"}).output, HasSubstr("script/sandbox [OPTION]... -- PROGRAM"));
     for (const Words& words : {Words{},
                                {"--no-such-option", "--", "true"},
@@ -98,7 +98,7 @@ TEST_F(SandboxScriptTest, HidesTheProcessesOfTheMachine) {
     EXPECT_EQ(inside("hostname").output, "sandbox\n");
 }
 
-TEST_F(SandboxScriptTest, KeepsTheMachinesFilesAsTheyAre) {
+TEST_F(SandboxScriptTest, ProtectsTheFilesOfTheMachine) {
     EXPECT_NE(inside("touch /usr/bin/new").exitCode, 0);
     EXPECT_EQ(inside("mkdir -p /usr/tern/etc && touch /usr/tern/etc/new").exitCode, 0);
     EXPECT_FALSE(exists("/usr/tern"));
@@ -127,7 +127,7 @@ TEST_F(SandboxScriptTest, KeepsTheWorkingDirectory) {
     EXPECT_EQ(run({"sh", "-c", "cd /tmp/tree && " + script + " -- pwd"}).output, "/\n");
 }
 
-TEST_F(SandboxScriptTest, HandsInACleanEnvironmentAndPersonality) {
+TEST_F(SandboxScriptTest, PassesACleanEnvironmentAndPersonality) {
     const CommandResult result =
         run({"env", "-i", "SECRET=1", "GTEST_COLOR=no", "GCOV_PREFIX=/x", "UBSAN_OPTIONS=print_stacktrace=1",
              SANDBOX, "--env", "EXTRA=2", "--env", "HOME=/home", "--", "/usr/bin/env"});
@@ -145,7 +145,7 @@ TEST_F(SandboxScriptTest, ClosesInheritedDescriptors) {
     EXPECT_EQ(result.output, "0\n1\n2\n3\n") << "3 is the directory that is listed";
 }
 
-TEST_F(SandboxScriptTest, NothingSurvivesIt) {
+TEST_F(SandboxScriptTest, KillsAllItsProcesses) {
     for (const int signal : {SIGTERM, SIGINT, SIGKILL}) {
         Process sandbox(command("echo ready; sleep 1234"));
         ASSERT_TRUE(eventually(30s, [&] { return sandbox.output() == "ready\n"; }));
@@ -156,7 +156,7 @@ TEST_F(SandboxScriptTest, NothingSurvivesIt) {
     }
 }
 
-TEST_F(SandboxScriptTest, ReportsAProcessThatDoesNotEndSoon) {
+TEST_F(SandboxScriptTest, ReportsAProcessThatOutlivesTheProgram) {
     CommandResult result = inside("sleep 0.3 & exit 5");
     EXPECT_EQ(result.exitCode, 5);
     EXPECT_EQ(result.error, "");
@@ -168,8 +168,8 @@ TEST_F(SandboxScriptTest, ReportsAProcessThatDoesNotEndSoon) {
     EXPECT_TRUE(eventually(30s, [] { return processList().find("sleep 1234") == std::string::npos; }));
 }
 
-// The limits count in a user namespace of their own, so that nobody else meets them.
-TEST_F(SandboxScriptTest, RefusesWithoutItsMountsAndNamespaces) {
+// A user namespace confines the limits to this test.
+TEST_F(SandboxScriptTest, FailsWithoutMountsAndNamespaces) {
     const CommandResult unbound = inside("echo escaped", {"--bind", "/no/such/directory"});
     EXPECT_NE(unbound.exitCode, 0);
     EXPECT_EQ(unbound.output, "");
@@ -184,7 +184,7 @@ TEST_F(SandboxScriptTest, RefusesWithoutItsMountsAndNamespaces) {
     }
 }
 
-TEST_F(SandboxScriptTest, ATestProgramRefusesWithoutTheMarkerOrWithOtherMountsThanInits) {
+TEST_F(SandboxScriptTest, TestProgramRefusesToRunOutside) {
     EXPECT_EQ(run({ownProgram(), "--gtest_filter=None.*"}).exitCode, 0);
     EXPECT_EQ(run({"unshare", "--mount", ownProgram(), "--gtest_filter=None.*"}).exitCode, OUTSIDE);
     const CommandResult result =
@@ -194,7 +194,7 @@ TEST_F(SandboxScriptTest, ATestProgramRefusesWithoutTheMarkerOrWithOtherMountsTh
     EXPECT_THAT(result.error, StartsWith("refusing to run outside the sandbox"));
 }
 
-TEST_F(SandboxScriptTest, ATestProgramRefusesARootThatIsNoTmpfs) {
+TEST_F(SandboxScriptTest, TestProgramRefusesARootOtherThanTmpfs) {
     makeDirectories("/tmp/root");
     const std::string directory = std::filesystem::path(ownProgram()).parent_path();
     const CommandResult result = run(
@@ -240,7 +240,7 @@ TEST_F(RootTest, HasDevices) {
     EXPECT_EQ(run({"script", "-qc", "tty", "/dev/null"}).output, "/dev/pts/0\r\n");
 }
 
-TEST_F(RootTest, ProcIsWritableAndTheSystemRequestTriggerAPlainFile) {
+TEST_F(RootTest, ProcIsWritableAndSysrqTriggerIsAPlainFile) {
     EXPECT_EQ(readFile("/proc/sysrq-trigger"), "");
     struct stat status = {};
     ASSERT_EQ(lstat("/proc/sysrq-trigger", &status), 0);
@@ -251,7 +251,7 @@ TEST_F(RootTest, ProcIsWritableAndTheSystemRequestTriggerAPlainFile) {
     writeFile("/proc/drbd", "");
 }
 
-TEST_F(RootTest, MemoryFiguresCanBeReplacedAndRemoved) {
+TEST_F(RootTest, MeminfoCanBeReplacedAndRemoved) {
     EXPECT_THAT(readFile("/proc/meminfo"), StartsWith("MemTotal:"));
     writeFile("/proc/meminfo", "MemTotal: 1 kB\n");
     EXPECT_EQ(run({"cat", "/proc/meminfo"}).output, "MemTotal: 1 kB\n");
@@ -260,7 +260,7 @@ TEST_F(RootTest, MemoryFiguresCanBeReplacedAndRemoved) {
     EXPECT_THAT(run({"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args"}).output, HasSubstr("/bin/ps -eo"));
 }
 
-TEST_F(RootTest, TheProgramsThatTheLibraryRunsWork) {
+TEST_F(RootTest, ProgramsRunByTheLibraryWork) {
     const std::vector<std::pair<Words, const char*>> programs = {
         {{"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args"},
          "^ +PID +PPID STAT +RSS +TIME COMMAND\n.*/bin/ps -eo"},

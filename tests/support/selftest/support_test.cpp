@@ -35,7 +35,7 @@ TEST_F(SupportTest, ReadsTheDaemonLog) {
     EXPECT_THAT("other.cpp: Failed", Not(LogLine("other.cpp", "Failed")));
 }
 
-TEST_F(SupportTest, NoticesALogLineWithoutATimeStamp) {
+TEST_F(SupportTest, DetectsALogLineWithoutATimeStamp) {
     EXPECT_NONFATAL_FAILURE(messages("2026-11-15 09:23:41 checker.cpp:88 text\n"), "no time stamp");
     EXPECT_NONFATAL_FAILURE(messages("2026-11-15T09:23:41+0100 checker.cpp:88 text\n"), "no time stamp");
 }
@@ -46,7 +46,7 @@ TEST_F(SupportTest, ReadsTheEntriesOfTheRecord) {
     EXPECT_THAT(recordEntries(), ElementsAre("\nPID CMD\n1 init\n", "\nx"));
 }
 
-// A test of its own inside a test, so that its failure can be looked at.
+// A nested test, whose failure can be inspected.
 class LeakingTest : public SandboxTest {
  public:
     static void leak() {
@@ -63,7 +63,7 @@ class LeakingTest : public SandboxTest {
 
 int LeakingTest::descriptor = -1;
 
-TEST_F(SupportTest, NoticesADescriptorLeftOpen) {
+TEST_F(SupportTest, DetectsALeakedDescriptor) {
     EXPECT_NONFATAL_FAILURE(LeakingTest::leak(), "was left open: /dev/null");
     close(LeakingTest::descriptor);
 }
@@ -72,7 +72,7 @@ TEST_F(SupportTest, CollectsTheSystemLog) {
     SystemLog log;
     EXPECT_THAT(log.entries(), IsEmpty());
     openlog("name", 0, LOG_DAEMON);
-    // More than a socket queues.
+    // More than the queue of a socket holds.
     constexpr std::size_t COUNT = 200;
     for (std::size_t i = 0; i < COUNT; ++i) {
         syslog(LOG_ERR, "%s:%d text %zu", "other.cpp", 12, i);
@@ -125,11 +125,11 @@ TEST_F(NodeTest, CallsFunctionsInside) {
     EXPECT_EQ(node.call([] { return raise(SIGKILL); }), 128 + SIGKILL);
 }
 
-TEST_F(NodeTest, AFailedExpectationInsideIsAFailure) {
+TEST_F(NodeTest, FailedExpectationInsideFailsTheTest) {
     Node node("alpha");
     std::fflush(stdout);
     EXPECT_EQ(node.call([] {
-        // The failure is meant to happen: its report does not belong into the output of this test.
+        // The failure is intended: keep it out of the output of this test.
         close(STDOUT_FILENO);
         EXPECT_TRUE(false);
         return 0;
@@ -138,7 +138,7 @@ TEST_F(NodeTest, AFailedExpectationInsideIsAFailure) {
     EXPECT_FALSE(HasFailure());
 }
 
-TEST_F(NodeTest, EndsWithAllItsProcesses) {
+TEST_F(NodeTest, KillsAllItsProcesses) {
     pid_t first = -1;
     {
         Node node("alpha");

@@ -24,10 +24,10 @@ using TERN::HA::Daemon::DaemonLog;
 using test::LOG;
 using ::testing::ElementsAre;
 
-// File systems that take nothing any more, for a while.
-class LogTroubleTest : public test::SandboxTest {
+// File systems that are full, read-only or missing for a while.
+class LogFileSystemTest : public test::SandboxTest {
  protected:
-    // Puts a file system of a few pages in the directory's place.
+    // Mount a tmpfs of 16 KiB over the directory.
     static void mountSmall(const char* directory) {
         ASSERT_EQ(mount("tmpfs", directory, "tmpfs", 0, "size=16k,mode=0700"), 0);
     }
@@ -36,7 +36,7 @@ class LogTroubleTest : public test::SandboxTest {
         try {
             test::writeFile(std::string(directory) + "/filler", std::string(65536, 'x'));
         } catch (const std::exception&) {
-            // As far as it goes.
+            // Expected: the file system is full.
         }
     }
 
@@ -51,7 +51,7 @@ class LogTroubleTest : public test::SandboxTest {
     DaemonLog log{"/var/log/ha", "/ha.daemon.log"};
 };
 
-TEST_F(LogTroubleTest, ALineIsDroppedWhileTheBuffersFileSystemIsFull) {
+TEST_F(LogFileSystemTest, LineIsDroppedOnAFullBufferFileSystem) {
     mountSmall("/tmp/ha");
     fill("/tmp/ha");
     log.set("lost");
@@ -61,7 +61,7 @@ TEST_F(LogTroubleTest, ALineIsDroppedWhileTheBuffersFileSystemIsFull) {
     EXPECT_THAT(test::daemonLogMessages(), ElementsAre("kept"));
 }
 
-TEST_F(LogTroubleTest, LinesAreDroppedWhileTheLogsFileSystemIsFull) {
+TEST_F(LogFileSystemTest, LinesAreDroppedOnAFullLogFileSystem) {
     mountSmall("/var/log/ha");
     fill("/var/log/ha");
     log.set("lost");
@@ -74,7 +74,7 @@ TEST_F(LogTroubleTest, LinesAreDroppedWhileTheLogsFileSystemIsFull) {
     EXPECT_THAT(test::messages(test::readFile(LOG)), ElementsAre("kept"));
 }
 
-TEST_F(LogTroubleTest, ALineIsDroppedWhileTheBuffersFileSystemIsReadOnly) {
+TEST_F(LogFileSystemTest, LineIsDroppedOnAReadOnlyBufferFileSystem) {
     mountSmall("/tmp/ha");
     log.set("before");
     setReadOnly("/tmp/ha", true);
@@ -89,7 +89,7 @@ TEST_F(LogTroubleTest, ALineIsDroppedWhileTheBuffersFileSystemIsReadOnly) {
     EXPECT_EQ(test::bufferText(), "");
 }
 
-TEST_F(LogTroubleTest, LinesAreDroppedWhileTheLogsFileSystemIsReadOnly) {
+TEST_F(LogFileSystemTest, LinesAreDroppedOnAReadOnlyLogFileSystem) {
     mountSmall("/var/log/ha");
     setReadOnly("/var/log/ha", true);
     log.set("lost");
@@ -103,7 +103,7 @@ TEST_F(LogTroubleTest, LinesAreDroppedWhileTheLogsFileSystemIsReadOnly) {
     EXPECT_THAT(test::messages(test::readFile(LOG)), ElementsAre("kept"));
 }
 
-TEST_F(LogTroubleTest, WorksAgainWhenTheDirectoriesAreMadeAgain) {
+TEST_F(LogFileSystemTest, RecoversWhenDirectoriesAreRecreated) {
     for (const char* directory : {"/tmp/ha", "/var/log/ha"}) {
         test::removeTree(directory);
     }
@@ -121,8 +121,8 @@ TEST_F(LogTroubleTest, WorksAgainWhenTheDirectoriesAreMadeAgain) {
 
 std::atomic<bool> isInterrupted{false};
 
-TEST_F(LogTroubleTest, ALineWhoseWriteIsInterruptedIsContinued) {
-    // A signal ends the write of a line that does not fit into a pipe after a part of it.
+TEST_F(LogFileSystemTest, InterruptedWriteOfALineIsContinued) {
+    // The line exceeds the capacity of the pipe: a signal interrupts its write halfway.
     ASSERT_EQ(mkfifo(test::BUFFER, 0600), 0);
     const int pipe = open(test::BUFFER, O_RDONLY | O_NONBLOCK | O_CLOEXEC);
     ASSERT_NE(pipe, -1);
@@ -154,7 +154,7 @@ TEST_F(LogTroubleTest, ALineWhoseWriteIsInterruptedIsContinued) {
     EXPECT_THAT(test::messages(written), ElementsAre(text));
 }
 
-TEST_F(LogTroubleTest, ADirectoryInTheBuffersPlaceCostsTheLinesOfThatTime) {
+TEST_F(LogFileSystemTest, RecoversWhenTheBufferIsNoLongerADirectory) {
     test::makeDirectories("/tmp/ha/ha.daemon.log");
     log.set("lost");
     log.writeLogToDisk();
