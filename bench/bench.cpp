@@ -1,5 +1,5 @@
-// Operations of the library, each beside its baseline, and how their cost grows. script/bench runs this in a
-// private root and makes the table.
+// Operations of the library, each beside its baseline, and how their cost grows. script/bench runs
+// this in a private root and makes the table.
 #include <arpa/inet.h>
 #include <benchmark/benchmark.h>
 #include <json/json.h>
@@ -91,8 +91,8 @@ DaemonLog& benchLog() {
 const std::string LINE_TEXT(100, 'x');
 const std::string STAMPED_LINE = "2026-11-15T09:23:41+01:00 " + LINE_TEXT + "\n";
 
-// The two ends of an exchange stay on one processor each, as two nodes or two busy programs would: otherwise
-// chance decides whether they share one, which is eight times faster.
+// The two ends of an exchange stay on one processor each, as two nodes or two busy programs would:
+// otherwise chance decides whether they share one, which is eight times faster.
 void stayOn(std::size_t processor) {
     cpu_set_t set;
     CPU_ZERO(&set);

@@ -1,15 +1,15 @@
-# Settings that every target of the project shares, as the interface target ternha_settings.
+# Settings of all targets, as the interface target ternha_settings.
 set(CMAKE_CXX_STANDARD 17)
 set(CMAKE_CXX_STANDARD_REQUIRED ON)
 set(CMAKE_CXX_EXTENSIONS OFF)
 set(CMAKE_POSITION_INDEPENDENT_CODE ON)
 
-# A program need not be linked anew when a shared library changes behind its interface.
+# Do not relink programs when only the implementation of a shared library changes.
 set(CMAKE_LINK_DEPENDS_NO_SHARED ON)
 
 add_library(ternha_settings INTERFACE)
 
-# A log may pass 2 GiB and a time stamp 2038 on 32-bit machines too.
+# Logs above 2 GiB and time stamps after 2038 on 32-bit machines.
 target_compile_definitions(ternha_settings INTERFACE _GNU_SOURCE _FILE_OFFSET_BITS=64 _TIME_BITS=64)
 
 target_compile_options(
@@ -31,7 +31,7 @@ target_compile_options(
             $<$<CXX_COMPILER_ID:GNU>:-Wduplicated-cond>
             $<$<CXX_COMPILER_ID:GNU>:-Wduplicated-branches>
             $<$<CXX_COMPILER_ID:GNU>:-Wlogical-op>
-            # A cast that 64-bit types need may be useless between 32-bit ones.
+            # A cast needed for 64-bit types may be useless for 32-bit ones.
             $<$<AND:$<CXX_COMPILER_ID:GNU>,$<EQUAL:${CMAKE_SIZEOF_VOID_P},8>>:-Wuseless-cast>
             $<$<BOOL:${TERNHA_WARNINGS_AS_ERRORS}>:-Werror>)
 

@@ -1,14 +1,14 @@
-# Where things are installed, and what the targets need for it.
+# Installation directories and properties.
 include(CMakePackageConfigHelpers)
 
-# Below /usr the configuration belongs in /etc; elsewhere the tree stays whole, and may be moved.
+# Configuration belongs in /etc if the prefix is /usr; otherwise the tree is relocatable.
 if(CMAKE_INSTALL_PREFIX STREQUAL "/usr")
   set(TERNHA_INSTALL_CONFDIR /etc/ternha)
   set(TERNHA_CONFIG_FILE /etc/ternha/ternhad.conf)
 else()
   set(TERNHA_INSTALL_CONFDIR ${CMAKE_INSTALL_SYSCONFDIR}/ternha)
   set(TERNHA_CONFIG_FILE ${CMAKE_INSTALL_PREFIX}/${CMAKE_INSTALL_SYSCONFDIR}/ternha/ternhad.conf)
-  # The dynamic linker knows the libraries of /usr only.
+  # The dynamic linker searches only /usr.
   file(RELATIVE_PATH lib_from_sbin /${CMAKE_INSTALL_SBINDIR} /${CMAKE_INSTALL_LIBDIR})
   set(CMAKE_INSTALL_RPATH $ORIGIN $ORIGIN/${lib_from_sbin})
 endif()
@@ -17,7 +17,7 @@ set(TERNHA_INSTALL_CMAKEDIR ${CMAKE_INSTALL_LIBDIR}/cmake/ternhadaemon)
 
 # ternha_install_compressed(FILE NAME DESTINATION COMPONENT)
 #
-# Installs FILE as NAME.gz, the same bytes for the same text.
+# Installs FILE as NAME.gz, reproducibly.
 function(ternha_install_compressed FILE NAME DESTINATION COMPONENT)
   find_program(TERNHA_GZIP gzip REQUIRED)
   set(compressed "${CMAKE_CURRENT_BINARY_DIR}/${COMPONENT}/${NAME}.gz")

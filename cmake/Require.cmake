@@ -1,6 +1,6 @@
 # ternha_require(PACKAGE USE)
 #
-# Finds a package, or ends with what it is for and where the names of distributions' packages are.
+# Finds a package, or fails with its use and where package names of distributions are listed.
 macro(ternha_require PACKAGE USE)
   find_package(${PACKAGE} QUIET)
   if(NOT ${PACKAGE}_FOUND)

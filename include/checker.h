@@ -16,17 +16,18 @@
 
 namespace TERN::HA::Daemon {
 
-// The five peer checks. An asking side (call operator) sends its request to remoteIP("") and blocks for up to
-// 3 seconds for the reply, RebootRemote for longer. Failures are reported by the result and logged with the
-// texts given here. Nothing throws, not even when memory runs out: the check fails. Thread-safe.
+// The five peer checks. The requesting side (call operator) sends its request to remoteIP("") and
+// blocks for up to 3 seconds for the reply, RebootRemote for longer. Failures are reported by the
+// result and logged with the texts given here. Nothing throws, not even when memory runs out: the
+// check fails. Thread-safe.
 
 /// "is_alive": liveness probe.
 class IsRemoteAlive : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// Probe the peer. Returns true exactly when the reply is "alive", false for any other reply and when
-    /// none arrived. Logs nothing and stores nothing: the caller passes the result to
+    /// Probe the peer. Returns true exactly when the reply is "alive", false for any other reply
+    /// and when none arrived. Logs nothing and stores nothing: the caller passes the result to
     /// Status::setRemoteAlive.
     bool operator()() override;
 
@@ -42,8 +43,8 @@ class IsRemoteMDResync : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// Return true exactly when the reply is "resync". Returns false for any other reply, and when none
-    /// arrived, logging "Failed to recv remote md resync responce".
+    /// Return true exactly when the reply is "resync". Returns false for any other reply, and when
+    /// none arrived, logging "Failed to recv remote md resync responce".
     bool operator()() override;
 
     /// Return "resync" when `status.isMDResync` is set, "not_resync" otherwise.
@@ -55,18 +56,18 @@ class IsRemoteMDResync : public EnvCheck {
 
 /// "is_disk_err_handling": whether the peer is handling disk errors, and on which disks.
 ///
-/// The reply must fit in 63 bytes: two disk names such as "sda" fit, three do not. The asking side sees a
-/// truncated reply as one that cannot be parsed.
+/// The reply must fit in 63 bytes: two disk names such as "sda" fit, three do not. The requesting
+/// side fails to parse a truncated reply.
 class IsRemoteDiskErrHandling : public EnvCheck {
  public:
     using EnvCheck::operator();
 
     /// Return the peer's flag and store its list, as sent, in `disks`.
     ///
-    /// The flag and the list are independent of each other. A reply without the list sets `disks` to null,
-    /// one without the flag returns false. Returns false with `disks` unchanged when no reply arrived
-    /// ("Failed to recv remote disk error handling responce") and when the reply is not JSON or its flag
-    /// cannot be read as a bool ("Failed to parse remote disk error info").
+    /// The flag and the list are independent of each other. A reply without the list sets `disks`
+    /// to null, one without the flag returns false. Returns false with `disks` unchanged when no
+    /// reply arrived ("Failed to recv remote disk error handling responce") and when the reply is
+    /// not JSON or its flag cannot be read as a bool ("Failed to parse remote disk error info").
     bool operator()(Json::Value& disks) override;
 
     /// Return the flag and the list of `status` as compact JSON. Blocks for the lock of the list.
@@ -76,23 +77,24 @@ class IsRemoteDiskErrHandling : public EnvCheck {
     static CheckerRegister<IsRemoteDiskErrHandling> reg;  ///< registers the check when the library is loaded
 };
 
-/// "reboot_remote": make the peer reboot at once.
+/// "reboot_remote": make the peer reboot without a shutdown.
 class RebootRemote : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// Order the peer to reboot and follow it down. Returns true.
+    /// Make the peer reboot and wait for it to be declared dead. Returns true.
     ///
-    /// Logs "Failed to reboot remote, but keep checking" when no reply arrived, which is normal: a peer that
-    /// obeys cannot reply. Then sets NodeRebootPending in `status` and tests up to 30 times, a second apart,
-    /// whether the peer is still alive; "Remote offline" is logged when it is not. In either case
-    /// NodeRebooting is then set and NodeRebootPending cleared. This function never clears NodeAlive:
-    /// another thread must do so through Status::setRemoteAlive. Blocks for up to 33 seconds.
+    /// Logs "Failed to reboot remote, but keep checking" when no reply arrived, which is normal: a
+    /// peer that reboots cannot reply. Then sets NodeRebootPending in `status` and checks up to 30
+    /// times, a second apart, whether the peer is still alive; logs "Remote offline" when it is
+    /// not. In either case NodeRebooting is then set and NodeRebootPending cleared. This function
+    /// never clears NodeAlive: another thread must do so through Status::setRemoteAlive. Blocks for
+    /// up to 33 seconds.
     bool operator()(Status& status);
 
     /// Reboot this machine: move both logs to disk, flush the file systems and write "b" to
-    /// /proc/sysrq-trigger. Returns the empty string when the machine goes on nevertheless, as it does when
-    /// that file cannot be written.
+    /// /proc/sysrq-trigger. Returns the empty string if the reboot does not happen, for
+    /// example because that file cannot be written.
     std::string handle(Status& status) override;
     std::string getType() override;
 
@@ -104,8 +106,8 @@ class GetRemoteHostname : public EnvCheck {
  public:
     using EnvCheck::operator();
 
-    /// Store the reply in `hostname`: 0 to 63 bytes as sent, possibly with a line end. Returns true on
-    /// success; when no reply arrived, logs "Failed to get remote hostname" and returns false.
+    /// Store the reply in `hostname`: 0 to 63 bytes as sent, possibly with a newline. Returns true
+    /// on success; when no reply arrived, logs "Failed to get remote hostname" and returns false.
     bool operator()(std::string& hostname);
 
     /// Return getLocalHostname().
@@ -115,48 +117,52 @@ class GetRemoteHostname : public EnvCheck {
     static CheckerRegister<GetRemoteHostname> reg;  ///< registers the check when the library is loaded
 };
 
-// Local checks. They keep no state and never throw. Thread-safe. They block for as long as the kernel takes
-// to read its files.
+// Local checks. They keep no state and never throw. Thread-safe. They block for as long as the
+// kernel takes to read its files.
 
-/// Return true when any line of /proc/drbd contains a connection state in which both nodes are linked:
-/// "Connected" or a handshake, resync or verify state. The test is for a case-sensitive substring; with
-/// several resources, one that is connected is enough. Logs "Failed to open /proc/drbd" and returns false
-/// when that file cannot be opened.
+/// Return true when any line of /proc/drbd contains a connection state in which both nodes are
+/// linked: "Connected" or a handshake, resync or verify state. The test is for a case-sensitive
+/// substring; with several resources, one that is connected is enough. Logs "Failed to open
+/// /proc/drbd" and returns false when that file cannot be opened.
 bool isDRBDConnect();
 
-/// Return true when the sync_action of any md array is exactly "resync"; recover, check and the others do not
-/// count. Logs "Failed to set globBuf from /sys/block/md*" and returns false when there is no md array. An
-/// array without that file logs the line of isSysfsValue and is skipped.
+/// Return true when the sync_action of any md array is exactly "resync"; recover, check and the
+/// others do not count. Logs "Failed to set globBuf from /sys/block/md*" and returns false when
+/// there is no md array. An array without that file logs the line of isSysfsValue and is skipped.
 bool isMDResync();
 
 /// Find the disks on ATA ports under error handling.
 ///
-/// @param disks  becomes an array of their device names in the order of the sorted port paths (ata10 before
-///               ata2); unchanged when there are no ATA ports
+/// @param disks  becomes an array of their device names in the order of the sorted port paths
+///               (ata10 before ata2); unchanged when there are no ATA ports
 /// @return true when there is at least one such disk. Logs "Failed to set globBuf from
-///         /sys/class/ata_port/ata*" when there are no ATA ports, and "Failed to get dev name by ata path: "
-///         and the path for a port whose disk has no name, and the line of isSysfsValue for one without
-///         the attribute error_handling; such ports do not count.
+///         /sys/class/ata_port/ata*" when there are no ATA ports, and "Failed to get dev name by
+///         ata path: " and the path for a port whose disk has no name, and the line of isSysfsValue
+///         for one without the attribute error_handling; such ports do not count.
 bool isDiskErrHandling(Json::Value& disks);
 
-/// Store the device name (1 to 7 characters) of the disk on the ATA port `path` (a path or a bare port name)
-/// in `name`. Returns false with `name` unchanged when the port has no disk. `path` may be modified.
+/// Store the device name (1 to 7 characters) of the disk on the ATA port `path` (a path or a bare
+/// port name) in `name`. Returns false with `name` unchanged when the port has no disk. `path` may
+/// be modified.
 bool devNameByAtaPath(char* path, std::string& name);
 
-/// Return true when the first line of the file at `path`, without its newline, equals `expected`. Logs
-/// "Failed to open sysfs file " and the path, and returns false, when the file cannot be opened.
+/// Return true when the first line of the file at `path`, without its newline, equals `expected`.
+/// Logs "Failed to open sysfs file " and the path, and returns false, when the file cannot be
+/// opened.
 bool isSysfsValue(const std::string& path, const std::string& expected);
 
-/// A running program and the stream of its standard output. Not thread-safe: use an object from one thread at
-/// a time.
+/// A running program and the stream of its standard output. Not thread-safe: use an object from one
+/// thread at a time.
 class CommandPipe {
  public:
-    /// Start argv[0] with the null-terminated argument vector `argv`, without a shell. On failure, and for an
-    /// empty vector, sets _failed and logs "Failed to exec command: " and the program's path.
+    /// Start argv[0] with the null-terminated argument vector `argv`, without a shell. On failure,
+    /// and for an empty vector, sets _failed and logs "Failed to exec command: " and the program's
+    /// path.
     explicit CommandPipe(const char* const* argv);
 
-    /// Close the stream and wait for the program, without limit. Logs "Failed to exec PATH return code: N"
-    /// unless it exited with code 0; N is the raw wait status in decimal (256 for exit code 1).
+    /// Close the stream and wait for the program, without limit. Logs "Failed to exec PATH return
+    /// code: N" unless it exited with code 0; N is the raw wait status in decimal (256 for exit
+    /// code 1).
     ~CommandPipe();
 
     CommandPipe(const CommandPipe&) = delete;
@@ -167,24 +173,25 @@ class CommandPipe {
     std::string _command;  ///< path of the program, for messages
 };
 
-/// Return the average round trip to remoteIP("") in milliseconds, measured by /bin/ping with three requests.
-/// Returns 0 when ping could not be started or printed no average; the log has the reason unless ping
-/// exited with code 0. Blocks for
-/// about 0.4 seconds and the round trips, for 10 seconds when the peer does not reply. Thread-safe.
+/// Return the average round trip to remoteIP("") in milliseconds, measured by /bin/ping with three
+/// requests. Returns 0 when ping could not be started or printed no average; the log has the reason
+/// unless ping exited with code 0. Blocks for about 0.4 seconds and the round trips, for 10 seconds
+/// when the peer does not reply. Thread-safe.
 float heartbeatLatency();
 
-/// Non-OK packet rate of the DRBD interface (drbdIF("")), from one sample to the next. Not thread-safe: use
-/// an object from one thread at a time.
+/// Non-OK packet rate of the DRBD interface (drbdIF("")), from one sample to the next. Not
+/// thread-safe: use an object from one thread at a time.
 class InterfaceChecker {
  public:
     /// Sample the counters of /sbin/ifconfig.
     ///
-    /// @param rate  receives the share of packets that were not OK (errors, drops, overruns) since the
-    ///              previous sample, since the counters were reset for the first one. 0 to 1; outside this
-    ///              range when the counters went backwards. Unchanged on failure.
-    /// @return true on success, also when the interface is not listed: the rate is then meaningless. False,
-    ///         with "Failed to get interface detail" as the last line logged, when ifconfig could not be
-    ///         started or printed nothing, a line too short, or a counter out of range.
+    /// @param rate  receives the share of packets that were not OK (errors, drops, overruns) since
+    ///              the previous sample, since the counters were reset for the first one. 0 to 1;
+    ///              outside this range when the counters went backwards. Unchanged on failure.
+    /// @return true on success, also when the interface is not listed: the rate is then
+    ///         meaningless. False, with "Failed to get interface detail" as the last line logged,
+    ///         when ifconfig could not be started or printed nothing, a line too short, or a
+    ///         counter out of range.
     ///
     /// Blocks until ifconfig ends.
     bool networkNonOkRate(float& rate);
@@ -198,37 +205,37 @@ class InterfaceChecker {
     long long _lastNonOkTotal = 0;
 };
 
-// Diagnostic recording: each call appends one entry to the record log, whose text begins on the line after
-// the time stamp. A program that cannot be started and a file that cannot be opened leave a line in the
-// daemon log and no entry. Thread-safe.
+// Diagnostic recording: each call appends one entry to the record log, whose text begins on the
+// line after the time stamp. A program that cannot be started and a file that cannot be opened log
+// a line to the daemon log and record no entry. Thread-safe.
 
 /// Record the status as compact JSON. Blocks for the locks of the record.
 void recordStatus(Status& status);
 
-/// Run argv[0] with the null-terminated argument vector `argv` and record everything that it writes to its
-/// standard output; empty output and a failing program are recorded, too. Blocks until the program ends and
-/// holds its output in memory.
+/// Run argv[0] with the null-terminated argument vector `argv` and record everything that it writes
+/// to its standard output; empty output and a failing program are recorded, too. Blocks until the
+/// program ends and holds its output in memory.
 void recordCMD(const char* const* argv);
 
 /// Record the process list (/bin/ps). Blocks as recordCMD does.
 void recordPS();
 
-/// Record the file-system usage (/bin/df). Blocks as recordCMD does, without limit on a dead network file
-/// system.
+/// Record the file-system usage (/bin/df). Blocks as recordCMD does, without limit on a dead
+/// network file system.
 void recordDF();
 
 /// Record /proc/meminfo. Logs "Failed to get meminfo" when it cannot be opened.
 void recordMemoryInfo();
 
-/// Return this node's own host name, as it was before the HA package took over the shared name: the bytes of
-/// /tmp/.ha.hostname.original, at most 4096 and a trailing newline included. Returns the empty string while
-/// that file is missing or empty, or is not a regular file of root or this process's user; a symbolic link is
-/// not followed. A name once read is kept for the life of the process. Thread-safe; blocks for the
-/// reading of a small file.
+/// Return this node's own host name, before the HA package replaced it by the shared name: the
+/// bytes of /tmp/.ha.hostname.original, at most 4096 and a trailing newline included. Returns the
+/// empty string while that file is missing or empty, or is not a regular file of root or this
+/// process's user; a symbolic link is not followed. A non-empty name is cached for the life of the
+/// process. Thread-safe; blocks for the reading of a small file.
 std::string getLocalHostname();
 
-/// Return true when the HA tool reports a constraint on this node (it exits with status 0), false otherwise
-/// and when it cannot be started. Blocks until the tool ends. Thread-safe.
+/// Return true when the HA tool reports a constraint on this node (it exits with status 0), false
+/// otherwise and when it cannot be started. Blocks until the tool ends. Thread-safe.
 bool isHadConstraints();
 
 }  // namespace TERN::HA::Daemon

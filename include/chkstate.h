@@ -11,47 +11,48 @@
 
 #pragma GCC visibility push(default)
 
-/// UDP port on which every node answers its peer.
+/// UDP port on which every node replies to its peer.
 constexpr std::uint16_t HA_PEER_PORT = 7499;
 
-/// Transport of one short text datagram as a request and one as its reply, over UDP/IPv4. Base of the server
-/// and the client end; owns its socket.
+/// Transport for one request and one reply, each a short text datagram over UDP/IPv4. Base of
+/// server and client; owns its socket.
 ///
-/// Not thread-safe: use an object from one thread at a time. The destructor is not virtual: destroy an object
-/// through its own type.
+/// Not thread-safe: use an object from one thread at a time. The destructor is not virtual: destroy
+/// an object through its own type.
 class HASocketComm {
  public:
     /// Open the socket and set the peer's address.
     ///
-    /// @param ip  the peer's IPv4 address, dotted quad; anything else counts as 0.0.0.0. The port is
-    ///            HA_PEER_PORT.
+    /// @param ip  the peer's IPv4 address, dotted quad; anything else counts as 0.0.0.0. The port
+    ///            is HA_PEER_PORT.
     ///
-    /// HasError() is true when no socket could be opened; the system log then has "Failed to set socket".
+    /// HasError() is true when no socket could be opened; the system log then has "Failed to set
+    /// socket".
     explicit HASocketComm(const std::string& ip);
     ~HASocketComm();
 
     HASocketComm(const HASocketComm&) = delete;
     HASocketComm& operator=(const HASocketComm&) = delete;
 
-    /// Return true when the construction failed; errno has the reason right after it. Do not call Send and
-    /// Recv then: without a socket they return -1, with one that could not be set up Recv may block.
+    /// Return true when the construction failed; errno has the reason right after it. Do not call
+    /// Send and Recv then: without a socket they return -1, with one that could not be set up Recv
+    /// may block.
     bool HasError();
 
-    /// Send `data` as one datagram, without a terminating zero. A client sends to its peer; a server sends to
-    /// the sender of the datagram that it received last, to its own address before the first Recv, and
-    /// nowhere
-    /// (-1) after a Recv that failed.
+    /// Send `data` as one datagram, without a terminating zero. A client sends to its peer; a
+    /// server sends to the sender of the last datagram received, to its own address before the
+    /// first Recv, and fails after a failed Recv.
     ///
-    /// @return the number of bytes sent, -1 on failure. Never waits for the peer.
+    /// @return the number of bytes sent, -1 on failure. Does not wait for the peer.
     int Send(const std::string& data);
 
     /// Receive one datagram.
     ///
-    /// @param out  receives the text up to the first zero byte; at most 63 bytes of the datagram are read,
-    ///             the rest is discarded. Unchanged on failure.
-    /// @return the number of bytes received, 0 for an empty datagram, -1 on time-out, interruption by a
-    ///         signal or any other failure. Blocks up to the receive time-out; without one, until a datagram
-    ///         arrives.
+    /// @param out  receives the text up to the first zero byte; at most 63 bytes of the datagram
+    ///             are read, the rest is discarded. Unchanged on failure.
+    /// @return the number of bytes received, 0 for an empty datagram, -1 on time-out, interruption
+    ///         by a signal or any other failure. Blocks up to the receive time-out; without one,
+    ///         until a datagram arrives.
     virtual int Recv(std::string& out) = 0;
 
  protected:
@@ -70,8 +71,8 @@ class HASocketComm {
 /// Server end: bound to this node's address, replies to the sender of the last request.
 class HASocketCommServer : public HASocketComm {
  public:
-    /// Bind the socket to `ip`, port HA_PEER_PORT, without a receive time-out. HasError() is true when the
-    /// address cannot be bound.
+    /// Bind the socket to `ip`, port HA_PEER_PORT, without a receive time-out. HasError() is true
+    /// when the address cannot be bound.
     explicit HASocketCommServer(const std::string& ip);
 
     /// The same, with a receive time-out of `timeoutSec` seconds (0: none).
@@ -83,8 +84,8 @@ class HASocketCommServer : public HASocketComm {
     socklen_t peerAddrLen;
 };
 
-/// Client end: sends requests to the node at `ip`. The kernel picks the source port at the first Send. Recv
-/// takes any datagram that reaches this port for the reply, whoever sent it.
+/// Client end: sends requests to the node at `ip`. The kernel picks the source port at the first
+/// Send. Recv takes any datagram that reaches this port for the reply, whoever sent it.
 class HASocketCommClient : public HASocketComm {
  public:
     /// Open a client with a receive time-out of `timeoutSec` seconds (0: none).

@@ -8,11 +8,11 @@
 
 #include "daemon_log.h"
 
-// Every name here has internal linkage: each source file that includes this header owns a pair of log
-// objects, and all pairs name the same files. A mutex therefore serialises the callers of one source file
-// only. The objects are created by static initialisation and never freed, so that logging works until the
-// very end of the process; "used" keeps the pointers alive in files that never log, so that leak checkers
-// stay quiet.
+// Every name here has internal linkage: each source file that includes this header owns a pair of
+// log objects, and all pairs name the same files. A mutex therefore serialises the callers of one
+// source file only. The objects are created by static initialisation and never freed, so that
+// logging works until the process exits; "used" keeps the pointers alive in files that never log,
+// so that leak checkers stay quiet.
 
 namespace TERN::HA::Daemon {
 
@@ -34,9 +34,9 @@ constexpr char DAEMON_RECORD_FILE[] = "/ha.daemon.record";  ///< file name of re
 
 }  // namespace TERN::HA::Daemon
 
-/// Log "file.cpp:LINE message" with file and line of the call site. `message` is a std::string or a literal.
-/// Blocks as DaemonLog::set does. Never throws std::bad_alloc: a line for which there is no memory is
-/// dropped, so that it does not change what the caller does.
+/// Log "file.cpp:LINE message" with file and line of the call site. `message` is a std::string or a
+/// literal. Blocks as DaemonLog::set does. Never throws std::bad_alloc: the line is dropped when
+/// memory runs out.
 #define HA_LOG(message)                                                    \
     do {                                                                   \
         try {                                                              \

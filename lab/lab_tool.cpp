@@ -1,7 +1,7 @@
-// What the scenario needs on a node and no ordinary program does.
+// Actions of the scenario on a node.
 //
-//   ternha-lab-tool log FIRST LAST      logs the lines "lab line FIRST" to "lab line LAST" to the daemon log
-//   ternha-lab-tool send ADDRESS TEXT   sends the text to the peer port of the address
+//   ternha-lab-tool log FIRST LAST      log the lines "lab line FIRST" to "lab line LAST"
+//   ternha-lab-tool send ADDRESS TEXT   send the text to the peer port of the address
 
 #include <cstdlib>
 #include <iostream>

@@ -58,8 +58,7 @@ bool exitedWithSuccess(int status) {
     return WIFEXITED(status) && WEXITSTATUS(status) == 0;
 }
 
-// Emulators start programs in a way that cannot report a failed exec, so that the usual reasons are looked
-// for beforehand.
+// Emulators cannot report a failed exec: check the usual reasons beforehand.
 int startError(const char* path) {
     struct stat info = {};
     if (stat(path, &info) != 0) {
@@ -71,8 +70,8 @@ int startError(const char* path) {
     return faccessat(AT_FDCWD, path, X_OK, AT_EACCESS) == 0 ? 0 : errno;
 }
 
-// Starts a program with default signals, nothing blocked and no descriptor above standard error. `fd`, unless
-// negative, becomes its descriptor `target`. Returns 0 or the error number.
+// Start a program with default signals, nothing blocked and no descriptor above standard error.
+// `fd`, unless negative, becomes its descriptor `target`. Returns 0 or the error number.
 int start(pid_t* pid, const char* path, const char* const argv[], int fd, int target) {
     if (path == nullptr || argv == nullptr || argv[0] == nullptr) {
         return EINVAL;
@@ -105,8 +104,8 @@ int start(pid_t* pid, const char* path, const char* const argv[], int fd, int ta
     return error;
 }
 
-// Runs a program whose end nobody waits for: an intermediate process starts it and ends, so that the system
-// reaps the program. No signal may reach the caller's handlers in that copy of the caller.
+// Run a program without waiting: an intermediate process starts it and exits, so that init reaps the
+// program. Signals are blocked in that process, which is a copy of the caller.
 int startDetached(const char* path, const char* const argv[]) {
     sigset_t all;
     sigset_t before;
@@ -121,7 +120,7 @@ int startDetached(const char* path, const char* const argv[]) {
     return intermediate != -1 && exitedWithSuccess(waitForEnd(intermediate)) ? 0 : FAILURE;
 }
 
-// The whole text of a file, nothing when it cannot be read.
+// Return the text of a file, or nothing when it cannot be read.
 std::optional<std::string> textOf(const std::string& path) {
     const File file(std::fopen(path.c_str(), "re"));
     if (!file) {
@@ -151,7 +150,7 @@ std::string unquoted(const std::string& text) {
     return isQuoted ? text.substr(1, text.size() - 2) : text;
 }
 
-// True when a component of `path` is `name`.
+// Return whether a component of `path` is `name`.
 bool hasComponent(const std::string& path, const std::string& name) {
     return ("/" + path + "/").find("/" + name + "/") != std::string::npos;
 }
@@ -219,7 +218,7 @@ FILE* PLATPopenv(const char* path, const char* mode, const char* const argv[]) t
         errno = EINVAL;
         return nullptr;
     }
-    // All that can fail comes before the start: the program could not be taken back.
+    // Everything that can fail precedes the start, which cannot be undone.
     Streams& table = streams();
     Streams entry = {{nullptr, 0}};
     auto node = entry.extract(nullptr);

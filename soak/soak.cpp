@@ -1,5 +1,5 @@
-// Two nodes for a long time: with events at random, with a link that loses datagrams, or cut again and again.
-// script/soak runs it in a sandbox.
+// Two nodes for a long time: with events at random, with a link that loses datagrams, or cut again
+// and again. script/soak runs it in a sandbox.
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
@@ -99,8 +99,8 @@ Figures figuresOf(Side& side) {
     return figures;
 }
 
-// Of the daemon's threads and, for the time, of the programs that it has run. Threads that have ended no
-// longer tell how often they woke; each was one wake-up at least.
+// Of the daemon's threads and, for the time, of the programs that it has run. Threads that have
+// ended no longer tell how often they woke; each was one wake-up at least.
 Usage usageOf(Side& side) {
     Usage usage;
     const std::string proc = side.proc();

@@ -37,7 +37,7 @@ constexpr int REBOOT_ROUNDS = 30;  // a second each
 
 const char* const PS_ARGV[] = {"/bin/ps", "-eo", "pid,ppid,stat,rss,cputime,args", nullptr};
 
-// Counters are whatever a program printed: their sums and differences wrap around instead of overflowing.
+// Counters come from a program's output: their sums and differences wrap around.
 long long add(long long a, long long b) {
     return static_cast<long long>(static_cast<unsigned long long>(a) + static_cast<unsigned long long>(b));
 }
@@ -48,8 +48,8 @@ long long subtract(long long a, long long b) {
 
 }  // namespace
 
-// The registrations, in the order in which the checks are documented. This file comes last among the
-// library's sources, so that every source file has its log objects by now.
+// The registrations, in the order in which the checks are documented. This file comes last among
+// the library's sources, so that every source file has its log objects by now.
 CheckerRegister<IsRemoteAlive> IsRemoteAlive::reg(IsRemoteAlive().getType());
 CheckerRegister<IsRemoteMDResync> IsRemoteMDResync::reg(IsRemoteMDResync().getType());
 CheckerRegister<IsRemoteDiskErrHandling> IsRemoteDiskErrHandling::reg(IsRemoteDiskErrHandling().getType());
@@ -163,7 +163,7 @@ std::string RebootRemote::handle(Status&) {
         daemonLog->writeLogToDisk();
         recordLog->writeLogToDisk();
     } catch (const std::bad_alloc&) {
-        // A node that is out of memory is one to be restarted: its logs are not worth waiting for.
+        // A node that is out of memory must still reboot, if necessary without its logs.
     }
     sync();  // the kernel restarts without flushing or unmounting anything
     // Frozen: docs/compatibility.md#silent-trigger
@@ -197,7 +197,8 @@ bool RebootRemote::operator()(Status& status) {
 // ---- DRBD ----
 
 bool isDRBDConnect() try {
-    // The connection states in which both nodes are linked. Other states contain none of these words.
+    // The connection states in which both nodes are linked. Other states contain none of these
+    // words.
     static constexpr std::array<std::string_view, 13> LINKED = {
         "WFReportParams", "Connected",  "StartingSyncS", "StartingSyncT", "WFBitMapS",
         "WFBitMapT",      "WFSyncUUID", "SyncSource",    "SyncTarget",    "PausedSyncS",
@@ -209,7 +210,7 @@ bool isDRBDConnect() try {
         return false;
     }
     // Frozen: docs/compatibility.md#drbd-substring
-    // No word spans two lines, so that the lines need not be told apart.
+    // No state contains a newline, so that splitting into lines is unnecessary.
     return std::any_of(LINKED.begin(), LINKED.end(), [&text](std::string_view word) {
         return memmem(text.data(), text.size(), word.data(), word.size()) != nullptr;
     });
@@ -400,7 +401,7 @@ void recordCMD(const char* const* argv) {
     for (std::string_view piece; !(piece = readLine(command._fp, line)).empty();) {
         output += piece;
     }
-    // Before the pipe closes: what a failing program printed is recorded, then its failure is reported.
+    // Before the pipe closes: output precedes the log line on a failure.
     recordLog->set("\n" + output);
 }
 

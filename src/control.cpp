@@ -14,7 +14,7 @@ namespace {
 constexpr char ACTION[] = "act";
 constexpr char IS_REBOOTING[] = "is_froce_reboot_remote";
 
-// One exchange with the daemon; false when there is no reply.
+// Send a request to the daemon; return false when no reply arrives.
 bool exchange(DaemonLocalSocket& client, const char* action, Json::Value& reply) try {
     Json::Value request(Json::objectValue);
     request[ACTION] = action;

@@ -31,8 +31,8 @@ constexpr int LINE_END_WAITS = 100;
 
 using Lock = std::unique_lock<std::timed_mutex>;
 
-// Writes every line of `chunk` to `to`, each with a write of its own. What follows the last newline is kept
-// in `beginning`, and what is there already goes in front.
+// Write each line of `chunk` to `to` with a separate write. `beginning` precedes the first line and
+// then keeps what follows the last newline.
 void moveWholeLines(std::string_view chunk, std::string& beginning, const File& to) {
     for (std::size_t newline = chunk.find('\n'); newline != std::string_view::npos;
          newline = chunk.find('\n')) {
@@ -62,7 +62,7 @@ void moveLines(const File& from, const File& to) {
         if (beginning.empty()) {
             return;
         }
-        // Somebody may be in the middle of an append, whose beginning can be read already.
+        // Another writer may be in the middle of an append.
         if (count == -1 || ++waits > LINE_END_WAITS) {
             break;
         }
@@ -101,7 +101,7 @@ void DaemonLog::writeLogToDisk() {
     if (log.isOpen() && buffer.isOpen()) {
         moveLines(buffer, log);
     }
-    // Right after the last read: what others append in between is lost.
+    // Right after the last read: lines appended in between are lost.
     // Frozen: docs/compatibility.md#emptied-buffer
     const File emptied(_bufferPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC);
 }
@@ -125,8 +125,8 @@ std::int64_t DaemonLog::size() const {
 }
 
 std::string DaemonLog::_formatedTime() const {
-    // Lines come in bursts: what was made for the first of a second serves the others in the same zone.
-    // Without a destructor, so that a process can log to its very end.
+    // Lines come in bursts: cache the stamp per second and zone. No destructor, so that logging works
+    // until the process exits.
     struct Stamp {
         std::time_t time;
         std::array<char, 64> zone;

@@ -22,8 +22,7 @@ std::string setOrGet(std::string& stored, const std::string& value) {
     return stored;
 }
 
-// The server's socket, with the error that its construction ended with: later calls must still be able to
-// name it.
+// The server's socket, and the errno of its construction for the log lines of later calls.
 struct PeerServer {
     PeerServer() : socket(localIP(""), SERVER_TIMEOUT), error(errno) {}
 
@@ -34,7 +33,7 @@ struct PeerServer {
 // Frozen: docs/compatibility.md#no-virtual-destructor
 struct CheckDeleter {
     void operator()(EnvCheck* check) const {
-// Checks have neither members nor destructors, so that this is sound without a virtual one.
+// Sound without a virtual destructor: checks have neither members nor destructors.
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wdelete-non-virtual-dtor"
         delete check;

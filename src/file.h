@@ -20,14 +20,14 @@ class File {
 
     bool isOpen() const { return _fd >= 0; }
 
-    // One read(2), begun again when a signal interrupts it. Returns the bytes read, 0 at the end, -1 on
-    // failure.
+    // Call read(2), again when a signal interrupts it. Returns the bytes read, 0 at the end,
+    // -1 on failure.
     ssize_t read(char* buffer, std::size_t size) const;
 
-    // Writes `data`: one write(2), more only where the kernel took part of it. What it does not take is lost.
+    // Write `data`: one write(2), more only after a partial write. Data after a failure is lost.
     void write(const char* data, std::size_t size) const;
 
-    // A regular file; of root or of this process's user.
+    // Whether it is a regular file; whether root or this process's user owns it.
     bool isRegular() const;
     bool isTrusted() const;
 
@@ -35,15 +35,16 @@ class File {
     int _fd;
 };
 
-// Appends the bytes of the file at `path`, best effort, to `content`. False when it cannot be opened.
+// Appends the bytes of the file at `path`, best effort, to `content`. False when it cannot be
+// opened.
 bool readFile(const char* path, std::string& content);
 
 enum class Owner { any, trusted };
 
-// The content of a small file, where something else may stand in its place: opens without waiting, and takes
-// at most `limit` bytes. Empty for what cannot be opened or is no regular file. Owner::trusted, where other
-// users can write to the directory: empty, too, for a symbolic link and for what belongs neither to root nor
-// to this process's user.
-std::string readSmallFile(const char* path, std::size_t limit, Owner owner);
+// The same for a path that may not be a small regular file: does not block, reads at most `limit`
+// bytes, and returns false for other kinds of files. Owner::trusted, for directories that other users
+// can write to, also returns false for a symbolic link and for a file owned by another user than root
+// and that of this process.
+bool readSmallFile(const char* path, std::size_t limit, Owner owner, std::string& content);
 
 }  // namespace TERN::HA::Daemon

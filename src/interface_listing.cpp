@@ -10,7 +10,7 @@ namespace TERN::HA::Daemon {
 
 namespace {
 
-// Maps each counter's title to the index of its column.
+// Map the title of each counter to the index of its column.
 std::map<std::string, long long> columnsOf(const std::vector<std::string>& title) {
     std::map<std::string, long long> columns;
     long long index = 0;

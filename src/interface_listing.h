@@ -6,7 +6,7 @@
 
 namespace TERN::HA::Daemon {
 
-// What a listing of network interfaces tells of one of them.
+// The counters of an interface in a listing of network interfaces.
 struct InterfaceListing {
     enum class Outcome { READ, NO_TITLE, LINE_TOO_SHORT, OUT_OF_RANGE };
 
@@ -15,7 +15,7 @@ struct InterfaceListing {
     std::string token;                          // the counter that is OUT_OF_RANGE
 };
 
-// Reads a listing as `ifconfig -s` prints it, to its end unless the outcome is a failure.
+// Read a listing of `ifconfig -s`, to its end unless it fails.
 InterfaceListing readInterfaceListing(std::FILE* stream, const std::string& ifname);
 
 }  // namespace TERN::HA::Daemon

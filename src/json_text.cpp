@@ -2,8 +2,8 @@
 
 namespace TERN::HA::Daemon {
 
-// jsoncpp calls both classes deprecated in favour of builders that read their settings from a map on every
-// use and accept other texts.
+// jsoncpp calls both classes deprecated in favour of builders that read their settings from a map
+// on every use and accept other texts.
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wdeprecated-declarations"
 

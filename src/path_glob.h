@@ -4,7 +4,7 @@
 
 namespace TERN::HA::Daemon {
 
-// The paths that match a pattern, sorted.
+// The sorted paths that match a pattern.
 class PathGlob {
  public:
     explicit PathGlob(const char* pattern) : _paths(), _matched(glob64(pattern, 0, nullptr, &_paths) == 0) {}

@@ -50,9 +50,8 @@ class Connection {
     int _fd;
 };
 
-// One send. The other side may have gone, which must not end the process and is not the business of the
-// host's own handling of SIGPIPE: the signal is held back in this thread and taken back if this send raised
-// it.
+// Send once. SIGPIPE from a closed connection must neither end the process nor reach the host's
+// handler: block it in this thread, and consume it if this send raised it.
 ssize_t sendText(int fd, const std::string& text) {
     sigset_t pipeSignal = {};
     sigset_t pending = {};

@@ -10,11 +10,11 @@ namespace TERN::HA::Daemon {
 
 using Line = std::array<char, 512>;
 
-// The next line of `stream`, or the next 511 bytes of a longer one, with its newline; empty at the end. Like
-// fgets, for which a signal would be the end.
+// Return the next line of `stream` with its newline, at most 511 bytes of it; empty at the end. Unlike
+// fgets, it continues after an interruption.
 std::string_view readLine(std::FILE* stream, Line& line);
 
-// The words between blanks. Not by a stream, which would take a lack of memory for the end of the line.
+// Split at blanks. A stream would treat an allocation failure as the end of the line.
 std::vector<std::string> split(std::string_view line);
 
 bool startsWith(std::string_view text, std::string_view prefix);

@@ -16,7 +16,7 @@ constexpr char PACKAGE_CONFIG[] = "/usr/tern/etc/packages/FailoverPair/ha.conf";
 constexpr char DISK_TABLE[] = "/tmp/ha/info_hd.remote";
 constexpr std::size_t DISK_TABLE_LIMIT = 1048576;
 
-// The peer's disks, a JSON object by position; null when there is none.
+// Return the disk table, a JSON object by position; null when it is missing.
 Json::Value readDiskTable() {
     Json::Value table;
     if (!PLATFileExist(DISK_TABLE)) {
@@ -29,7 +29,8 @@ Json::Value readDiskTable() {
     return table.isObject() ? table : Json::Value();
 }
 
-// What a user calls the disk at `position`: a slot of the main unit (M or 0-M) or of an enclosure (N-M).
+// Return the human-readable name of the disk at `position`: a slot of the main unit (M or 0-M) or of
+// an enclosure (N-M).
 std::string readableName(const std::string& position, const std::string& container) {
     const std::size_t dash = position.find('-');
     if (dash == std::string::npos) {
@@ -57,7 +58,7 @@ std::vector<std::string> devListToHumanReadable(const std::vector<std::string>& 
     if (table.empty()) {
         return devices;
     }
-    // Every device is looked for in all entries: what they say is read once.
+    // Convert the entries once: every device is compared with all of them.
     struct Disk {
         std::string device;
         std::string name;
