@@ -1,4 +1,4 @@
-"""Runs the lab: two emulated nodes and what happens to them."""
+"""Run the lab: two emulated nodes and a scenario."""
 
 import argparse
 import fcntl
@@ -104,7 +104,7 @@ def report(failure: Exception, consoles: Consoles):
 
 
 def leave_up(lab: Lab):
-    """Waits for Ctrl-C; the command channels are free meanwhile."""
+    """Wait for Ctrl-C with the command channels free."""
     print("Both nodes stay up until Ctrl-C. Look into them from another terminal, as in:")
     for node in lab.nodes:
         node.channel.close()

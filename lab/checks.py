@@ -1,4 +1,4 @@
-"""The checks of a run: a line for each that passes, the end of the run at the first that does not."""
+"""Checks of a scenario: print a line for each that passes, stop at the first that fails."""
 
 import time
 from typing import Any, Callable
@@ -24,7 +24,7 @@ class Checks:
         self._consoles.note(f"== {title}")
 
     def fact(self, text: str):
-        """Something worth knowing that nothing depends on."""
+        """Print information that is not checked."""
         self._line("      ", text)
 
     def that(self, what: str, holds: bool, expected: Any, seen: Any):

@@ -1,4 +1,4 @@
-"""The consoles of both nodes in one file, line by line as they come."""
+"""Collect the consoles of both nodes in one file, line by line."""
 
 import socket
 import threading
@@ -23,12 +23,12 @@ class Consoles:
         self._tails: dict[str, deque[str]] = {}
 
     def follow(self, name: str, console: socket.socket):
-        """Writes down what comes from a node's console, until its emulator has ended."""
+        """Copy a node's console until its emulator exits."""
         self._tails[name] = deque(maxlen=TAIL)
         threading.Thread(target=self._follow, args=(name, console), daemon=True).start()
 
     def note(self, text: str):
-        """Writes down what the scenario does, to go with what the nodes say."""
+        """Add a line of the scenario."""
         self._write(f"-- {text}")
 
     def tail(self) -> str:

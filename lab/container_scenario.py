@@ -1,11 +1,11 @@
-"""What the service must do on a node, from installation to purge."""
+"""The scenes of the service, from installation to purge."""
 
 import re
 import socket
 
 import service
 from checks import Checks
-from containers import THIRD_HOST, Pair
+from containers import THIRD_HOST, Containers
 from node import Node
 from service_scenes import RETURN_LIMIT, hung_thread, kill, reload, stop, unknown_request, upgrade
 
@@ -16,7 +16,7 @@ PRIVATE_PROC = "BindPaths=/run/proc:/proc"
 FIREWALL = "nft list chain inet ternha input"
 
 
-def run(pair: Pair, checks: Checks):
+def run(pair: Containers, checks: Checks):
     install(pair, checks)
     start(pair, checks)
     sandbox(pair, checks)
@@ -33,7 +33,7 @@ def run(pair: Pair, checks: Checks):
     remove(pair, checks)
 
 
-def install(pair: Pair, checks: Checks):
+def install(pair: Containers, checks: Checks):
     checks.scene("apt installs the packages of the version before")
     pair.run("apt-get install --quiet --yes /packages/old/*.deb", 120)
     checks.equal("nothing is enabled", ["disabled\ndisabled\n"] * 2,
@@ -46,7 +46,7 @@ def install(pair: Pair, checks: Checks):
     pair.a.run("systemctl reset-failed ternhad")
 
 
-def start(pair: Pair, checks: Checks):
+def start(pair: Containers, checks: Checks):
     checks.scene("Configured and enabled, both nodes find each other")
     for node, peer in (pair.nodes, pair.nodes[::-1]):
         service.configure(node, peer, "eth1")
@@ -57,7 +57,7 @@ def start(pair: Pair, checks: Checks):
     checks.within(RETURN_LIMIT, "both say alive", pair.statuses, [ALIVE] * 2)
 
 
-def sandbox(pair: Pair, checks: Checks):
+def sandbox(pair: Containers, checks: Checks):
     checks.scene("Inside the service's sandbox")
 
     def is_measured(record):
@@ -78,7 +78,7 @@ def sandbox(pair: Pair, checks: Checks):
     checks.equal("nothing that is there has failed", [], failures)
 
 
-def firewall(pair: Pair, checks: Checks):
+def firewall(pair: Containers, checks: Checks):
     checks.scene("The firewall lets the peer in, and nobody else")
     third = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
     third.bind((THIRD_HOST, 0))
@@ -117,7 +117,7 @@ def private_proc(node: Node, command: str):
     )
 
 
-def reboot_trigger(pair: Pair, checks: Checks):
+def reboot_trigger(pair: Containers, checks: Checks):
     checks.scene("node-a asks node-b to reboot")
     private_proc(pair.b, "touch sysrq-trigger")
     service.override(pair.b, PRIVATE_PROC)
@@ -132,7 +132,7 @@ def reboot_trigger(pair: Pair, checks: Checks):
     checks.within(RETURN_LIMIT, "both say alive", pair.statuses, [ALIVE] * 2)
 
 
-def wrong_options(pair: Pair, checks: Checks):
+def wrong_options(pair: Containers, checks: Checks):
     checks.scene("Wrong options are not retried")
     before = service.restarts(pair.b)
     pair.b.run(f"cp {service.FILE} /run/right && sed -i 's/^remote-ip = .*/remote-ip = somewhere/' {service.FILE}")
@@ -145,7 +145,7 @@ def wrong_options(pair: Pair, checks: Checks):
     checks.within(RETURN_LIMIT, "with right ones again both say alive", pair.statuses, [ALIVE] * 2)
 
 
-def remove(pair: Pair, checks: Checks):
+def remove(pair: Containers, checks: Checks):
     checks.scene("apt removes and purges the packages of node-b")
     packages = " ".join(service.PACKAGES)
     pair.b.run(f"apt-get remove --quiet --yes {packages}", 120)

@@ -1,4 +1,4 @@
-"""The containers: systemd as the first process over a bare Debian system, and the network between them."""
+"""Two containers with systemd over a bare Debian system, and the link between them."""
 
 import os
 import socket
@@ -9,6 +9,7 @@ from pathlib import Path
 from consoles import Consoles
 from failure import LabError
 from node import COMMAND_LIMIT, Node
+from node_pair import NodePair
 
 BOOT_LIMIT = 60  # seconds
 END_LIMIT = 10
@@ -17,7 +18,7 @@ THIRD_HOST = "10.11.0.9"
 
 
 class Shell:
-    """Runs scripts in a container."""
+    """Run scripts in a container."""
 
     def __init__(self, name: str, leader: int):
         self._name = name
@@ -38,54 +39,26 @@ class Shell:
         )
 
     def finish(self, started: subprocess.Popen, limit: float = COMMAND_LIMIT) -> tuple[int, str]:
-        """The exit code and the output, standard error included, of a script that was started."""
+        """Wait for a script; return its exit code and output, including standard error."""
         try:
             output, _ = started.communicate(timeout=limit)
         except subprocess.TimeoutExpired:
             started.kill()
-            raise LabError(f"{self._name} did not answer in time") from None
+            raise LabError(f"{self._name} did not reply in time") from None
         return started.returncode, output
 
 
-class Pair:
-    """Two running containers, from their start to the end of the block. In a network and a mount namespace of
-    this process."""
+class Containers(NodePair):
+    """Two running containers, in network and mount namespaces of this process."""
 
     def __init__(self, root: str, packages: Path, consoles: Consoles):
-        """`packages` is made /packages in both."""
+        """`packages` becomes /packages in both."""
+        super().__init__()
         self._root = root
         self._packages = packages
         self._consoles = consoles
         self._group = GROUPS / f"ternha-containers.{os.getpid()}"
         self._processes: list[subprocess.Popen] = []
-        self.nodes: list[Node] = []
-
-    def __enter__(self):
-        try:
-            self._start()
-        except BaseException:
-            self._end()
-            raise
-        return self
-
-    def __exit__(self, *_):
-        self._end()
-
-    @property
-    def a(self) -> Node:
-        return self.nodes[0]
-
-    @property
-    def b(self) -> Node:
-        return self.nodes[1]
-
-    def run(self, script: str, limit: float = COMMAND_LIMIT) -> list[str]:
-        """What the script prints on each node; they run it at the same time."""
-        started = [(node, node.channel.start(script)) for node in self.nodes]
-        return [node.result(script, process, limit) for node, process in started]
-
-    def statuses(self) -> list[dict]:
-        return [node.status() for node in self.nodes]
 
     def _start(self):
         host("mount", "-t", "tmpfs", "tmpfs", "/run")
@@ -122,7 +95,7 @@ class Pair:
             f"--network-namespace-path=/run/netns/{node}", "--capability=CAP_NET_ADMIN", f"--bind-ro={self._packages}:/packages", "--setenv=TERM=dumb", "--boot",
             "systemd.journald.forward_to_console=1", "systemd.mask=console-getty.service",
         ]
-        # A group of its own: Ctrl-C is for this process.
+        # Its own process group: Ctrl-C must reach only this process.
         self._processes.append(subprocess.Popen(
             command,
             stdin=subprocess.DEVNULL,
@@ -159,7 +132,7 @@ def host(*command: str):
 
 
 def wait_until_ready(name: str, readiness: socket.socket) -> int:
-    """The process id of the container's first process, once that has started all that it starts at boot."""
+    """Wait until the container has booted and return the pid of its init."""
     leader = 0
     deadline = time.monotonic() + BOOT_LIMIT
     while True:
@@ -176,7 +149,7 @@ def wait_until_ready(name: str, readiness: socket.socket) -> int:
 
 
 def hide_trigger(node: Node):
-    """A write to the trigger would restart this machine: it is read-only in a container, and now a plain file."""
+    """Mount a plain file over the trigger, which would reboot this machine (and is read-only here)."""
     node.run(
         "[ ! -e /proc/sysrq-trigger ] || { touch /run/no-trigger && mount --bind /run/no-trigger /proc/sysrq-trigger"
         " && grep -q 'tmpfs /proc/sysrq-trigger tmpfs' /proc/mounts; }"

@@ -12,7 +12,7 @@ PROMPT = 10  # seconds within which an emulator answers
 
 
 class Emulator:
-    """A running emulator, controlled by the QEMU Machine Protocol. It dies with this process."""
+    """A running emulator, controlled by the QEMU Machine Protocol. It is killed with this process."""
 
     def __init__(
         self,
@@ -49,7 +49,7 @@ class Emulator:
         for serial, image in disks.items():
             command += ["-drive", f"if=none,id={serial},file={image},format=raw,cache=unsafe"]
             command += ["-device", f"virtio-blk-device,drive={serial},serial={serial}"]
-        # In a process group of its own: Ctrl-C is for this process, which ends the emulator in its turn.
+        # Its own process group: Ctrl-C must reach only this process, which stops the emulator.
         self._process = subprocess.Popen(
             command,
             stdin=subprocess.DEVNULL,
@@ -68,7 +68,7 @@ class Emulator:
         return self._process.pid
 
     def execute(self, command: str, **arguments):
-        """Runs a command of the protocol and returns its result."""
+        """Run a command of the protocol and return its result."""
         request = {"execute": command, "arguments": arguments}
         self._control.sendall(json.dumps(request).encode() + b"\n")
         while True:
@@ -80,12 +80,12 @@ class Emulator:
             self._events.append(message)
 
     def events(self, name: str) -> list[dict]:
-        """The events of this name that have come so far, each with its data and its time."""
+        """Return the events of this name so far, each with its data and time."""
         self.execute("query-status")  # what came before the answer has been read
         return [event for event in self._events if event["event"] == name]
 
     def set_link(self, up: bool):
-        """Plugs the network cable in or out: the machine sees its carrier change."""
+        """Set the carrier of the network interface."""
         self.execute("set_link", name="link", up=up)
 
     def freeze(self):

@@ -1,12 +1,12 @@
-"""The ways in which a run may fail."""
+"""Failures of a run."""
 
 
 class LabError(Exception):
-    """The lab itself cannot go on: its message says why."""
+    """The lab itself failed."""
 
 
 class CheckFailed(Exception):
-    """Something did not happen as it should have."""
+    """A check failed."""
 
     def __init__(self, what: str, expected: str, seen: str):
         super().__init__(what)

@@ -1,4 +1,4 @@
-"""What a node boots: a kernel, and a file system that is unpacked into its memory."""
+"""The images of a node: kernel and initramfs."""
 
 import gzip
 import hashlib
@@ -11,7 +11,7 @@ from failure import LabError
 GUEST = Path(__file__).parent / "guest"
 LIBRARIES = "usr/lib/arm-linux-gnueabihf"
 
-# The commands of the system itself, which busybox provides; what ternhad and the checks call is Debian's own.
+# Commands provided by busybox; programs that ternhad and the checks call are Debian's.
 APPLETS = """
     base64 cat chmod cp date dd dmesg echo grep head hostname id insmod ip kill ln ls mkdir mount mv pidof printf
     readlink rm sed sleep sort sync tail test touch true umount uname uptime wc
@@ -38,7 +38,7 @@ MODULES = [
 
 
 class Archive:
-    """A cpio archive, in the form that the kernel unpacks; all in it belongs to root."""
+    """A cpio archive for the kernel; root owns all files."""
 
     def __init__(self):
         self._data = bytearray()
@@ -83,7 +83,7 @@ def kernel(packages: Path) -> Path:
 
 
 def system(packages: Path, cache: Path) -> bytes:
-    """The compressed archive of all but the programs under test; made again when something in it has changed."""
+    """Return the compressed archive of all but the programs under test; rebuilt after changes."""
     digest = hashlib.sha256()
     for source in [Path(__file__), packages / "complete", *sorted(GUEST.iterdir())]:
         digest.update(source.read_bytes())
@@ -96,7 +96,7 @@ def system(packages: Path, cache: Path) -> bytes:
 
 
 def programs(build: Path) -> bytes:
-    """The compressed archive of the programs under test, and of the tool that goes with them."""
+    """Return the compressed archive of the programs under test and the lab tool."""
     archive = Archive()
     for source, target in {
         "daemon/ternhad": "usr/sbin/ternhad",
@@ -148,7 +148,7 @@ def _add_libraries(archive: Archive, packages: Path):
 
 
 def _add_modules(archive: Archive, packages: Path):
-    """Adds the modules with those that they need, and the list of their paths in the order of loading."""
+    """Add the modules with their dependencies, and the list of their paths in load order."""
     files = {path.stem.replace("-", "_"): path for path in packages.glob("kernel/lib/modules/**/*.ko")}
     order: list[str] = []
 

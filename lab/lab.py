@@ -1,4 +1,4 @@
-"""Both nodes, and the link between them."""
+"""Two emulated machines and the link between them."""
 
 import os
 import shutil
@@ -11,7 +11,8 @@ from pathlib import Path
 from consoles import Consoles
 from emulator import Emulator
 from failure import LabError
-from node import STATUS, Channel, Node, parse_status
+from node import Channel, Node
+from node_pair import NodePair
 
 MIB = 1024 * 1024
 DISKS = {"log": 16 * MIB, "drbd": 24 * MIB, "md0": 12 * MIB, "md1": 12 * MIB}  # by serial number
@@ -19,44 +20,17 @@ BOOT_LIMIT = 60  # seconds
 INTERRUPTIONS = (signal.SIGINT, signal.SIGTERM, signal.SIGHUP)
 
 
-class Lab:
-    """Two running nodes, from their start to the end of the block; nothing of them is left behind."""
+class Lab(NodePair):
+    """Two emulated machines; leaves nothing behind."""
 
     def __init__(self, kernel: Path, archive: bytes, consoles: Consoles):
-        """`archive` holds the file system that the kernel unpacks."""
+        """`archive` is the initramfs."""
+        super().__init__()
         self._kernel = kernel
         self._archive = archive
         self._consoles = consoles
         self.directory = Path()
         self._emulators: list[Emulator] = []
-        self.nodes: list[Node] = []
-
-    def __enter__(self):
-        try:
-            self._start()
-        except BaseException:
-            self._end()
-            raise
-        return self
-
-    def __exit__(self, *_):
-        self._end()
-
-    @property
-    def a(self) -> Node:
-        return self.nodes[0]
-
-    @property
-    def b(self) -> Node:
-        return self.nodes[1]
-
-    def run(self, script: str) -> list[str]:
-        """What the script prints on each node; they run it at the same time."""
-        started = [(node, node.channel.start(script)) for node in self.nodes]
-        return [node.result(script, script_id) for node, script_id in started]
-
-    def statuses(self) -> list[dict]:
-        return [parse_status(output) for output in self.run(STATUS)]
 
     def set_link(self, up: bool):
         for node in self.nodes:
@@ -102,7 +76,7 @@ class Lab:
 
 
 def _link() -> list[socket.socket]:
-    """The two ends of a network cable: datagram sockets on this machine, on ports that the kernel found free."""
+    """The ends of a virtual cable: connected UDP sockets on the loopback interface, on free ports."""
     ends = [socket.socket(socket.AF_INET, socket.SOCK_DGRAM) for _ in range(2)]
     for end in ends:
         end.bind(("127.0.0.1", 0))

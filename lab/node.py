@@ -1,4 +1,4 @@
-"""A node as the scenario sees it: commands that run on it, and what they tell."""
+"""A node: runs commands and reads its state."""
 
 import base64
 import json
@@ -13,7 +13,7 @@ COMMAND_LIMIT = 30  # seconds, unless a command says otherwise
 
 
 class Channel:
-    """Runs scripts on a machine through its command channel, which goes on over a reboot."""
+    """Run scripts on a machine through its command channel, which survives a reboot."""
 
     def __init__(self, name: str, path: Path):
         self._name = name
@@ -27,7 +27,7 @@ class Channel:
         self._boot_ids: deque[str] = deque()
 
     def wait_for_boot(self, limit: float) -> str:
-        """Waits until the machine has come up once more, and returns the id of that boot."""
+        """Wait for the next boot and return its id."""
         deadline = time.monotonic() + limit
         while not self._boot_ids:
             self._take_line(deadline, "come up")
@@ -44,10 +44,10 @@ class Channel:
         return self._last_id
 
     def finish(self, script_id: int, limit: float = COMMAND_LIMIT) -> tuple[int, str]:
-        """The exit code and the output, standard error included, of a script that was started."""
+        """Wait for a script; return its exit code and output, including standard error."""
         deadline = time.monotonic() + limit
         while True:
-            fields = self._take_line(deadline, "answer").split(" ")
+            fields = self._take_line(deadline, "reply").split(" ")
             if fields[0] == str(script_id) and len(fields) == 3:
                 return int(fields[1]), base64.b64decode(fields[2]).decode(errors="replace")
 
@@ -74,7 +74,7 @@ class Channel:
 
 
 class Node:
-    """One of the two machines."""
+    """One of the two nodes."""
 
     def __init__(self, name: str, address: str, emulator, channel: Channel):
         self.name = f"node-{name}"
@@ -90,7 +90,7 @@ class Node:
         self.boot_id = self.channel.wait_for_boot(limit)
 
     def run(self, script: str, limit: float = COMMAND_LIMIT) -> str:
-        """What the script prints; it must succeed."""
+        """Run the script, which must succeed, and return its output."""
         return self.result(script, self.channel.start(script), limit)
 
     def result(self, script: str, script_id: int, limit: float = COMMAND_LIMIT) -> str:
@@ -100,23 +100,23 @@ class Node:
         return output
 
     def try_run(self, script: str) -> tuple[int, str]:
-        """The exit code and the output of the script."""
+        """Run the script; return its exit code and output."""
         return self.channel.finish(self.channel.start(script))
 
     def status(self) -> dict:
-        """What ternhactl tells of the node's record."""
+        """Return the status record from ternhactl."""
         return parse_status(self.run(STATUS))
 
     def log(self) -> list[str]:
-        """The lines of the daemon log: those on disk, then those that are still buffered."""
+        """Return the daemon log: lines on disk, then buffered lines."""
         return self._read_log("")
 
     def full_log(self) -> list[str]:
-        """The lines of the daemon log with those of its archives."""
+        """Return the daemon log with its archives."""
         return self._read_log("for file in $(ls -rv ha.daemon.log.*.xz 2>/dev/null); do xz -dc $file; done;")
 
     def _read_log(self, archives: str) -> list[str]:
-        # Again when the daemon has moved lines meanwhile: they could be missing in what was read.
+        # Repeat if the daemon moved lines meanwhile: the read could miss them.
         return self.run(
             "cd /var/log/ha || exit 0; state() { stat --format=%i-%s ha.daemon.log 2>/dev/null; };"
             f" while before=$(state); text=$({archives} cat ha.daemon.log /tmp/ha/ha.daemon.log 2>/dev/null);"
@@ -127,22 +127,22 @@ class Node:
         return any(line.endswith(text) for line in self.log())
 
     def drbd_state(self) -> str:
-        """The connection state of the resource, such as Connected; empty when it is not set up."""
+        """Return the connection state of the resource, such as Connected; empty if it is down."""
         return parse_drbd_state(self.run("cat /proc/drbd"))
 
     def supervised(self) -> list[list[str]]:
-        """The supervisor's account: ["start", PID] and ["end", PID, EXIT-CODE]."""
+        """Return the log of the supervisor: ["start", PID] and ["end", PID, EXIT-CODE]."""
         return [line.split() for line in self.run("cat /run/lab/daemon").splitlines()]
 
     def hold_daemon(self):
-        """The supervisor will not start the daemon once it has ended."""
+        """Keep the supervisor from restarting the daemon."""
         self.run("touch /run/lab/hold")
 
     def release_daemon(self):
         self.run("rm -f /run/lab/hold")
 
 
-# A daemon that is being started, or killed, has no record for the moment.
+# A daemon that is starting or was killed has no status.
 STATUS = "ternhactl status --json 2>/dev/null || echo null"
 
 

@@ -1,4 +1,4 @@
-"""Debian packages of the nodes' machine: fetched once, then kept under build/lab."""
+"""Debian packages of the nodes, fetched once and kept under build/lab."""
 
 import shutil
 import subprocess
@@ -17,7 +17,7 @@ PACKAGES = [
 
 
 def unpacked(cache: Path) -> Path:
-    """The directory with a directory for each package, named after it; that of the kernel is "kernel"."""
+    """Return the directory that holds one per package; that of the kernel is named "kernel"."""
     root = cache / "packages"
     done = root / "complete"
     wanted = "\n".join([KERNEL, *PACKAGES]) + "\n"

@@ -15,7 +15,7 @@ SCRIPT = """
 
 
 def repack(package: Path, target: Path, revision: int):
-    """Makes the same package with another Debian revision."""
+    """Build the same package with another Debian revision."""
     command = ["sh", "-ec", SCRIPT, "repack", package, target, str(revision)]
     result = subprocess.run(command, capture_output=True, text=True, check=False)
     if result.returncode != 0:

@@ -1,4 +1,4 @@
-"""Runs the scenario of the service: run_containers.py ROOT PACKAGES, in namespaces of its own."""
+"""Run the scenario of the service: run_containers.py ROOT PACKAGES, in private namespaces."""
 
 import shutil
 import signal
@@ -10,7 +10,7 @@ from pathlib import Path
 import container_scenario
 from checks import Checks
 from consoles import Consoles
-from containers import Pair
+from containers import Containers
 from failure import CheckFailed, LabError
 from repack import repack
 from service import PACKAGES
@@ -30,7 +30,7 @@ def main() -> int:
     try:
         with tempfile.TemporaryDirectory(prefix="ternha-containers.") as directory:
             make_packages(built, Path(directory))
-            with Pair(root, Path(directory), consoles) as pair:
+            with Containers(root, Path(directory), consoles) as pair:
                 container_scenario.run(pair, checks)
     except CheckFailed as failure:
         failed = True
@@ -48,7 +48,7 @@ def main() -> int:
 
 
 def make_packages(built: Path, directory: Path):
-    """The packages in `new`, and in `old` the same with a lower version."""
+    """Copy the packages to `new`, and with a lower version to `old`."""
     for age in ("new", "old"):
         (directory / age).mkdir()
     for name in PACKAGES:

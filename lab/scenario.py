@@ -1,4 +1,4 @@
-"""What happens to the two nodes, and what must be seen of it."""
+"""The scenes of the lab and their checks."""
 
 import base64
 import json
@@ -166,7 +166,7 @@ def md_actions(lab: Lab, checks: Checks):
 
 
 def resync_begin(node: Node) -> float:
-    """When md began its latest resync, by this machine's clock; the node's own program takes a while to end."""
+    """Return when md began its latest resync, on this machine's clock."""
     message, uptime = node.run(
         "dmesg | grep 'md: resync of RAID array md0' | tail -n 1; cat /proc/uptime"
     ).splitlines()
@@ -187,7 +187,7 @@ def check_uncounted(lab: Lab, checks: Checks, action: str):
 
 
 def check_snapshot(node: Node, checks: Checks, flag: str):
-    """A snapshot begins with the record in which the flag is set."""
+    """Whether a snapshot begins with a record in which the flag is set."""
     parts = [
         rf'^\{{.*"{flag}":true.*\}}$',
         r"^ *\d+ .* ternhad --config",
@@ -331,7 +331,7 @@ def reboot_peer(lab: Lab, checks: Checks):
     before = lab.b.log()
     checks.equal("but in its log", expected, lab_lines(before))
 
-    # The three at once: the node is up again soon.
+    # All three at once: the node boots quickly.
     order, rebooting, record = lab.a.run(
         "ternhactl reboot-peer --yes | tail -n 1; ternhactl rebooting || true; ternhactl status --json", 45
     ).splitlines()
@@ -388,7 +388,7 @@ def without_pids(entries: list[list[str]]) -> list[list[str]]:
 
 
 def memory(node: Node) -> tuple[int, int]:
-    """The resident memory of the daemon and the anonymous part of it, KiB."""
+    """Return the resident and the anonymous memory of the daemon in KiB."""
     fields = dict(
         line.split(":", 1) for line in node.run("cat /proc/$(cat /run/lab/pid)/status").splitlines()
     )
@@ -396,7 +396,7 @@ def memory(node: Node) -> tuple[int, int]:
 
 
 def processor_use(lab: Lab) -> list[tuple[float, float]]:
-    """For each node the processor's time, in seconds, that the daemon and its ended children have taken."""
+    """Return the processor time of the daemon and its children on each node, in seconds."""
     outputs = lab.run("cat /proc/$(cat /run/lab/pid)/stat")
     times = [list(map(int, output.rpartition(")")[2].split()[11:15])) for output in outputs]
     return [((user + system) / TICKS, (c_user + c_system) / TICKS) for user, system, c_user, c_system in times]
@@ -407,13 +407,13 @@ def drbd_states(lab: Lab) -> list[str]:
 
 
 def drbd_disks(lab: Lab) -> list[str]:
-    """For each node the states of its own and the peer's disk, while Connected."""
+    """Return the local and the peer disk states of each node while Connected."""
     found = [re.search(r"cs:Connected .* ds:(\S+)", output) for output in lab.run("cat /proc/drbd")]
     return [match.group(1) if match else "" for match in found]
 
 
 def connected_during_state(lab: Lab) -> list[tuple[str, bool]]:
-    """For each node the DRBD state that held before and after it was asked, and whether it said connected."""
+    """Return for each node the DRBD state before and after the query, and whether it reported connected."""
     looks = []
     for output in lab.run("grep cs: /proc/drbd; ternhactl status --json; grep cs: /proc/drbd"):
         before, record, after = output.splitlines()
@@ -428,5 +428,5 @@ def last_change(node: Node) -> str:
 
 
 def lab_lines(lines: list[str]) -> list[str]:
-    """The lines that the lab's own tool has logged, without their times."""
+    """Return the lines logged by the lab tool, without time stamps."""
     return [line.split(" ", 1)[1] for line in lines if " lab line " in line]

@@ -1,4 +1,4 @@
-"""The daemon as a service of a node: what systemd knows of it."""
+"""The daemon as a systemd service of a node."""
 
 from pathlib import Path
 
@@ -10,7 +10,7 @@ PACKAGES = ["libterncore6", "libternhadaemon6", "ternhad"]
 
 
 def configure(node: Node, peer: Node, interface: str):
-    """Edits the configuration as an administrator does."""
+    """Edit the configuration as an administrator does."""
     values = {"local-ip": node.address, "remote-ip": peer.address, "interface": interface}
     node.run("sed -i " + " ".join(f"-e 's/^#{key} = .*/{key} = {value}/'" for key, value in values.items()) + f" {FILE}")
 
@@ -30,7 +30,7 @@ def pid(node: Node) -> int:
 
 
 def restarts(node: Node) -> int:
-    """How often systemd has started the daemon again by itself."""
+    """Return the number of automatic restarts."""
     return int(properties(node, "NRestarts")[0])
 
 
@@ -39,18 +39,18 @@ def starts(node: Node) -> int:
 
 
 def ends(node: Node) -> list[str]:
-    """How the daemon's main process has ended, each time that systemd calls a failure."""
+    """Return how the main process ended in each failure."""
     lines = node.run("journalctl --unit=ternhad --output=cat | grep 'Main process exited' || true").splitlines()
     return [line.partition("exited, ")[2] for line in lines]
 
 
 def override(node: Node, *settings: str):
-    """Puts settings of the service above those of its unit, or takes them away again."""
+    """Add a drop-in to the unit, or remove it."""
     lines = "\\n".join(["[Service]", *settings])
     edit = f"mkdir -p {Path(DROP_IN).parent} && printf '{lines}\\n' >{DROP_IN}" if settings else f"rm -f {DROP_IN}"
     node.run(f"{edit} && systemctl daemon-reload")
 
 
 def times_dead(node: Node) -> int:
-    """How often the node has declared its peer dead."""
+    """Return how often the node declared its peer dead."""
     return sum(line.endswith("Remote server status changed to dead") for line in node.full_log())

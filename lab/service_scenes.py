@@ -1,4 +1,4 @@
-"""Scenes of the daemon as a service, on whatever nodes."""
+"""Scenes of the daemon as a service, for any kind of nodes."""
 
 import time
 
@@ -27,7 +27,7 @@ def unknown_request(lab, checks: Checks, well: dict):
 
 
 def hung_thread(lab, checks: Checks, well: dict, setting: str):
-    """`setting` puts a FIFO in the place of /proc/drbd for the service: opening it waits for a writer."""
+    """`setting` replaces /proc/drbd by a FIFO for the service: open() blocks until a writer comes."""
     checks.scene("A thread of node-b's daemon hangs")
     times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
     service.override(lab.b, "WatchdogSec=10", setting)
@@ -84,12 +84,12 @@ def installed_version(node) -> str:
 
 
 def send(lab, request: str):
-    """A datagram from node-a to the port of node-b."""
+    """Send a datagram from node-a to the port of node-b."""
     lab.a.run(f"bash -c 'printf {request} >/dev/udp/{lab.b.address}/7499'")
 
 
 def check_restarted(lab, checks: Checks, ends: list[str], well: dict):
-    """The daemon of node-b ends in the last of these ways, or has done so, and another is at work."""
+    """Check that the daemon of node-b failed in the last of these ways and was restarted."""
     checks.within(
         RETURN_LIMIT,
         f"it ends ({ends[-1].rpartition('/')[2]}) and another is started",

@@ -1,4 +1,4 @@
-"""Puts node a under pressure, and counts the false positives of both nodes and the delay of true ones."""
+"""Put node a under pressure; count false positives of both nodes and measure detection times."""
 
 import argparse
 import os
@@ -41,7 +41,7 @@ while True:
 
 
 class Control:
-    """A control group of node a, with the given controller and limits."""
+    """A control group of node a with the given controller and limits."""
 
     def __init__(self, controller, limits):
         self.path = Path(f"/sys/fs/cgroup/{controller}/ternha-pressure")
@@ -82,26 +82,24 @@ def real_time(watchers):
     yield
 
 
-def hog_in(watchers, group, script):
-    """Runs `script` in a control group with node a's programs."""
+def hog(watchers, group, program):
+    """Run `program` in the control group of node a's programs."""
     node = watchers.cluster.a
-    try:
-        for name in watchers.on_a:
-            group.add(node.pid(name))
-        hog = node.start("hog", "python3", "-c", script, stdin=subprocess.PIPE)
-        Path(f"/proc/{hog.pid}/oom_score_adj").write_text("1000")
-        group.add(hog.pid)
-        hog.stdin.write(b"\n")
-        hog.stdin.flush()
-        yield
-    finally:
-        node.kill([name for name in ("hog",) if name in node.processes])
-        group.end()
+    for name in watchers.on_a:
+        group.add(node.pid(name))
+    node.start("hog", "python3", "-c", program, stdin=subprocess.PIPE)
+    Path(f"/proc/{node.pid('hog')}/oom_score_adj").write_text("1000")
+    group.add(node.pid("hog"))
+    node.processes["hog"].stdin.write(b"\n")
+    node.processes["hog"].stdin.flush()
+    yield
+    node.kill(["hog"])
+    group.end()
 
 
 def fork_storm(watchers):
     """fork storm at a limit of processes"""
-    return hog_in(watchers, Control("pids", [(["pids.max"], 80)]), FORKS)
+    yield from hog(watchers, Control("pids", [(["pids.max"], 80)]), FORKS)
 
 
 def descriptors(watchers):
@@ -123,31 +121,7 @@ def descriptors(watchers):
 def memory(watchers):
     """memory cgroup thrashed"""
     limit = (["memory.limit_in_bytes", "memory.max"], 80 << 20)
-    return hog_in(watchers, Control("memory", [limit]), THRASH)
-
-
-def clock_steps(watchers):
-    """wall clock of node a's programs an hour forward and back, each second"""
-    node = watchers.cluster.a
-    node.prefix = ["env", f"LD_PRELOAD={PROGRAMS}/stepped_clock.so"]
-    restart(watchers)
-    node.prefix = []
-    watchers.wait_until_alive()
-    step = "while :; do touch /run/stepped-clock; sleep 1; rm /run/stepped-clock; sleep 1; done"
-    node.start("steps", "sh", "-c", step)
-    try:
-        yield
-    finally:
-        node.kill(["steps"])
-        node.path("/run/stepped-clock").unlink(missing_ok=True)
-        restart(watchers)
-
-
-def restart(watchers):
-    """Restarts node a's programs."""
-    for watcher in watchers.on_a.values():
-        watcher.end()
-    watchers.start("a")
+    yield from hog(watchers, Control("memory", [limit]), THRASH)
 
 
 def on_a_disk_of_its_own(watchers, directory, sicken, heal):
