@@ -1,4 +1,4 @@
-// The smallest host daemon: host LOCAL-IP REMOTE-IP INTERFACE SOCKET. /tmp/ha and /var/log/ha must exist.
+// A minimal host daemon: host LOCAL-IP REMOTE-IP INTERFACE SOCKET. Needs /tmp/ha and /var/log/ha.
 #include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -27,7 +27,7 @@ int main(int argc, char** argv) {
     if (argc != 5) {
         return 2;
     }
-    umask(S_IRWXG | S_IRWXO);  // logs and control socket are for this user alone
+    umask(S_IRWXG | S_IRWXO);  // logs and control socket are private to this user
     openlog("host", LOG_PID, LOG_DAEMON);
     localIP(argv[1]);
     remoteIP(argv[2]);
@@ -36,18 +36,18 @@ int main(int argc, char** argv) {
     sigset_t stop;
     sigemptyset(&stop);
     sigaddset(&stop, SIGTERM);
-    pthread_sigmask(SIG_BLOCK, &stop, nullptr);  // inherited by the threads: only this one takes it
+    pthread_sigmask(SIG_BLOCK, &stop, nullptr);  // threads inherit the mask: sigtimedwait() receives it
 
     Status status;
     MonitordSocket control(argv[4], 0);
     control.setStatus(&status);
     if (!control.serverBind()) {
-        return 1;  // the system log tells why
+        return 1;  // see the system log
     }
     std::thread([&status] {
         while (SocketServer()(status)) {
         }
-        _exit(1);  // the daemon log tells why
+        _exit(1);  // see the daemon log
     }).detach();
     std::thread([&control] {
         for (;;) {
@@ -69,5 +69,5 @@ int main(int argc, char** argv) {
     }
     HA_LOG("Stopping");
     daemonLog->writeLogToDisk();
-    _exit(0);  // at once, under threads that may wait for long and use what a return would destroy
+    _exit(0);  // immediately: running threads still use what a return would destroy
 }
