@@ -24,7 +24,7 @@ namespace {
 
 constexpr std::size_t PIECE = 65536;
 
-// The value of a call that must not fail.
+// Return the result of a call that must not fail.
 template <class T>
 T must(T value) {
     if (value < 0) {

@@ -4,44 +4,44 @@
 #include <string>
 #include <vector>
 
-// The shortest plain programs with the same effect on the kernel as the operation they stand beside. Failures
-// end the process: a baseline that does less is none.
+// Baselines: minimal code with the same system calls as an operation of the library. Failures end
+// the process, so that a baseline never does less.
 namespace baseline {
 
-// Asks the clock, appends `line` to the file at `path`.
+// Read the clock and append `line` to the file at `path`.
 void appendLine(const char* path, const std::string& line);
 
-// Appends the lines of one file to another, each with one write, and empties it.
+// Append the lines of one file to another, each with one write, and truncate it.
 void moveLines(const char* from, const char* to);
 
-// Asks 127.0.0.1:`port` one question, and waits for the answer.
+// Send a request to 127.0.0.1:`port` and wait for the reply.
 void askPeer(int port, const char* question);
 
 // A datagram socket bound to 127.0.0.1:`port`.
 int peerSocket(int port);
 
-// Receives one question on the socket and answers it.
+// Receive a request on the socket and reply.
 void answerPeer(int socket, const char* answer);
 
 // A stream socket that listens at `path`.
 int controlSocket(const char* path);
 
-// Sends `request` over a connection to `path` and reads the reply.
+// Send `request` over a connection to `path` and reads the reply.
 void askControl(const char* path, const std::string& request);
 
-// Accepts one connection, reads its request and sends `reply`.
+// Accept a connection, read its request and send `reply`.
 void answerControl(int socket, const std::string& reply);
 
-// Reads the file and looks for the thirteen words.
+// Read the file and search for the thirteen states.
 bool containsAny(const char* path, const std::vector<std::string>& words);
 
-// Reads `member` in each directory that matches `pattern`.
+// Read `member` in each directory that matches `pattern`.
 void readEach(const char* pattern, const char* member);
 
-// Starts /bin/true, with its output in a pipe, and waits for its end.
+// Start /bin/true with a pipe and wait for it.
 void runTrue();
 
-// Reads the whole file.
+// Read the whole file.
 std::string readAll(const char* path);
 
 }  // namespace baseline

@@ -1,5 +1,5 @@
-// Operations of the library, each beside its baseline, and how their cost grows. script/bench runs
-// this in a private root and makes the table.
+// Operations of the library beside their baselines, and their growth. script/bench runs this in a
+// sandbox and prints the table.
 #include <arpa/inet.h>
 #include <benchmark/benchmark.h>
 #include <json/json.h>
@@ -47,7 +47,7 @@ Status& status() {
     return instance;
 }
 
-// Written as the control socket writes its replies.
+// Formatted like replies of the control socket.
 std::string textOf(Status& record) {
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wdeprecated-declarations"
@@ -91,8 +91,8 @@ DaemonLog& benchLog() {
 const std::string LINE_TEXT(100, 'x');
 const std::string STAMPED_LINE = "2026-11-15T09:23:41+01:00 " + LINE_TEXT + "\n";
 
-// The two ends of an exchange stay on one processor each, as two nodes or two busy programs would:
-// otherwise chance decides whether they share one, which is eight times faster.
+// Pin both ends of an exchange to different processors: sharing one, by chance, is eight times
+// faster.
 void stayOn(std::size_t processor) {
     cpu_set_t set;
     CPU_ZERO(&set);
@@ -106,7 +106,7 @@ void stayAnywhere() {
     sched_setaffinity(0, sizeof set, &set);
 }
 
-// For as long as the process lives.
+// Never freed.
 void inBackground(std::function<void()> pass) {
     std::thread([pass = std::move(pass)] {
         stayOn(1);
@@ -265,7 +265,7 @@ void measure(benchmark::State& state, const Operation& operation, const std::fun
     }
 }
 
-// How long toJson takes while `writers` threads change what it reads.
+// Measure toJson while `writers` threads modify the record.
 void measureContention(benchmark::State& state) {
     stayAnywhere();
     std::atomic<bool> isOver{false};
@@ -297,7 +297,7 @@ void growSet(benchmark::State& state) {
     }
 }
 
-// A question that waits in the socket already, one pass of the server, and the answer.
+// A queued request, one server pass, and the reply.
 void growPass(benchmark::State& state) {
     localIP("127.0.0.1");
     auto& registry = *CheckerFactory::opMap;
@@ -312,7 +312,7 @@ void growPass(benchmark::State& state) {
     const auto ask = [&] {
         sendto(client, "is_alive", 8, 0, reinterpret_cast<const sockaddr*>(&address), sizeof address);
     };
-    // The first pass binds; what was sent before is lost.
+    // The first pass binds the socket; earlier requests are lost.
     std::atomic<bool> isBound{false};
     std::thread first([&] {
         while (!isBound) {
@@ -341,7 +341,7 @@ void growNames(benchmark::State& state) {
     }
 }
 
-// Carries an operation out `count` times, for whoever counts its calls from outside.
+// Run an operation `count` times, under strace.
 int carryOut(const std::string& name, const std::string& side, int count) {
     for (const Operation& operation : operations()) {
         if (operation.name == name) {
@@ -411,7 +411,7 @@ int main(int argc, char** argv) {
 
     benchmark::Initialize(&argc, argv);
     benchmark::RunSpecifiedBenchmarks();
-    // The servers' threads run on.
+    // Skip destructors: server threads are still running.
     std::fflush(stdout);
     _exit(0);
 }

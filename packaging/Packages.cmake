@@ -1,4 +1,4 @@
-# Debian packages, one for each of the four components; script/package makes them.
+# Debian packages, one per component; script/package builds them.
 set(library_package libternhadaemon6)
 set(development_package libternhadaemon-dev)
 set(platform_package libterncore6)
@@ -37,7 +37,7 @@ set(CPACK_COMPONENT_LIBRARY_DESCRIPTION
 It gives the daemon of a storage node the means to know whether its peer is
 alive, whether either node resynchronises a RAID array or handles disk errors,
 and how healthy the replication link is, and to make the peer reboot.]])
-# The library runs their programs by path.
+# The library runs programs of these packages.
 set(CPACK_DEBIAN_LIBRARY_PACKAGE_DEPENDS
     "libterncore6 (>= ${PROJECT_VERSION}), iputils-ping, net-tools, procps, xz-utils")
 set(CPACK_DEBIAN_LIBRARY_PACKAGE_CONTROL_EXTRA ${CMAKE_CURRENT_BINARY_DIR}/triggers
@@ -70,7 +70,7 @@ set(CPACK_DEBIAN_DAEMON_PACKAGE_CONTROL_EXTRA
     ${CMAKE_CURRENT_BINARY_DIR}/conffiles ${CMAKE_CURRENT_SOURCE_DIR}/debian/postinst
     ${CMAKE_CURRENT_SOURCE_DIR}/debian/prerm ${CMAKE_CURRENT_SOURCE_DIR}/debian/postrm)
 
-# Its latest entry is of this version and for this release.
+# Its latest entry names this version and release.
 file(READ debian/changelog changelog)
 string(REGEX REPLACE "^([a-z]+) [(]([^)]*)[)] unstable;" "\\1 (\\2${TERNHA_RELEASE_SUFFIX}) ${TERNHA_RELEASE_NAME};"
                      changelog "${changelog}")

@@ -1,7 +1,7 @@
-# The release that packages are built on, and so for: what differs from one to the next.
+# Differences between Debian releases; packages are for the release of the build machine.
 cmake_host_system_information(RESULT host QUERY DISTRIB_INFO)
 
-# The end of the packages' version: that of a later release counts as newer.
+# Suffix of the version; that of a later release sorts as newer.
 if(NOT host_VERSION_ID)
   set(TERNHA_RELEASE_SUFFIX "") # Debian before its release
 elseif(host_ID STREQUAL "debian")
@@ -14,7 +14,7 @@ if(host_VERSION_CODENAME)
   set(TERNHA_RELEASE_NAME ${host_VERSION_CODENAME})
 endif()
 
-# Until Debian 12 packages must not hold /lib under its new name, since Debian 13 not under its old one.
+# Up to Debian 12, packages must not use /usr/lib for /lib; from Debian 13 on, not /lib.
 set(TERNHA_SYSTEM_UNITDIR /usr/lib/systemd/system)
 if(host_ID STREQUAL "debian" AND host_VERSION_ID AND host_VERSION_ID VERSION_LESS 13)
   set(TERNHA_SYSTEM_UNITDIR /lib/systemd/system)

@@ -1,4 +1,4 @@
-"""How long each failure of the peer takes to be detected: ternhad, keepalived and corosync on the same nodes."""
+"""Detection times of failures of the peer: ternhad, keepalived and corosync on the same nodes."""
 
 import random
 import signal
@@ -17,7 +17,7 @@ LIMIT = 60  # seconds
 
 
 class Watchers:
-    """The programs of both nodes with one setting. Those of node a watch node b."""
+    """The programs of both nodes with one setting. Those of node a monitor node b."""
 
     def __init__(self, cluster, setting, rivals=True):
         options, interval, token = SETTINGS[setting]
@@ -44,16 +44,9 @@ class Watchers:
             raise RuntimeError("ternhad does not see its peer")
         return seeing
 
-    def revive(self):
-        """Starts all programs again when one of them does not see its peer any more."""
-        if len(self.wait_until_alive()) < len(self.on_a):
-            self.end()
-            self.start()
-            self.wait_until_alive()
-
-    def detect(self, names, since, limit=LIMIT):
-        """Seconds from `since` until each of the programs on node a has seen its peer's failure; None: never."""
-        times = dict.fromkeys(names)
+    def detect(self, since, limit=LIMIT):
+        """Return the seconds from `since` until each program on node a detects the failure; None: never."""
+        times = dict.fromkeys(self.on_a)
         while None in times.values() and time.monotonic() - since < limit:
             for name in times:
                 if times[name] is None and self.on_a[name].sees_peer() is False:
@@ -107,8 +100,8 @@ def table_head(name, columns):
 
 
 def measure(cluster, times, settings, rivals):
-    """Prints the table, each row when it is known."""
-    print(f"Seconds until detected, {times} times each: minimum, median, maximum", flush=True)
+    """Print the table."""
+    print(f"seconds until detected, {times} times each: minimum, median, maximum\n")
     for setting in settings:
         watchers = Watchers(cluster, setting, rivals)
         watchers.start()

@@ -1,4 +1,4 @@
-"""Two nodes of one machine, and a third host: namespaces of their own, joined by a bridge."""
+"""Two nodes and a third host in namespaces of this machine, connected by a bridge."""
 
 import ctypes
 import os
@@ -24,7 +24,7 @@ def run(*argv):
 
 
 def eventually(limit, predicate, step=0.01):
-    """Whether `predicate` holds within `limit` seconds."""
+    """Return whether `predicate` holds within `limit` seconds."""
     end = time.monotonic() + limit
     while not predicate():
         if time.monotonic() >= end:
@@ -34,7 +34,7 @@ def eventually(limit, predicate, step=0.01):
 
 
 class Node:
-    """Network, processes, host name, /tmp, /run, /var/log and /dev/shm of its own. `build` has the programs."""
+    """A node with its own network, processes, hostname, /tmp, /run, /var/log and /dev/shm."""
 
     def __init__(self, name, build=None):
         self.name = name
@@ -69,8 +69,8 @@ class Node:
         run(*self.command(*argv))
 
     def start(self, name, *argv, **options):
-        """A process of the node, to be known as `name`."""
-        process = subprocess.Popen(self.command(*self.prefix, *argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
+        """Start a process in the node under the key `name`."""
+        process = subprocess.Popen(self.command(*argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
                                    preexec_fn=die_with_parent, start_new_session=True, **options)
         self.processes[name] = process
         return process
@@ -98,7 +98,7 @@ class Node:
 
 
 class Cluster:
-    """Nodes a and b, host c, and the bridge between them in a namespace of its own."""
+    """Nodes a and b, host c, and a bridge between them in a separate namespace."""
 
     def __init__(self, build):
         self.switch = Node("switch")
@@ -128,7 +128,7 @@ class Cluster:
 
 
 class Daemon:
-    """A node's ternhad, with `options`. Its journal tells of changes, whatever becomes of descriptors and disks."""
+    """ternhad on a node, with `options`."""
 
     def __init__(self, node, peer, options):
         self.node, self.peer, self.options = node, peer, options
@@ -147,15 +147,34 @@ class Daemon:
             self.journal += (self.node.processes["ternhad"].stderr.read() or b"").decode()
 
     def sees_peer(self):
-        """True, False, or None when that is unknown."""
-        self._read()
-        states = re.findall(r"^ternhad: (started|peer-alive|peer-dead)\b", self.journal, re.MULTILINE)
-        return {"peer-alive": True, "peer-dead": False}.get(states[-1]) if states else None
+        """Return True, False, or None if unknown, from its socket or its log."""
+        answer = self._answer()
+        return self._logged() if answer is None else answer
+
+    def _logged(self):
+        log = self.node.path("/tmp/ha/ha.daemon.log")
+        text = log.read_text(errors="replace") if log.exists() else ""
+        alive, dead = text.rfind("changed to alive"), text.rfind("changed to dead")
+        return None if alive == dead else alive > dead
+
+    def _answer(self):
+        with socket.socket(socket.AF_UNIX, socket.SOCK_STREAM) as client:
+            client.settimeout(0.1)
+            try:
+                client.connect(str(self.node.path("/run/ternha/control.sock")))
+                client.send(b'{"act":"I"}')
+                return json.loads(client.recv(4096))["isRemoteAlive"]
+            except (OSError, ValueError):
+                return None
 
     def deaths(self):
-        """How often it has declared its peer dead."""
-        self._read()
-        return self.journal.count("ternhad: peer-dead")
+        """Return how often it declared its peer dead."""
+        text = ""
+        for directory in ("/var/log/ha", "/tmp/ha"):
+            log = self.node.path(f"{directory}/ha.daemon.log")
+            if log.exists():
+                text += log.read_text(errors="replace")
+        return text.count("changed to dead")
 
     def end(self):
         self._read()

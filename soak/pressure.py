@@ -60,7 +60,7 @@ class Control:
             try:
                 parent.write_text(pid)
             except OSError:
-                pass  # it has ended
+                pass  # already ended
         eventually(10, lambda: not (self.path / "cgroup.procs").read_text())
         self.path.rmdir()
 
@@ -125,7 +125,7 @@ def memory(watchers):
 
 
 def on_a_disk_of_its_own(watchers, directory, sicken, heal):
-    """Restarts node a's programs with `directory` on a small disk, and makes that sick."""
+    """Restart node a's programs with `directory` on a small disk and inject a fault into it."""
     node = watchers.cluster.a
     for watcher in watchers.on_a.values():
         watcher.end()
@@ -142,12 +142,12 @@ def on_a_disk_of_its_own(watchers, directory, sicken, heal):
     try:
         yield
     finally:
-        node.run(*heal)  # a frozen disk would outlive its namespace, with all that waits for it
-        for watcher in watchers.on_a.values():
-            watcher.end()
-        eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
-                                              stderr=subprocess.DEVNULL).returncode == 0, 0.2)
-        watchers.start("a")
+        node.run(*heal)  # a frozen disk would outlive its namespace, with all blocked processes
+    for watcher in watchers.on_a.values():
+        watcher.end()
+    eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
+                                          stderr=subprocess.DEVNULL).returncode == 0, 0.2)
+    watchers.start("a")
 
 
 def frozen(directory):
@@ -214,24 +214,29 @@ RESTARTED = ("frozen", "full", "clock")  # conditions that restart node a's prog
 
 
 def press(watchers, condition, seconds):
-    """Returns a cell for each program: its false positives on both nodes, and the seconds until it saw node b's end.
-    And whether ternhad was right."""
-    watchers.revive()
-    # Node b is right when it declares a stopped node a dead.
+    """Return the false positives of each program on both nodes, and its detection time of node b's failure."""
+    watchers.wait_until_alive()
+    # Node b is right to declare a stopped node a dead.
     observers = [watchers.on_a] if condition.startswith("stopped") else [watchers.on_a, watchers.on_b]
     deaths = lambda: {name: sum(observer[name].deaths() for observer in observers) for name in watchers.on_a}
     with closing(CONDITIONS[condition](watchers)) as steps:
-        before = deaths()
-        next(steps)
-        if any(word in condition for word in RESTARTED):
-            before = deaths()
-        time.sleep(seconds)
-        wrong = {name: count - before[name] for name, count in deaths().items()}
-        seeing = watchers.wait_until_alive(20)
-        failure = vanished(watchers)
-        begin = time.monotonic()
-        next(failure)
-        delays = watchers.detect(seeing, begin, limit=20)
+        return measure_under(watchers, condition, seconds, steps, deaths)
+
+
+def measure_under(watchers, condition, seconds, steps, deaths):
+    before = deaths()
+    next(steps)
+    if "frozen" in condition or "full" in condition:
+        before = deaths()  # the programs were restarted
+    time.sleep(seconds)
+    false_positives = {name: count - before[name] for name, count in deaths().items()}
+    watchers.wait_until_alive() if not any(false_positives.values()) else time.sleep(5)
+    failure = vanished(watchers)
+    begin = time.monotonic()
+    next(failure)
+    delays = watchers.detect(begin, limit=20)
+    next(steps, None)
+    next(failure, None)
     for node in (watchers.cluster.a, watchers.cluster.c):
         node.kill([name for name in node.processes if name not in watchers.on_a])
     next(failure, None)
@@ -261,7 +266,7 @@ def main():
     parser.add_argument("--alone", action="store_true", help="without keepalived and corosync")
     options = parser.parse_args()
     require_root()
-    # Measures on time whatever the pressure; what it starts has the usual priority.
+    # Real-time priority, so that measuring is on time; children have the normal priority.
     os.sched_setscheduler(0, os.SCHED_RR | os.SCHED_RESET_ON_FORK, os.sched_param(99))
     settings = options.setting or (["fast"] if options.short else ["default", "fast"])
     rivals = not (options.short or options.alone)

@@ -1,5 +1,5 @@
-// Two nodes for a long time: with events at random, with a link that loses datagrams, or cut again
-// and again. script/soak runs it in a sandbox.
+// Runs two nodes for a long time: with random events, datagram loss, or repeated link cuts.
+// script/soak runs it in a sandbox.
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
@@ -33,7 +33,7 @@ struct Options {
     int idle = 0;
 };
 
-// A node, and what is true of it.
+// A node and its true state.
 struct Side {
     Side(const std::string& name, const std::string& own, const std::string& peer)
         : machine(name, own, peer) {}
@@ -52,16 +52,16 @@ struct Side {
 
     void setDisk(bool on) {
         machine.write("/sys/class/ata_port/ata3/error_handling", on ? "1\n" : "0\n");
-        isDiskTrouble = on;
+        isDiskErrHandling = on;
     }
 
-    // The daemon's process, as this namespace numbers it.
+    // The daemon's directory in the /proc of this namespace.
     std::string proc() { return "/.kernel/proc/" + std::to_string(machine.daemon->pid()); }
 
     Machine machine;
     bool isRunning = false;
     bool isResync = false;
-    bool isDiskTrouble = false;
+    bool isDiskErrHandling = false;
 };
 
 struct Figures {
@@ -75,7 +75,7 @@ struct Usage {
     long wakeUps = 0;
 };
 
-// The number that follows `key` in a file of lines "key: number ...".
+// Return the number after `key` in a file of lines "key: number ...".
 long valueOf(const std::string& path, const std::string& key) {
     std::ifstream file(path);
     std::string line;
@@ -99,8 +99,8 @@ Figures figuresOf(Side& side) {
     return figures;
 }
 
-// Of the daemon's threads and, for the time, of the programs that it has run. Threads that have
-// ended no longer tell how often they woke; each was one wake-up at least.
+// Resource use of the daemon's threads and, for processor time, its programs. The wake-ups of ended
+// threads are unknown; each counts as one.
 Usage usageOf(Side& side) {
     Usage usage;
     const std::string proc = side.proc();
@@ -156,7 +156,7 @@ class Soak {
         std::printf("%d events, no wrong state.\n", _events);
     }
 
-    // Seconds from a cut of the link to the moment at which a node says that the other is dead.
+    // Return the seconds from a cut of the link until a node declares the other dead.
     void runCuts() {
         std::vector<double> seconds;
         for (int i = 0; i < _options.cuts; ++i) {
@@ -186,7 +186,7 @@ class Soak {
                     _options.cuts, seconds.front(), seconds[seconds.size() / 2], seconds.back());
     }
 
-    // What a node's daemon costs while nothing happens and nobody asks it.
+    // Print the resource use of an idle daemon.
     void runIdle() {
         const Usage before = usageOf(_a);
         std::this_thread::sleep_for(std::chrono::seconds(_options.idle));
@@ -239,7 +239,7 @@ class Soak {
         _isLinked = true;
     }
 
-    // What is wrong in the node's view; nothing when it is true.
+    // Return the differences between the node's status and its true state.
     std::string wrong(Side& side, const Side& peer) {
         if (!side.isRunning) {
             return "";
@@ -251,14 +251,14 @@ class Soak {
         const auto differs = [&status](const char* flag, bool value) {
             return status[flag].asBool() != value;
         };
-        if (differs("isMDResync", side.isResync) || differs("isDiskErrHandling", side.isDiskTrouble) ||
+        if (differs("isMDResync", side.isResync) || differs("isDiskErrHandling", side.isDiskErrHandling) ||
             differs("isRemoteAlive", _isLinked && peer.isRunning)) {
             return status.toStyledString();
         }
         if (status["isRemoteAlive"].asBool() &&
             (differs("isRemoteMDResync", peer.isResync) ||
-             differs("isRemoteDiskErrHandling", peer.isDiskTrouble) ||
-             (status["diskErrorHandlingDiskRemote"].size() == 1) != peer.isDiskTrouble)) {
+             differs("isRemoteDiskErrHandling", peer.isDiskErrHandling) ||
+             (status["diskErrorHandlingDiskRemote"].size() == 1) != peer.isDiskErrHandling)) {
             return status.toStyledString();
         }
         return "";
@@ -289,7 +289,7 @@ class Soak {
                 break;
             case 1:
                 _last = "a change of the disk errors";
-                side.setDisk(!side.isDiskTrouble);
+                side.setDisk(!side.isDiskErrHandling);
                 break;
             case 2:
                 _last = "a cut link";

@@ -1,5 +1,5 @@
 #!/usr/bin/env bash
-# Checks what the packages of DIRECTORY say they need: check_dependencies.sh DIRECTORY ARCHITECTURE.
+# Check the dependencies of the packages in DIRECTORY: check_dependencies.sh DIRECTORY ARCHITECTURE.
 set -euo pipefail
 
 fail() { echo "FAILED: $1" >&2; exit 1; }
@@ -17,7 +17,7 @@ depends() { # PACKAGE DEPENDENCY...: whatever the version
 directory=$1 architecture=$2
 depends libterncore6 libc6
 depends libternhadaemon6 libterncore6 libc6 'libstdc\+\+6' 'libjsoncpp[0-9]+' iputils-ping net-tools procps xz-utils
-# The service manager's library: readiness and watchdog on every architecture.
+# libsystemd: readiness and watchdog on every architecture.
 depends ternhad libternhadaemon6 libc6 'libstdc\+\+6' 'libjsoncpp[0-9]+' libsystemd0
 depends libternhadaemon-dev libternhadaemon6 libjsoncpp-dev
 

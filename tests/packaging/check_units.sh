@@ -1,10 +1,10 @@
 #!/usr/bin/env bash
-# Checks the units in the packages of DIRECTORY for mistakes and for what an attacker could reach
-# from the services: check_units.sh DIRECTORY ARCHITECTURE, in a sandbox.
+# Check the units of the packages in DIRECTORY for errors and exposure: check_units.sh DIRECTORY
+# ARCHITECTURE, in a sandbox.
 set -euo pipefail
 [ -e /.ternha-sandbox ] || { echo "check_units.sh: not in a sandbox" >&2; exit 99; }
 
-# With /bin and /lib in /usr, as on every system: units may be under either name.
+# With merged /usr: units may be under either name.
 root=/tmp/root
 mkdir -p "$root"/usr/{bin,lib}
 ln -s usr/bin usr/lib "$root"
@@ -12,7 +12,7 @@ for package in "$1"/*_"$2".deb; do
     dpkg -x "$package" "$root"
 done
 
-# Only what the units name of the rest of the system has to be there.
+# Only files of the system that the units name must exist.
 cp -L /bin/kill "$root/bin/"
 cp /lib/systemd/system/{basic,sysinit,network,network-pre,local-fs,local-fs-pre,shutdown,umount,paths,sockets,slices,timers,swap}.target \
     "$root/lib/systemd/system/"
@@ -20,7 +20,7 @@ complaints=$(systemd-analyze verify --root="$root" --man=no --recursive-errors=n
     "$root"/lib/systemd/system/ternha*.{service,timer} 2>&1) || { echo "$complaints" >&2; exit 1; }
 [ -z "$complaints" ] || { echo "$complaints" >&2; exit 1; }
 
-# In tenths; the exit code tells when one is above.
+# The threshold is in tenths; above it the command fails.
 for unit in ternhad ternha-firewall ternha-metrics; do
     systemd-analyze security --offline=true --threshold=40 --no-pager "$root/lib/systemd/system/$unit.service" |
         tail -n 1

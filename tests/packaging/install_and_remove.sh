@@ -1,7 +1,6 @@
 #!/usr/bin/env bash
-# Installs the packages of DIRECTORY on a system like this one, runs the daemon from them, and
-# removes them: install_and_remove.sh DIRECTORY ARCHITECTURE, in a sandbox that has /var/lib/dpkg of
-# the machine.
+# Install the packages of DIRECTORY, run the daemon and remove them: install_and_remove.sh DIRECTORY
+# ARCHITECTURE, in a sandbox with the machine's /var/lib/dpkg.
 set -euo pipefail
 [ -e /.ternha-sandbox ] || { echo "install_and_remove.sh: not in a sandbox" >&2; exit 99; }
 packages=$1 architecture=$2
@@ -18,8 +17,8 @@ eventually() { # LIMIT_IN_SECONDS COMMAND...
     done
 }
 
-# The machine's programs are read-only here: changes go into a layer above them. Libraries of the
-# other architecture that the machine lacks lie in one below.
+# The machine's programs are read-only: an overlay takes changes. A lower layer has missing
+# libraries of the other architecture.
 layers=/run/layers
 sysroot=
 [ "$architecture" = "$(dpkg --print-architecture)" ] || sysroot=$("${0%/*}/../../script/debian-root" sysroot)
@@ -34,8 +33,8 @@ for directory in /usr/*; do
     mount -t overlay overlay -o "lowerdir=$lower,upperdir=$layer/upper,workdir=$layer/work" "$directory"
 done
 
-# All that is not the machine's own. Directories that dpkg has only opened are in the layers too.
-# The build tree, where other tests write, is a file system of its own wherever it is.
+# Files that differ from the machine's, without directories. Not those on other file systems, such
+# as the build tree.
 changes() {
     {
         find /etc /var /tmp /run -xdev \( -path /var/lib/dpkg -o -path "$layers" -o -path /run/dpkg \) -prune -o -print
@@ -43,11 +42,11 @@ changes() {
     } | sort
 }
 
-# Dependencies are checked against what the machine has; its triggers would only take time.
+# Dependencies are checked against the machine; triggers are skipped to save time.
 cp -r /var/lib/dpkg /run/dpkg
 rm -f /run/dpkg/lock*
 mkdir -p /var/lib/systemd
-# The programs that packages of another architecture depend on are those of the machine.
+# Programs that packages of another architecture depend on are those of the machine.
 options=()
 [ "$architecture" = "$(dpkg --print-architecture)" ] || options=(--force-depends)
 in_dpkg() { dpkg "${options[@]}" --admindir=/run/dpkg --log=/run/dpkg/log --no-triggers "$@" >/run/dpkg/output 2>&1 ||
@@ -57,7 +56,7 @@ installed=({ternhad,libternhadaemon-dev,libternhadaemon6,libterncore6}:"$archite
 before=$(changes)
 in_dpkg --install "$packages"/*_"$architecture".deb
 expect "ternhad --version" "$(ternhad --version)" "ternhad 6.2"
-# It insists on the kernel's own /proc, which here is elsewhere.
+# It requires the kernel's /proc, which a sandbox has elsewhere.
 unshare --mount sh -c 'mount --rbind /.kernel/proc /proc && exec systemd-tmpfiles --create ternha.conf'
 expect "mode of /var/log/ha" "$(stat -c '%a %U' /var/log/ha)" "700 root"
 expect "mode of /tmp/ha" "$(stat -c '%a %U' /tmp/ha)" "700 root"
@@ -68,7 +67,7 @@ done
 expect "completion" "$(bash -c '. /usr/share/bash-completion/completions/ternhactl; complete -p ternhactl')" \
     "complete -F _ternhactl ternhactl"
 
-# As it comes it starts nothing: the addresses are the administrator's.
+# Nothing starts after the installation: addresses are missing.
 exit_code=0
 ternhad --config /etc/ternha/ternhad.conf >/run/dpkg/output 2>&1 || exit_code=$?
 expect "exit code without addresses" "$exit_code" 2

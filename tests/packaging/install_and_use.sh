@@ -1,7 +1,7 @@
 #!/usr/bin/env bash
-# Installs the build tree into a prefix of its own, moves that somewhere else, and builds and runs a
-# host daemon against it: install_and_use.sh BUILD_DIRECTORY WORK_DIRECTORY CXX SANDBOX_LAUNCHER.
-# What was built runs in the sandbox only.
+# Install the build tree into a prefix, move it, and build and run a host daemon against it:
+# install_and_use.sh BUILD_DIRECTORY WORK_DIRECTORY CXX SANDBOX_LAUNCHER. Programs run only in the
+# sandbox.
 set -euo pipefail
 here=$(cd "$(dirname "$0")" && pwd)
 build=$1 work=$2 cxx=$3 launcher=$4
@@ -16,7 +16,7 @@ cmake --install "$build" --prefix "$work/first" >"$work/install.log"
 mv "$work/first" "$work/prefix"
 prefix=$work/prefix
 
-# The build type is part of one name.
+# One name contains the build type.
 (cd "$prefix" && find . ! -type d | sed -E 's|^\./||; s|(Targets-)[a-z]+\.cmake|\1BUILD.cmake|') |
     LC_ALL=C sort | diff "$here/installed_files.txt" - || fail "the installed files are not those listed"
 

@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
-# script/bootstrap on machines that lack packages, rights or an index: bootstrap.sh BOOTSTRAP, in a
-# sandbox. The programs that it calls are stubs.
+# Test script/bootstrap with missing packages, privileges or index: bootstrap.sh BOOTSTRAP, in a
+# sandbox. All programs are stubs.
 set -uo pipefail
 [ -e /.ternha-sandbox ] || { echo "bootstrap.sh: not in a sandbox" >&2; exit 99; }
 bootstrap=$1
@@ -10,7 +10,7 @@ stub() { # NAME SCRIPT
     printf '#!/bin/sh\n%s\n' "$2" >"/tmp/stubs/$1"
     chmod +x "/tmp/stubs/$1"
 }
-# bootstrap_as ID PURPOSE...: leaves its output, exit code and the calls of apt-get and dpkg.
+# bootstrap_as ID PURPOSE...: record output, exit code and calls of apt-get and dpkg.
 bootstrap_as() {
     stub id "echo $1"
     : >/tmp/calls
@@ -36,8 +36,8 @@ bootstrap_as 1000 demo
 [ "$code$calls" = 1 ] || fail "without rights: exit code $code"
 says "apt-get install --no-install-recommends bubblewrap cmake g++ "
 
-# One library is there for the other architecture only, one for this one only; the index is fetched
-# with errors.
+# One library is installed only for the other architecture, one only for this one; the index is
+# incomplete.
 stub dpkg-query 'case $3 in
     libgtest-dev:armhf) exit 1 ;;
     libjsoncpp-dev | *:armhf) echo installed armhf ;;

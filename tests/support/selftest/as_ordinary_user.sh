@@ -1,11 +1,11 @@
 #!/bin/sh
-# Runs a test program in a sandbox as an ordinary user, whose rights end at a user namespace:
+# Run a test program in a sandbox as an unprivileged user:
 # as_ordinary_user.sh SANDBOX PROGRAM ARGUMENT...
 set -eu
 
 sandbox=$1 program=$2
 shift 2
-# Copies: the build tree may lie where only root gets to.
+# Copies: the build tree may be accessible only to root.
 directory=$(mktemp -d)
 trap 'rm -rf "$directory"' EXIT
 chmod 755 "$directory"
