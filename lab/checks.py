@@ -37,11 +37,11 @@ class Checks:
         self.that(what, expected == seen, expected, seen)
 
     def within(self, limit: float, what: str, look: Callable[[], Any], expected: Any, since: float | None = None):
-        """Looks until it sees what is expected, in a look that begins at the latest `limit` seconds after `since`
-        (now, unless given): what the look itself takes on a busy machine is no fault of the nodes.
+        """Poll `look` until it returns what is expected, in a poll that begins at most `limit` seconds after `since`
+        (default: now); the duration of the poll itself does not count.
 
-        `expected` is a value, or for each node (or the one that is looked at) the members of its record that
-        matter, or a function that tells whether it is seen and whose documentation says what it stands for."""
+        `expected` is a value, the relevant members of the record of each node, or a predicate whose docstring
+        describes it."""
         start = time.monotonic() if since is None else since
         while True:
             begin_look = time.monotonic()
@@ -54,7 +54,7 @@ class Checks:
             time.sleep(POLL)
 
     def holds(self, duration: float, what: str, look: Callable[[], Any], expected: Any):
-        """Looks again and again: what is expected must be seen each time, for `duration` seconds."""
+        """Poll `look` for `duration` seconds; each poll must return what is expected."""
         start = time.monotonic()
         looks = 0
         while looks < 3 or time.monotonic() - start < duration:
@@ -63,7 +63,7 @@ class Checks:
             if not matches(seen, expected):
                 raise CheckFailed(what, f"for {duration} s: {describe(expected)}", describe(seen))
         self.passed += 1
-        self._line("ok    ", f"{what} ({looks} looks in {time.monotonic() - start:.1f} s)")
+        self._line("ok    ", f"{what} ({looks} polls in {time.monotonic() - start:.1f} s)")
 
     def _line(self, mark: str, text: str):
         print(f"{mark}{self.elapsed():6.1f} s  {text}", flush=True)

@@ -34,7 +34,7 @@ def run(pair: Containers, checks: Checks):
 
 
 def install(pair: Containers, checks: Checks):
-    checks.scene("apt installs the packages of the version before")
+    checks.scene("apt installs packages of the previous version")
     pair.run("apt-get install --quiet --yes /packages/old/*.deb", 120)
     checks.equal("nothing is enabled", ["disabled\ndisabled\n"] * 2,
                  pair.run("systemctl is-enabled ternhad ternha-firewall || true"))
@@ -47,14 +47,14 @@ def install(pair: Containers, checks: Checks):
 
 
 def start(pair: Containers, checks: Checks):
-    checks.scene("Configured and enabled, both nodes find each other")
+    checks.scene("Configured and enabled, both nodes detect each other")
     for node, peer in (pair.nodes, pair.nodes[::-1]):
         service.configure(node, peer, "eth1")
     pair.run("systemctl enable --quiet --now ternha-firewall ternhad")
-    checks.equal("enable --now ends when the daemons are ready", ["active"] * 2,
+    checks.equal("enable --now returns when the daemons are ready", ["active"] * 2,
                  [service.state(node) for node in pair.nodes])
-    checks.equal("they are watched", ["notify"] * 2, [service.properties(node, "Type")[0] for node in pair.nodes])
-    checks.within(RETURN_LIMIT, "both say alive", pair.statuses, [ALIVE] * 2)
+    checks.equal("the watchdog is active", ["notify"] * 2, [service.properties(node, "Type")[0] for node in pair.nodes])
+    checks.within(RETURN_LIMIT, "both report alive", pair.statuses, [ALIVE] * 2)
 
 
 def sandbox(pair: Containers, checks: Checks):
@@ -75,11 +75,11 @@ def sandbox(pair: Containers, checks: Checks):
     record = "cat /var/log/ha/ha.daemon.record /tmp/ha/ha.daemon.record 2>/dev/null || true"
     checks.within(RETURN_LIMIT, "ps and df: recorded at the start", lambda: pair.a.run(record), is_recorded)
     failures = [line for line in pair.a.full_log() if "Failed" in line and not line.endswith(ABSENT)]
-    checks.equal("nothing that is there has failed", [], failures)
+    checks.equal("no failures", [], failures)
 
 
 def firewall(pair: Containers, checks: Checks):
-    checks.scene("The firewall lets the peer in, and nobody else")
+    checks.scene("The firewall admits only the peer")
     third = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
     third.bind((THIRD_HOST, 0))
     third.settimeout(0.2)
@@ -94,12 +94,12 @@ def firewall(pair: Containers, checks: Checks):
     dropped, accepted = packets(pair.b, "drop"), packets(pair.b, "accept")
     checks.equal("a third host gets no reply", False, ask())
     checks.within(RETURN_LIMIT, "its datagram was dropped", lambda: packets(pair.b, "drop") > dropped, True)
-    checks.within(RETURN_LIMIT, "the peer's pass", lambda: packets(pair.b, "accept") > accepted, True)
+    checks.within(RETURN_LIMIT, "the peer's datagrams are accepted", lambda: packets(pair.b, "accept") > accepted, True)
     pair.b.run("systemctl stop ternha-firewall")
-    checks.within(RETURN_LIMIT, "without the firewall the third host does get one", ask, True)
+    checks.within(RETURN_LIMIT, "without the firewall it gets one", ask, True)
     pair.b.run("systemctl start ternha-firewall")
-    checks.equal("with it, none again", False, ask())
-    checks.equal("both say alive", [True] * 2, [record["isRemoteAlive"] for record in pair.statuses()])
+    checks.equal("with it, none", False, ask())
+    checks.equal("both report alive", [True] * 2, [record["isRemoteAlive"] for record in pair.statuses()])
 
 
 def packets(node: Node, verdict: str) -> int:
@@ -118,18 +118,18 @@ def private_proc(node: Node, command: str):
 
 
 def reboot_trigger(pair: Containers, checks: Checks):
-    checks.scene("node-a asks node-b to reboot")
+    checks.scene("node-a requests a reboot of node-b")
     private_proc(pair.b, "touch sysrq-trigger")
     service.override(pair.b, PRIVATE_PROC)
     pair.b.run("systemctl restart ternhad")
-    checks.within(RETURN_LIMIT, "both say alive", pair.statuses, [ALIVE] * 2)
+    checks.within(RETURN_LIMIT, "both report alive", pair.statuses, [ALIVE] * 2)
     request = pair.a.channel.start("ternhactl reboot-peer --yes")
     checks.within(RETURN_LIMIT, "node-b has written to the trigger",
                   lambda: pair.b.run("cat /run/proc/sysrq-trigger").strip(), "b")
     request.kill()
     service.override(pair.b)
     pair.run("systemctl restart ternhad")
-    checks.within(RETURN_LIMIT, "both say alive", pair.statuses, [ALIVE] * 2)
+    checks.within(RETURN_LIMIT, "both report alive", pair.statuses, [ALIVE] * 2)
 
 
 def wrong_options(pair: Containers, checks: Checks):
@@ -140,21 +140,21 @@ def wrong_options(pair: Containers, checks: Checks):
     checks.equal("with exit code 2", ["failed", "2"], service.properties(pair.b, "ActiveState", "ExecMainStatus"))
     checks.that("the journal names the wrong value", "somewhere" in pair.b.run("journalctl --unit=ternhad"),
                 "somewhere", "no such line")
-    checks.holds(3, "it stays so", lambda: (service.state(pair.b), service.restarts(pair.b)), ("failed", before))
+    checks.holds(3, "it stays failed", lambda: (service.state(pair.b), service.restarts(pair.b)), ("failed", before))
     pair.b.run(f"cp /run/right {service.FILE} && systemctl start ternhad")
-    checks.within(RETURN_LIMIT, "with right ones again both say alive", pair.statuses, [ALIVE] * 2)
+    checks.within(RETURN_LIMIT, "with correct options both report alive", pair.statuses, [ALIVE] * 2)
 
 
 def remove(pair: Containers, checks: Checks):
     checks.scene("apt removes and purges the packages of node-b")
     packages = " ".join(service.PACKAGES)
     pair.b.run(f"apt-get remove --quiet --yes {packages}", 120)
-    checks.equal("no daemon runs, no program is left", "gone\n",
+    checks.equal("neither daemon nor programs are left", "gone\n",
                  pair.b.run("pidof ternhad || which ternhad || echo gone"))
     checks.equal("the firewall's rules are gone", 1, pair.b.try_run(FIREWALL)[0])
     pair.b.run(f"test -f {service.FILE} && test -s /var/log/ha/ha.daemon.log")
     checks.equal("configuration and logs are left", True, True)
-    checks.within(RETURN_LIMIT, "node-a says dead", pair.a.status, {"isRemoteAlive": False})
+    checks.within(RETURN_LIMIT, "node-a reports dead", pair.a.status, {"isRemoteAlive": False})
     pair.b.run(f"apt-get purge --quiet --yes {packages}", 120)
     left = pair.b.run("find / -xdev \\( -iname '*ternha*' -o -path '/var/log/ha*' -o -path '/tmp/ha*' \\)"
                       " -not -path '/var/log/apt/*' -not -path '/packages*' -not -path '/run/*'")

@@ -10,7 +10,7 @@ from checks import Checks
 from lab import Lab
 from node import Node, parse_drbd_state, parse_status
 
-DEATH_LIMIT = 5  # seconds until a peer that says nothing counts as dead
+DEATH_LIMIT = 5  # seconds until a silent peer is declared dead
 CUT_LIMIT = 8  # until both ends of a cut link have seen it
 RESYNC_LIMIT = 3  # until both nodes know of a resync
 RETURN_LIMIT = 20  # until everything is well again
@@ -47,7 +47,7 @@ def run(lab: Lab, checks: Checks):
 
 
 def find_each_other(lab: Lab, checks: Checks):
-    checks.scene("Two nodes start and find each other")
+    checks.scene("Two nodes start and detect each other")
     checks.equal("both run a 32-bit ARM kernel", ["armv7l\n"] * 2, lab.run("uname -m"))
     check_tools(lab, checks)
     lab.run(
@@ -56,7 +56,7 @@ def find_each_other(lab: Lab, checks: Checks):
     )
     checks.within(RETURN_LIMIT, "DRBD is Connected on both", lambda: drbd_states(lab), ["Connected"] * 2)
     lab.run("rm /run/lab/hold")
-    checks.within(RETURN_LIMIT, "both say alive and connected", lab.statuses, [WELL] * 2)
+    checks.within(RETURN_LIMIT, "both report alive and connected", lab.statuses, [WELL] * 2)
     checks.within(
         RETURN_LIMIT,
         "both have logged the other's host name",
@@ -94,7 +94,7 @@ def check_tools(lab: Lab, checks: Checks):
 
 
 def initial_sync(lab: Lab, checks: Checks):
-    checks.scene("DRBD copies the disk for the first time")
+    checks.scene("First sync of DRBD")
     lab.a.run("drbdadm primary --force r0")
     checks.within(RESYNC_LIMIT, "DRBD is SyncSource on one, SyncTarget on the other", lambda: drbd_states(lab),
                   ["SyncSource", "SyncTarget"])
@@ -107,15 +107,15 @@ def initial_sync(lab: Lab, checks: Checks):
     lab.run("drbdadm disk-options --resync-rate=8M r0")
     checks.within(RETURN_LIMIT, "the sync ends: DRBD is Connected, both disks up to date",
                   lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
-    checks.holds(SOME_ROUNDS, "both still say alive and connected", lab.statuses, [WELL] * 2)
+    checks.holds(SOME_ROUNDS, "both still report alive and connected", lab.statuses, [WELL] * 2)
     lab.run("drbdadm disk-options --resync-rate=2M r0")
 
 
 def cut_link(lab: Lab, checks: Checks):
-    checks.scene("The link is cut, and joined again")
+    checks.scene("The link goes down and comes up again")
     begin = time.monotonic()
     lab.set_link(False)
-    checks.within(CUT_LIMIT, "both say dead and not connected after the cut", lab.statuses, [APART] * 2, begin)
+    checks.within(CUT_LIMIT, "both report dead and not connected after the cut", lab.statuses, [APART] * 2, begin)
     for node in lab.nodes:
         checks.equal(
             f"{node} has logged it",
@@ -125,7 +125,7 @@ def cut_link(lab: Lab, checks: Checks):
     begin = time.monotonic()
     lab.set_link(True)
     checks.within(
-        RETURN_LIMIT, "both say alive and connected after the join", lab.statuses, [WELL] * 2, begin
+        RETURN_LIMIT, "both report alive and connected after the join", lab.statuses, [WELL] * 2, begin
     )
 
 
@@ -145,12 +145,12 @@ def md_actions(lab: Lab, checks: Checks):
         [{"isMDResync": False, "isRemoteMDResync": True}, {"isMDResync": True, "isRemoteMDResync": False}],
         begin,
     )
-    checks.equal("md says resync", "resync", lab.b.run(SYNC_ACTION).strip())
+    checks.equal("md reports resync", "resync", lab.b.run(SYNC_ACTION).strip())
     check_snapshot(lab.a, checks, "isRemoteMDResync")
     check_snapshot(lab.b, checks, "isMDResync")
     lab.b.run(FAST_RESYNC)
-    checks.within(RETURN_LIMIT, "md has ended the resync", lambda: lab.b.run(SYNC_ACTION).strip(), "idle")
-    checks.within(DEATH_LIMIT, "gone on both when it ends", lab.statuses, none)
+    checks.within(RETURN_LIMIT, "md has finished the resync", lambda: lab.b.run(SYNC_ACTION).strip(), "idle")
+    checks.within(DEATH_LIMIT, "cleared on both at the end", lab.statuses, none)
 
     lab.b.run(f"{SLOW_RESYNC}; echo check >/sys/block/md0/md/sync_action")
     check_uncounted(lab, checks, "check")
@@ -162,7 +162,7 @@ def md_actions(lab: Lab, checks: Checks):
     )
     check_uncounted(lab, checks, "recover")
     lab.b.run(FAST_RESYNC)
-    checks.within(RETURN_LIMIT, "md has ended the recovery", lambda: lab.b.run(SYNC_ACTION).strip(), "idle")
+    checks.within(RETURN_LIMIT, "md has finished the recovery", lambda: lab.b.run(SYNC_ACTION).strip(), "idle")
 
 
 def resync_begin(node: Node) -> float:
@@ -175,7 +175,7 @@ def resync_begin(node: Node) -> float:
 
 
 def check_uncounted(lab: Lab, checks: Checks, action: str):
-    checks.within(RESYNC_LIMIT, f"md says {action}", lambda: lab.b.run(SYNC_ACTION).strip(), action)
+    checks.within(RESYNC_LIMIT, f"md reports {action}", lambda: lab.b.run(SYNC_ACTION).strip(), action)
 
     def look():
         started = lab.a.channel.start("ternhactl status --json")
@@ -216,7 +216,7 @@ def check_snapshot(node: Node, checks: Checks, flag: str):
 def split_brain(lab: Lab, checks: Checks):
     checks.scene("Split brain: both nodes write while the link is cut")
     lab.set_link(False)
-    checks.within(CUT_LIMIT, "both say dead and not connected", lab.statuses, [APART] * 2)
+    checks.within(CUT_LIMIT, "both report dead and not connected", lab.statuses, [APART] * 2)
     lab.b.run("drbdadm primary r0")
     lab.run("dd if=/dev/urandom of=/dev/drbd0 bs=4096 count=4 conv=fsync 2>/dev/null && drbdadm secondary r0")
     lab.set_link(True)
@@ -227,7 +227,7 @@ def split_brain(lab: Lab, checks: Checks):
 
     checks.within(RETURN_LIMIT, "DRBD refuses to connect: StandAlone", lambda: drbd_states(lab), is_refused)
     checks.within(
-        RETURN_LIMIT, "both say alive, but not connected", lab.statuses, [ALIVE | {"isDRBDConnect": False}] * 2
+        RETURN_LIMIT, "both report alive, but not connected", lab.statuses, [ALIVE | {"isDRBDConnect": False}] * 2
     )
     checks.holds(
         SOME_ROUNDS,
@@ -238,7 +238,7 @@ def split_brain(lab: Lab, checks: Checks):
     checks.that("DRBD is still StandAlone", is_refused(drbd_states(lab)), is_refused.__doc__, drbd_states(lab))
     lab.b.run("drbdadm disconnect r0; drbdadm connect --discard-my-data r0")
     lab.a.run("drbdadm disconnect r0; drbdadm connect r0")
-    checks.within(RETURN_LIMIT, "resolved: both say connected again", lab.statuses, [WELL] * 2)
+    checks.within(RETURN_LIMIT, "resolved: both report connected again", lab.statuses, [WELL] * 2)
     checks.within(RETURN_LIMIT, "and both disks are up to date", lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
 
 
@@ -247,19 +247,19 @@ def kill_daemon(lab: Lab, checks: Checks):
     lab.b.hold_daemon()
     begin = time.monotonic()
     lab.b.run("kill -KILL $(cat /run/lab/pid)")
-    checks.within(DEATH_LIMIT, "node-a says dead", lab.a.status, DEAD | {"isDRBDConnect": True}, begin)
+    checks.within(DEATH_LIMIT, "node-a reports dead", lab.a.status, DEAD | {"isDRBDConnect": True}, begin)
     checks.equal("the supervisor saw it killed", "137", lab.b.supervised()[-1][-1])
     lab.b.release_daemon()
-    checks.within(RETURN_LIMIT, "both say alive when it is started again", lab.statuses, [WELL] * 2)
+    checks.within(RETURN_LIMIT, "both report alive after its restart", lab.statuses, [WELL] * 2)
 
 
 def freeze_node(lab: Lab, checks: Checks):
-    checks.scene("node-b is frozen: its emulator stands still")
+    checks.scene("node-b is frozen: its emulator is stopped")
     begin = time.monotonic()
     lab.b.emulator.freeze()
-    checks.within(DEATH_LIMIT, "node-a says dead", lab.a.status, DEAD, begin)
+    checks.within(DEATH_LIMIT, "node-a reports dead", lab.a.status, DEAD, begin)
     lab.b.emulator.thaw()
-    checks.within(RETURN_LIMIT, "both say alive and connected when it goes on", lab.statuses, [WELL] * 2)
+    checks.within(RETURN_LIMIT, "both report alive and connected when it continues", lab.statuses, [WELL] * 2)
 
 
 def step_clock(lab: Lab, checks: Checks):
@@ -272,13 +272,13 @@ def step_clock(lab: Lab, checks: Checks):
     for direction, seconds in (("forward", "+ 3600"), ("back", "- 3600")):
         lab.b.run(f"date -s @$(($(date +%s) {seconds})) >/dev/null")
         checks.holds(
-            DEATH_LIMIT, f"{direction}: both still say alive and connected", lab.statuses, [WELL] * 2
+            DEATH_LIMIT, f"{direction}: both still report alive and connected", lab.statuses, [WELL] * 2
         )
-    checks.equal("neither has counted the other as dead meanwhile", before, changes())
+    checks.equal("neither has declared the other dead", before, changes())
 
 
 def unknown_request(lab: Lab, checks: Checks):
-    checks.scene("node-a sends node-b a request that does not exist")
+    checks.scene("node-a sends node-b an unknown request")
     pid = lab.b.run("cat /run/lab/pid").strip()
     lab.a.run(f"ternha-lab-tool send {lab.b.address} no_such_request")
     checks.within(
@@ -289,18 +289,18 @@ def unknown_request(lab: Lab, checks: Checks):
     )
     ended, started = lab.b.supervised()[-2:]
     is_other = ended[1] == pid != started[1]
-    checks.that("it was that daemon, and is another now", is_other, f"the end of {pid}", [ended, started])
-    checks.within(RETURN_LIMIT, "both say alive", lab.statuses, [WELL] * 2)
+    checks.that("the daemon was replaced by another", is_other, f"the end of {pid}", [ended, started])
+    checks.within(RETURN_LIMIT, "both report alive", lab.statuses, [WELL] * 2)
 
 
 def rotate_log(lab: Lab, checks: Checks):
-    checks.scene("200 lines go into the log of node-a, which is moved and rotated")
+    checks.scene("node-a moves and rotates a log of 200 lines")
     node = lab.a
     checks.equal("there is no archive yet", "", node.run("ls /var/log/ha | grep xz || true"))
     node.run("ternha-lab-tool log 1 200")
     expected = [f"lab line {number}" for number in range(1, 201)]
     before = node.log()
-    checks.equal("they are in the log", expected, lab_lines(before))
+    checks.equal("the lines are in the log", expected, lab_lines(before))
     archive = "/var/log/ha/ha.daemon.log.0.xz"
     node.run("kill -HUP $(cat /run/lab/pid)")
     checks.within(
@@ -317,11 +317,11 @@ def rotate_log(lab: Lab, checks: Checks):
         lzma.decompress(packed, lzma.FORMAT_XZ).decode(),
     )
     checks.equal("it unpacks to the 200 lines", expected, lab_lines(unpacked.splitlines()))
-    checks.equal("and to all the lines that there were", before, unpacked.splitlines()[: len(before)])
+    checks.equal("and all earlier lines", before, unpacked.splitlines()[: len(before)])
 
 
 def reboot_peer(lab: Lab, checks: Checks):
-    checks.scene("node-a orders the reboot of node-b")
+    checks.scene("node-a requests a reboot of node-b")
     lab.b.run("ternha-lab-tool log 201 250")
     on_disk = "cat /var/log/ha/ha.daemon.log 2>/dev/null || true"
     expected = [f"lab line {number}" for number in range(201, 251)]
@@ -335,8 +335,8 @@ def reboot_peer(lab: Lab, checks: Checks):
     order, rebooting, record = lab.a.run(
         "ternhactl reboot-peer --yes | tail -n 1; ternhactl rebooting || true; ternhactl status --json", 45
     ).splitlines()
-    checks.equal("the order is carried out", "The peer went down. It counts as rebooting until it answers again.", order)
-    checks.equal("node-a says rebooting", "yes", rebooting)
+    checks.equal("the request succeeds", "The peer went down. It counts as rebooting until it answers again.", order)
+    checks.equal("node-a reports rebooting", "yes", rebooting)
     checks.equal("and dead", False, parse_status(record)["isRemoteAlive"])
     checks.that("node-a has logged it", lab.a.has_logged(" Remote offline"), "Remote offline", lab.a.log()[-5:])
 
@@ -350,16 +350,16 @@ def reboot_peer(lab: Lab, checks: Checks):
     checks.that("node-b has another boot id", lab.b.boot_id != boot_id, f"other than {boot_id}", lab.b.boot_id)
     after = lab.b.run(on_disk).splitlines()
     checks.equal("the 50 lines are on its disk", expected, lab_lines(after))
-    checks.equal("and every other line up to the order", before, after[: len(before)])
+    checks.equal("and every earlier line", before, after[: len(before)])
 
     lab.b.run("mdadm --quiet --assemble /dev/md0 /dev/disk/md0 /dev/disk/md1 && drbdadm up r0")
     lab.b.release_daemon()
-    checks.within(RETURN_LIMIT, "both say alive and connected", lab.statuses, [WELL] * 2)
-    checks.equal("node-a no longer says rebooting", (1, "no\n"), lab.a.try_run("ternhactl rebooting"))
+    checks.within(RETURN_LIMIT, "both report alive and connected", lab.statuses, [WELL] * 2)
+    checks.equal("node-a no longer reports rebooting", (1, "no\n"), lab.a.try_run("ternhactl rebooting"))
 
 
 def measure(lab: Lab, checks: Checks):
-    checks.scene("What ternhad takes")
+    checks.scene("Resource use of ternhad")
     for node in lab.nodes:
         resident, anonymous = memory(node)
         checks.fact(f"memory on {node}: {resident} KiB resident, {anonymous} KiB of it anonymous")
@@ -370,7 +370,7 @@ def measure(lab: Lab, checks: Checks):
         lambda: [without_pids(node.supervised()[-2:]) for node in lab.nodes],
         [[["end", "0"], ["start"]]] * 2,
     )
-    checks.within(RETURN_LIMIT, "both say alive and connected", lab.statuses, [WELL] * 2)
+    checks.within(RETURN_LIMIT, "both report alive and connected", lab.statuses, [WELL] * 2)
     before = processor_use(lab)
     begin = time.monotonic()
     time.sleep(IDLE)

@@ -15,15 +15,15 @@ def kill(lab, checks: Checks, well: dict):
     times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
     lab.b.run("systemctl kill --signal=KILL ternhad")
     check_restarted(lab, checks, [*ends, "code=killed, status=9/KILL"], well)
-    checks.equal("node-a has never said dead", times_dead, service.times_dead(lab.a))
+    checks.equal("node-a has never declared the peer dead", times_dead, service.times_dead(lab.a))
 
 
 def unknown_request(lab, checks: Checks, well: dict):
-    checks.scene("node-a sends node-b a request that does not exist")
+    checks.scene("node-a sends node-b an unknown request")
     times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
     send(lab, "no_such_request")
     check_restarted(lab, checks, [*ends, ABORTED], well)
-    checks.equal("node-a has never said dead", times_dead, service.times_dead(lab.a))
+    checks.equal("node-a has never declared the peer dead", times_dead, service.times_dead(lab.a))
 
 
 def hung_thread(lab, checks: Checks, well: dict, setting: str):
@@ -36,7 +36,7 @@ def hung_thread(lab, checks: Checks, well: dict, setting: str):
     check_restarted(lab, checks, [*ends, ABORTED], well)
     watchdog = lab.b.run("journalctl --unit=ternhad --output=cat | grep -c 'Watchdog timeout'").strip()
     checks.equal("by the watchdog", "1", watchdog)
-    checks.equal("node-a has never said dead", times_dead, service.times_dead(lab.a))
+    checks.equal("node-a has never declared the peer dead", times_dead, service.times_dead(lab.a))
 
 
 def reload(lab, checks: Checks):

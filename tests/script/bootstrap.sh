@@ -29,11 +29,11 @@ stub sudo 'exit 1'
 
 stub dpkg-query 'echo installed amd64'
 bootstrap_as 1000 test
-[ "$code$calls" = 0 ] || fail "all is installed, and yet it does something"
+[ "$code$calls" = 0 ] || fail "it acts although all packages are installed"
 
 stub dpkg-query 'exit 1'
 bootstrap_as 1000 demo
-[ "$code$calls" = 1 ] || fail "without rights: exit code $code"
+[ "$code$calls" = 1 ] || fail "without privileges: exit code $code"
 says "apt-get install --no-install-recommends bubblewrap cmake g++ "
 
 # One library is installed only for the other architecture, one only for this one; the index is
@@ -51,9 +51,9 @@ calls '^apt-get -q install -y --no-install-recommends libgtest-dev:armhf libjson
 stub dpkg-query 'exit 1'
 stub apt-cache '[ "$2" = xz-utils ] || echo "$2 | 1.0 | here"'
 bootstrap_as 0 demo
-[ "$code" = 1 ] || fail "a package that is unknown: exit code $code"
-says "apt knows no package xz-utils. These need it: the demo, the tests and script/soak. All else works without it."
+[ "$code" = 1 ] || fail "unknown package: exit code $code"
+says "unknown package xz-utils, needed by the demo, the tests and script/soak; everything else works without it"
 if grep -q ' install ' <<<"$calls"; then fail "installs without all packages"; fi
 
 bootstrap_as 0 breakfast
-[ "$code" = 2 ] || fail "a purpose that is unknown: exit code $code"
+[ "$code" = 2 ] || fail "unknown purpose: exit code $code"
