@@ -104,8 +104,8 @@ int start(pid_t* pid, const char* path, const char* const argv[], int fd, int ta
     return error;
 }
 
-// Run a program without waiting: an intermediate process starts it and exits, so that init reaps the
-// program. Signals are blocked in that process, which is a copy of the caller.
+// Run a program without waiting: an intermediate process starts it and exits, so that init reaps
+// the program. Signals are blocked in that process, which is a copy of the caller.
 int startDetached(const char* path, const char* const argv[]) {
     sigset_t all;
     sigset_t before;

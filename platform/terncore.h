@@ -3,16 +3,16 @@
 #include <stdbool.h>  // NOLINT(modernize-deprecated-headers): for C, too
 #include <stdio.h>    // NOLINT(modernize-deprecated-headers)
 
-// The functions used of the appliance's core platform library, libterncore.so.6. The stub beside this
-// file implements them on other machines.
+// The functions used of the appliance's core platform library, libterncore.so.6. The stub beside
+// this file implements them on other machines.
 //
 // Every function may be called from any thread. No function throws.
 //
-// A started program has the caller's environment, working directory and standard
-// descriptors, apart from the one that a stream takes, and nothing else of the caller: no further
-// descriptor, no blocked and no ignored signal. It must be an executable regular file. Waits
-// continue after an interruption. The caller must not ignore SIGCHLD nor reap processes that it did not
-// start, otherwise the status of a program is lost and waiting for it fails.
+// A started program has the caller's environment, working directory and standard descriptors, apart
+// from the one that a stream takes, and nothing else of the caller: no further descriptor, no
+// blocked and no ignored signal. It must be an executable regular file. Waits continue after an
+// interruption. The caller must not ignore SIGCHLD nor reap processes that it did not start,
+// otherwise the status of a program is lost and waiting for it fails.
 
 #ifdef __cplusplus
 extern "C" {
@@ -41,11 +41,11 @@ FILE* PLATPopenv(const char* path, const char* mode, const char* const argv[]);
 int PLATPclose(FILE* stream);
 
 // Copies the value of `key` in the key-value file `file` into `value`, `size` bytes, always
-// terminated when `size` is at least 1 (empty unless the result is 1); a longer value is truncated. Lines
-// are key=value or key="value" and end with a line feed, also after a carriage return; blanks
-// around key and value, empty lines and lines that begin with '#' are ignored; the first line with the
-// key counts, and its value may be empty. `flags` must be 0. Returns 1 on success, 0 when the key
-// is missing, -1 when the file cannot be read or an argument is invalid.
+// terminated when `size` is at least 1 (empty unless the result is 1); a longer value is truncated.
+// Lines are key=value or key="value" and end with a line feed, also after a carriage return; blanks
+// around key and value, empty lines and lines that begin with '#' are ignored; the first line with
+// the key counts, and its value may be empty. `flags` must be 0. Returns 1 on success, 0 when the
+// key is missing, -1 when the file cannot be read or an argument is invalid.
 int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size, int flags);
 
 // True when something exists at `path` (links are followed).

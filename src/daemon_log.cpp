@@ -125,8 +125,8 @@ std::int64_t DaemonLog::size() const {
 }
 
 std::string DaemonLog::_formatedTime() const {
-    // Lines come in bursts: cache the stamp per second and zone. No destructor, so that logging works
-    // until the process exits.
+    // Lines come in bursts: cache the stamp per second and zone. No destructor, so that logging
+    // works until the process exits.
     struct Stamp {
         std::time_t time;
         std::array<char, 64> zone;

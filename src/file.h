@@ -42,9 +42,9 @@ bool readFile(const char* path, std::string& content);
 enum class Owner { any, trusted };
 
 // The same for a path that may not be a small regular file: does not block, reads at most `limit`
-// bytes, and returns false for other kinds of files. Owner::trusted, for directories that other users
-// can write to, also returns false for a symbolic link and for a file owned by another user than root
-// and that of this process.
+// bytes, and returns false for other kinds of files. Owner::trusted, for directories that other
+// users can write to, also returns false for a symbolic link and for a file owned by another user
+// than root and that of this process.
 bool readSmallFile(const char* path, std::size_t limit, Owner owner, std::string& content);
 
 }  // namespace TERN::HA::Daemon

@@ -10,11 +10,12 @@
 
 namespace TERN::HA::Daemon {
 
-// jsoncpp throws this besides std::bad_alloc when memory runs out: it allocates strings with malloc.
+// jsoncpp throws this besides std::bad_alloc when memory runs out: it allocates strings with
+// malloc.
 using JsonOutOfMemory = Json::RuntimeError;
 
-// Parse `text`, comments allowed. Returns false, with `value` unchanged, when it is not JSON or nests
-// too deep.
+// Parse `text`, comments allowed. Returns false, with `value` unchanged, when it is not JSON or
+// nests too deep.
 bool parseJson(const std::string& text, Json::Value& value);
 
 // Format `value`: compact, without newline, keys sorted.

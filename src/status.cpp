@@ -12,8 +12,8 @@ namespace {
 
 using Lock = std::unique_lock<std::timed_mutex>;
 
-// The lock may not be owned; callers proceed anyway. Waits on the monotonic clock: a step of the wall
-// clock must not change the duration.
+// The lock may not be owned; callers proceed anyway. Waits on the monotonic clock: a step of the
+// wall clock must not change the duration.
 // Frozen: docs/compatibility.md#status-without-lock
 Lock lockFor(std::timed_mutex& mutex, std::int32_t timeout) {
     return {mutex, std::chrono::steady_clock::now() + std::chrono::seconds(timeout)};

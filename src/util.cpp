@@ -29,8 +29,8 @@ Json::Value readDiskTable() {
     return table.isObject() ? table : Json::Value();
 }
 
-// Return the human-readable name of the disk at `position`: a slot of the main unit (M or 0-M) or of
-// an enclosure (N-M).
+// Return the human-readable name of the disk at `position`: a slot of the main unit (M or 0-M) or
+// of an enclosure (N-M).
 std::string readableName(const std::string& position, const std::string& container) {
     const std::size_t dash = position.find('-');
     if (dash == std::string::npos) {
