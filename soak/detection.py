@@ -1,4 +1,4 @@
-"""Detection times of failures of the peer: ternhad, keepalived and corosync on the same nodes."""
+"""How long each failure of the peer takes to be detected: ternhad, keepalived and corosync on the same nodes."""
 
 import random
 import signal
@@ -17,7 +17,7 @@ LIMIT = 60  # seconds
 
 
 class Watchers:
-    """The programs of both nodes with one setting. Those of node a monitor node b."""
+    """The programs of both nodes with one setting. Those of node a watch node b."""
 
     def __init__(self, cluster, setting, rivals=True):
         options, interval, token = SETTINGS[setting]
@@ -45,7 +45,7 @@ class Watchers:
         return seeing
 
     def detect(self, since, limit=LIMIT):
-        """Return the seconds from `since` until each program on node a detects the failure; None: never."""
+        """Seconds from `since` until each program on node a has seen its peer's failure; None: never."""
         times = dict.fromkeys(self.on_a)
         while None in times.values() and time.monotonic() - since < limit:
             for name in times:
@@ -100,7 +100,7 @@ def table_head(name, columns):
 
 
 def measure(cluster, times, settings, rivals):
-    """Print the table."""
+    """Prints the table."""
     print(f"seconds until detected, {times} times each: minimum, median, maximum\n")
     for setting in settings:
         watchers = Watchers(cluster, setting, rivals)

@@ -1,4 +1,4 @@
-"""Two nodes and a third host in namespaces of this machine, connected by a bridge."""
+"""Two nodes of one machine, and a third host: namespaces of their own, joined by a bridge."""
 
 import ctypes
 import os
@@ -24,7 +24,7 @@ def run(*argv):
 
 
 def eventually(limit, predicate, step=0.01):
-    """Return whether `predicate` holds within `limit` seconds."""
+    """Whether `predicate` holds within `limit` seconds."""
     end = time.monotonic() + limit
     while not predicate():
         if time.monotonic() >= end:
@@ -34,7 +34,7 @@ def eventually(limit, predicate, step=0.01):
 
 
 class Node:
-    """A node with its own network, processes, hostname, /tmp, /run, /var/log and /dev/shm."""
+    """Network, processes, host name, /tmp, /run, /var/log and /dev/shm of its own. `build` has the programs."""
 
     def __init__(self, name, build=None):
         self.name = name
@@ -69,7 +69,7 @@ class Node:
         run(*self.command(*argv))
 
     def start(self, name, *argv, **options):
-        """Start a process in the node under the key `name`."""
+        """A process of the node, to be known as `name`."""
         process = subprocess.Popen(self.command(*argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
                                    preexec_fn=die_with_parent, start_new_session=True, **options)
         self.processes[name] = process
@@ -98,7 +98,7 @@ class Node:
 
 
 class Cluster:
-    """Nodes a and b, host c, and a bridge between them in a separate namespace."""
+    """Nodes a and b, host c, and the bridge between them in a namespace of its own."""
 
     def __init__(self, build):
         self.switch = Node("switch")
@@ -128,7 +128,7 @@ class Cluster:
 
 
 class Daemon:
-    """ternhad on a node, with `options`."""
+    """A node's ternhad, with `options`."""
 
     def __init__(self, node, peer, options):
         self.node, self.peer, self.options = node, peer, options
@@ -147,7 +147,7 @@ class Daemon:
             self.journal += (self.node.processes["ternhad"].stderr.read() or b"").decode()
 
     def sees_peer(self):
-        """Return True, False, or None if unknown, from its socket or its log."""
+        """True, False, or None when that cannot be learnt: from its socket, or from its log."""
         answer = self._answer()
         return self._logged() if answer is None else answer
 
@@ -168,7 +168,7 @@ class Daemon:
                 return None
 
     def deaths(self):
-        """Return how often it declared its peer dead."""
+        """How often it has declared its peer dead."""
         text = ""
         for directory in ("/var/log/ha", "/tmp/ha"):
             log = self.node.path(f"{directory}/ha.daemon.log")

@@ -1,4 +1,4 @@
-"""Put node a under pressure; count false positives of both nodes and measure detection times."""
+"""Puts node a under pressure, and counts the false positives of both nodes and the delay of true ones."""
 
 import argparse
 import os
@@ -41,7 +41,7 @@ while True:
 
 
 class Control:
-    """A control group of node a with the given controller and limits."""
+    """A control group of node a, with the given controller and limits."""
 
     def __init__(self, controller, limits):
         self.path = Path(f"/sys/fs/cgroup/{controller}/ternha-pressure")
@@ -60,7 +60,7 @@ class Control:
             try:
                 parent.write_text(pid)
             except OSError:
-                pass  # already ended
+                pass  # it has ended
         eventually(10, lambda: not (self.path / "cgroup.procs").read_text())
         self.path.rmdir()
 
@@ -82,24 +82,19 @@ def real_time(watchers):
     yield
 
 
-def hog(watchers, group, program):
-    """Run `program` in the control group of node a's programs."""
+def fork_storm(watchers):
+    """fork storm at a limit of processes"""
     node = watchers.cluster.a
+    group = Control("pids", [(["pids.max"], 80)])
     for name in watchers.on_a:
         group.add(node.pid(name))
-    node.start("hog", "python3", "-c", program, stdin=subprocess.PIPE)
-    Path(f"/proc/{node.pid('hog')}/oom_score_adj").write_text("1000")
+    node.start("hog", "python3", "-c", FORKS, stdin=subprocess.PIPE)
     group.add(node.pid("hog"))
     node.processes["hog"].stdin.write(b"\n")
     node.processes["hog"].stdin.flush()
     yield
     node.kill(["hog"])
     group.end()
-
-
-def fork_storm(watchers):
-    """fork storm at a limit of processes"""
-    yield from hog(watchers, Control("pids", [(["pids.max"], 80)]), FORKS)
 
 
 def descriptors(watchers):
@@ -120,12 +115,22 @@ def descriptors(watchers):
 
 def memory(watchers):
     """memory cgroup thrashed"""
-    limit = (["memory.limit_in_bytes", "memory.max"], 80 << 20)
-    yield from hog(watchers, Control("memory", [limit]), THRASH)
+    node = watchers.cluster.a
+    group = Control("memory", [(["memory.limit_in_bytes", "memory.max"], 80 << 20)])
+    for name in watchers.on_a:
+        group.add(node.pid(name))
+    node.start("hog", "python3", "-c", THRASH, stdin=subprocess.PIPE)
+    Path(f"/proc/{node.pid('hog')}/oom_score_adj").write_text("1000")
+    group.add(node.pid("hog"))
+    node.processes["hog"].stdin.write(b"\n")
+    node.processes["hog"].stdin.flush()
+    yield
+    node.kill(["hog"])
+    group.end()
 
 
 def on_a_disk_of_its_own(watchers, directory, sicken, heal):
-    """Restart node a's programs with `directory` on a small disk and inject a fault into it."""
+    """Restarts node a's programs with `directory` on a small disk, and makes that sick."""
     node = watchers.cluster.a
     for watcher in watchers.on_a.values():
         watcher.end()
@@ -142,7 +147,7 @@ def on_a_disk_of_its_own(watchers, directory, sicken, heal):
     try:
         yield
     finally:
-        node.run(*heal)  # a frozen disk would outlive its namespace, with all blocked processes
+        node.run(*heal)  # a frozen disk would outlive its namespace, with all that waits for it
     for watcher in watchers.on_a.values():
         watcher.end()
     eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
@@ -214,9 +219,9 @@ RESTARTED = ("frozen", "full", "clock")  # conditions that restart node a's prog
 
 
 def press(watchers, condition, seconds):
-    """Return the false positives of each program on both nodes, and its detection time of node b's failure."""
+    """Returns each program's false positives on both nodes, and the seconds until node b's end was seen."""
     watchers.wait_until_alive()
-    # Node b is right to declare a stopped node a dead.
+    # Node b is right when it declares a stopped node a dead.
     observers = [watchers.on_a] if condition.startswith("stopped") else [watchers.on_a, watchers.on_b]
     deaths = lambda: {name: sum(observer[name].deaths() for observer in observers) for name in watchers.on_a}
     with closing(CONDITIONS[condition](watchers)) as steps:
@@ -227,7 +232,7 @@ def measure_under(watchers, condition, seconds, steps, deaths):
     before = deaths()
     next(steps)
     if "frozen" in condition or "full" in condition:
-        before = deaths()  # the programs were restarted
+        before = deaths()  # the programs were started again
     time.sleep(seconds)
     false_positives = {name: count - before[name] for name, count in deaths().items()}
     watchers.wait_until_alive() if not any(false_positives.values()) else time.sleep(5)
@@ -266,7 +271,7 @@ def main():
     parser.add_argument("--alone", action="store_true", help="without keepalived and corosync")
     options = parser.parse_args()
     require_root()
-    # Real-time priority, so that measuring is on time; children have the normal priority.
+    # Measures on time whatever the pressure; what it starts has the usual priority.
     os.sched_setscheduler(0, os.SCHED_RR | os.SCHED_RESET_ON_FORK, os.sched_param(99))
     settings = options.setting or (["fast"] if options.short else ["default", "fast"])
     rivals = not (options.short or options.alone)

@@ -1,4 +1,4 @@
-"""keepalived and corosync on the nodes, and their view of the peer."""
+"""keepalived and corosync on the nodes of a cluster, and when they see the peer's failure."""
 
 import os
 import re
@@ -68,7 +68,7 @@ class Keepalived:
             os.mkfifo(fifo)
         if self.fifo is None:
             self.fifo = os.open(fifo, os.O_RDWR | os.O_NONBLOCK)
-        for name in ("keepalived.pid", "vrrp.pid"):  # of a killed process that may still exist
+        for name in ("keepalived.pid", "vrrp.pid"):  # of a process that was killed and may not have gone yet
             self.node.path(f"/run/{name}").unlink(missing_ok=True)
         self.node.start("keepalived", "keepalived", "--dont-fork", "--vrrp", "-f", "/run/keepalived.conf", "-p",
                         "/run/keepalived.pid", "-r", "/run/vrrp.pid")
