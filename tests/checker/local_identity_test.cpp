@@ -79,8 +79,8 @@ TEST_F(LocalHostnameTest, SymbolicLinkIsNotFollowed) {
     EXPECT_EQ(getLocalHostname(), "");
 }
 
-// Return the name as an unprivileged user reads it. An unprivileged sandbox maps no second user: it stays
-// root.
+// Return the name as an unprivileged user reads it. An unprivileged sandbox maps no second user: it
+// stays root.
 std::string hostnameAsUser(uid_t user) {
     [[maybe_unused]] const int result = seteuid(user);
     std::string name = getLocalHostname();
