@@ -44,9 +44,16 @@ class Watchers:
             raise RuntimeError("ternhad does not see its peer")
         return seeing
 
-    def detect(self, since, limit=LIMIT):
-        """Seconds from `since` until each program on node a has seen its peer's failure; None: never."""
-        times = dict.fromkeys(self.on_a)
+    def revive(self):
+        """Starts all programs again when one of them does not see its peer any more."""
+        if len(self.wait_until_alive()) < len(self.on_a):
+            self.end()
+            self.start()
+            self.wait_until_alive()
+
+    def detect(self, names, since, limit=LIMIT):
+        """Seconds from `since` until each of the programs on node a has seen its peer's failure; None: never."""
+        times = dict.fromkeys(names)
         while None in times.values() and time.monotonic() - since < limit:
             for name in times:
                 if times[name] is None and self.on_a[name].sees_peer() is False:
@@ -100,8 +107,8 @@ def table_head(name, columns):
 
 
 def measure(cluster, times, settings, rivals):
-    """Prints the table."""
-    print(f"seconds until detected, {times} times each: minimum, median, maximum\n")
+    """Prints the table, each row when it is known."""
+    print(f"Seconds until detected, {times} times each: minimum, median, maximum", flush=True)
     for setting in settings:
         watchers = Watchers(cluster, setting, rivals)
         watchers.start()

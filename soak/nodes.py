@@ -70,7 +70,7 @@ class Node:
 
     def start(self, name, *argv, **options):
         """A process of the node, to be known as `name`."""
-        process = subprocess.Popen(self.command(*argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
+        process = subprocess.Popen(self.command(*self.prefix, *argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
                                    preexec_fn=die_with_parent, start_new_session=True, **options)
         self.processes[name] = process
         return process
@@ -128,7 +128,7 @@ class Cluster:
 
 
 class Daemon:
-    """A node's ternhad, with `options`."""
+    """A node's ternhad, with `options`. Its journal tells of changes, whatever becomes of descriptors and disks."""
 
     def __init__(self, node, peer, options):
         self.node, self.peer, self.options = node, peer, options
@@ -147,34 +147,15 @@ class Daemon:
             self.journal += (self.node.processes["ternhad"].stderr.read() or b"").decode()
 
     def sees_peer(self):
-        """True, False, or None when that cannot be learnt: from its socket, or from its log."""
-        answer = self._answer()
-        return self._logged() if answer is None else answer
-
-    def _logged(self):
-        log = self.node.path("/tmp/ha/ha.daemon.log")
-        text = log.read_text(errors="replace") if log.exists() else ""
-        alive, dead = text.rfind("changed to alive"), text.rfind("changed to dead")
-        return None if alive == dead else alive > dead
-
-    def _answer(self):
-        with socket.socket(socket.AF_UNIX, socket.SOCK_STREAM) as client:
-            client.settimeout(0.1)
-            try:
-                client.connect(str(self.node.path("/run/ternha/control.sock")))
-                client.send(b'{"act":"I"}')
-                return json.loads(client.recv(4096))["isRemoteAlive"]
-            except (OSError, ValueError):
-                return None
+        """True, False, or None when that is unknown."""
+        self._read()
+        states = re.findall(r"^ternhad: (started|peer-alive|peer-dead)\b", self.journal, re.MULTILINE)
+        return {"peer-alive": True, "peer-dead": False}.get(states[-1]) if states else None
 
     def deaths(self):
         """How often it has declared its peer dead."""
-        text = ""
-        for directory in ("/var/log/ha", "/tmp/ha"):
-            log = self.node.path(f"{directory}/ha.daemon.log")
-            if log.exists():
-                text += log.read_text(errors="replace")
-        return text.count("changed to dead")
+        self._read()
+        return self.journal.count("ternhad: peer-dead")
 
     def end(self):
         self._read()

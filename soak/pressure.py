@@ -82,19 +82,26 @@ def real_time(watchers):
     yield
 
 
+def hog_in(watchers, group, script):
+    """Runs `script` in a control group with node a's programs."""
+    node = watchers.cluster.a
+    try:
+        for name in watchers.on_a:
+            group.add(node.pid(name))
+        hog = node.start("hog", "python3", "-c", script, stdin=subprocess.PIPE)
+        Path(f"/proc/{hog.pid}/oom_score_adj").write_text("1000")
+        group.add(hog.pid)
+        hog.stdin.write(b"\n")
+        hog.stdin.flush()
+        yield
+    finally:
+        node.kill([name for name in ("hog",) if name in node.processes])
+        group.end()
+
+
 def fork_storm(watchers):
     """fork storm at a limit of processes"""
-    node = watchers.cluster.a
-    group = Control("pids", [(["pids.max"], 80)])
-    for name in watchers.on_a:
-        group.add(node.pid(name))
-    node.start("hog", "python3", "-c", FORKS, stdin=subprocess.PIPE)
-    group.add(node.pid("hog"))
-    node.processes["hog"].stdin.write(b"\n")
-    node.processes["hog"].stdin.flush()
-    yield
-    node.kill(["hog"])
-    group.end()
+    return hog_in(watchers, Control("pids", [(["pids.max"], 80)]), FORKS)
 
 
 def descriptors(watchers):
@@ -115,18 +122,32 @@ def descriptors(watchers):
 
 def memory(watchers):
     """memory cgroup thrashed"""
+    limit = (["memory.limit_in_bytes", "memory.max"], 80 << 20)
+    return hog_in(watchers, Control("memory", [limit]), THRASH)
+
+
+def clock_steps(watchers):
+    """wall clock of node a's programs an hour forward and back, each second"""
     node = watchers.cluster.a
-    group = Control("memory", [(["memory.limit_in_bytes", "memory.max"], 80 << 20)])
-    for name in watchers.on_a:
-        group.add(node.pid(name))
-    node.start("hog", "python3", "-c", THRASH, stdin=subprocess.PIPE)
-    Path(f"/proc/{node.pid('hog')}/oom_score_adj").write_text("1000")
-    group.add(node.pid("hog"))
-    node.processes["hog"].stdin.write(b"\n")
-    node.processes["hog"].stdin.flush()
-    yield
-    node.kill(["hog"])
-    group.end()
+    node.prefix = ["env", f"LD_PRELOAD={PROGRAMS}/stepped_clock.so"]
+    restart(watchers)
+    node.prefix = []
+    watchers.wait_until_alive()
+    step = "while :; do touch /run/stepped-clock; sleep 1; rm /run/stepped-clock; sleep 1; done"
+    node.start("steps", "sh", "-c", step)
+    try:
+        yield
+    finally:
+        node.kill(["steps"])
+        node.path("/run/stepped-clock").unlink(missing_ok=True)
+        restart(watchers)
+
+
+def restart(watchers):
+    """Restarts node a's programs."""
+    for watcher in watchers.on_a.values():
+        watcher.end()
+    watchers.start("a")
 
 
 def on_a_disk_of_its_own(watchers, directory, sicken, heal):
@@ -148,11 +169,11 @@ def on_a_disk_of_its_own(watchers, directory, sicken, heal):
         yield
     finally:
         node.run(*heal)  # a frozen disk would outlive its namespace, with all that waits for it
-    for watcher in watchers.on_a.values():
-        watcher.end()
-    eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
-                                          stderr=subprocess.DEVNULL).returncode == 0, 0.2)
-    watchers.start("a")
+        for watcher in watchers.on_a.values():
+            watcher.end()
+        eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
+                                              stderr=subprocess.DEVNULL).returncode == 0, 0.2)
+        watchers.start("a")
 
 
 def frozen(directory):
@@ -219,29 +240,24 @@ RESTARTED = ("frozen", "full", "clock")  # conditions that restart node a's prog
 
 
 def press(watchers, condition, seconds):
-    """Returns each program's false positives on both nodes, and the seconds until node b's end was seen."""
-    watchers.wait_until_alive()
+    """Returns a cell for each program: its false positives on both nodes, and the seconds until it saw node b's end.
+    And whether ternhad was right."""
+    watchers.revive()
     # Node b is right when it declares a stopped node a dead.
     observers = [watchers.on_a] if condition.startswith("stopped") else [watchers.on_a, watchers.on_b]
     deaths = lambda: {name: sum(observer[name].deaths() for observer in observers) for name in watchers.on_a}
     with closing(CONDITIONS[condition](watchers)) as steps:
-        return measure_under(watchers, condition, seconds, steps, deaths)
-
-
-def measure_under(watchers, condition, seconds, steps, deaths):
-    before = deaths()
-    next(steps)
-    if "frozen" in condition or "full" in condition:
-        before = deaths()  # the programs were started again
-    time.sleep(seconds)
-    false_positives = {name: count - before[name] for name, count in deaths().items()}
-    watchers.wait_until_alive() if not any(false_positives.values()) else time.sleep(5)
-    failure = vanished(watchers)
-    begin = time.monotonic()
-    next(failure)
-    delays = watchers.detect(begin, limit=20)
-    next(steps, None)
-    next(failure, None)
+        before = deaths()
+        next(steps)
+        if any(word in condition for word in RESTARTED):
+            before = deaths()
+        time.sleep(seconds)
+        wrong = {name: count - before[name] for name, count in deaths().items()}
+        seeing = watchers.wait_until_alive(20)
+        failure = vanished(watchers)
+        begin = time.monotonic()
+        next(failure)
+        delays = watchers.detect(seeing, begin, limit=20)
     for node in (watchers.cluster.a, watchers.cluster.c):
         node.kill([name for name in node.processes if name not in watchers.on_a])
     next(failure, None)

@@ -41,10 +41,10 @@ bool readFile(const char* path, std::string& content);
 
 enum class Owner { any, trusted };
 
-// The same for a path that may not be a small regular file: does not block, reads at most `limit`
-// bytes, and returns false for other kinds of files. Owner::trusted, for directories that other
-// users can write to, also returns false for a symbolic link and for a file owned by another user
-// than root and that of this process.
-bool readSmallFile(const char* path, std::size_t limit, Owner owner, std::string& content);
+// Return the content of a small file: does not block, and reads at most `limit` bytes. Empty if it
+// cannot be opened or is not a regular file. Owner::trusted, for directories that other users can
+// write to: also empty for a symbolic link and for a file owned by another user than root and that
+// of this process.
+std::string readSmallFile(const char* path, std::size_t limit, Owner owner);
 
 }  // namespace TERN::HA::Daemon
