@@ -195,7 +195,7 @@ INSTANTIATE_TEST_SUITE_P(Ternhactl, Transcript,
                                            "unsafe_failover", "usage"),
                          [](const auto& transcript) { return transcript.param; });
 
-TEST_F(TernhactlTest, SaysThatThereIsNoDaemonAndExitsWithThree) {
+TEST_F(TernhactlTest, ExitsWith3WithoutADaemon) {
     for (const std::string command : {"status", "status --json", "rebooting", "disks", "reboot-peer --yes"}) {
         const auto result = shell("ternhactl " + command);
         EXPECT_EQ(result.exitCode, 3) << command;
@@ -215,7 +215,7 @@ TEST_F(TernhactlTest, SaysThatThereIsNoDaemonAndExitsWithThree) {
     EXPECT_THAT(metrics.output, HasSubstr("\nternha_up 0\n"));
 }
 
-TEST_F(TernhactlTest, GivesUpOnASilentDaemonAfterItsTimeout) {
+TEST_F(TernhactlTest, SilentDaemonEndsInATimeout) {
     const RawServer server;
     const test::Stopwatch stopwatch;
     const auto result = shell("ternhactl --timeout 1 status");
@@ -225,7 +225,7 @@ TEST_F(TernhactlTest, GivesUpOnASilentDaemonAfterItsTimeout) {
               "ternhactl: ternhad does not answer on /run/ternha/control.sock: no reply within 1 s\n");
 }
 
-TEST_F(TernhactlTest, GivesUpInTimeWhenNoConnectionIsAccepted) {
+TEST_F(TernhactlTest, FullBacklogEndsInATimeout) {
     const RawServer server;
     std::vector<test::Process> waiting;  // fill the queue
     for (int i = 0; i < 12; ++i) {
@@ -242,7 +242,7 @@ TEST_F(TernhactlTest, GivesUpInTimeWhenNoConnectionIsAccepted) {
     EXPECT_LT(stopwatch.elapsed(), 1900ms);
 }
 
-TEST_F(TernhactlTest, GivesUpInTimeOnHalfAReply) {
+TEST_F(TernhactlTest, HalfAReplyEndsInATimeout) {
     const RawServer server;
     const test::Stopwatch stopwatch;
     test::Process status({TERNHACTL_DIR "/ternhactl", "--timeout", "1", "status"});
@@ -301,7 +301,7 @@ void PrintTo(const EndlessReply& reply, std::ostream* stream) {
 
 class EndlessReplyTest : public TernhactlTest, public ::testing::WithParamInterface<EndlessReply> {};
 
-TEST_P(EndlessReplyTest, DoesNotKeepAnyCommandBeyondItsTimeout) {
+TEST_P(EndlessReplyTest, EveryCommandEndsWithinItsTimeout) {
     const EndlessServer server(GetParam().part, GetParam().pause);
     std::vector<test::Process> commands;
     for (const std::string command : {"status", "status --json", "disks", "check", "metrics", "rebooting",
@@ -322,7 +322,7 @@ INSTANTIATE_TEST_SUITE_P(Replies, EndlessReplyTest,
                                            EndlessReply{"Flood", std::string(65536, ' '), 0ms}),
                          [](const auto& reply) { return reply.param.name; });
 
-TEST_F(TernhactlTest, TellsWhyTheDaemonDoesNotAnswer) {
+TEST_F(TernhactlTest, ReportsTheCauseWhenTheDaemonDoesNotReply) {
     const auto reason = [](const std::string& command) {
         const std::string output = shell(command).output;
         return output.substr(output.rfind(": ") + 2);
@@ -339,7 +339,7 @@ TEST_F(TernhactlTest, TellsWhyTheDaemonDoesNotAnswer) {
               "Permission denied\n");
 }
 
-TEST_F(TernhactlTest, SaysThatTheOutputCannotBeWritten) {
+TEST_F(TernhactlTest, ReportsOutputErrors) {
     Status status;
     const ControlServer server(status);
     Json::Value disks(Json::arrayValue);
@@ -365,7 +365,7 @@ TEST_F(TernhactlTest, SaysThatTheOutputCannotBeWritten) {
     EXPECT_EQ(file.output, "ternhactl: cannot write /nowhere/ternha.prom: No such file or directory\n");
 }
 
-TEST_F(TernhactlTest, ReplacesAFileOfMetricsInOneStep) {
+TEST_F(TernhactlTest, ReplacesAMetricsFileAtomically) {
     Status status;
     const ControlServer server(status);
     test::writeFile("/tmp/ternha.prom", "old\n");
@@ -383,7 +383,7 @@ TEST_F(TernhactlTest, ReplacesAFileOfMetricsInOneStep) {
     EXPECT_EQ(shell("ternhactl metrics --output /tmp/ternha.prom").exitCode, 0);
 }
 
-TEST_F(TernhactlTest, RejectsAReplyThatIsNotTheDaemons) {
+TEST_F(TernhactlTest, RejectsAnInvalidReply) {
     const RawServer server;
     for (const std::string reply : {"[1,2]", "{", "nonsense"}) {
         std::thread answer([&] { server.answerOnce(reply); });
@@ -394,7 +394,7 @@ TEST_F(TernhactlTest, RejectsAReplyThatIsNotTheDaemons) {
     }
 }
 
-TEST_F(TernhactlTest, ShowsUnknownForFieldsThatAreMissingOrOfWrongTypes) {
+TEST_F(TernhactlTest, ShowsMissingAndMistypedFieldsAsUnknown) {
     const RawServer server;
     std::thread answer([&server] {
         server.answerOnce(R"({"version":1,"peer":{"alive":{"value":"yes"},"disks":7},"node":[],)"
@@ -408,7 +408,7 @@ TEST_F(TernhactlTest, ShowsUnknownForFieldsThatAreMissingOrOfWrongTypes) {
     EXPECT_EQ(result.exitCode, 3);
 }
 
-TEST_F(TernhactlTest, ColoursOnlyATerminal) {
+TEST_F(TernhactlTest, UsesColourOnATerminalOnly) {
     Status status;
     const ControlServer server(status);
     EXPECT_THAT(shell("ternhactl status").output, Not(HasSubstr("\033")));
@@ -419,7 +419,7 @@ TEST_F(TernhactlTest, ColoursOnlyATerminal) {
     EXPECT_THAT(shell("NO_COLOR=1 script -qec 'ternhactl status' /dev/null").output, Not(HasSubstr("\033")));
 }
 
-TEST_F(TernhactlTest, WatchShowsChangesAsTheyComeAndKeepsTheLastStatusWhenTheDaemonStops) {
+TEST_F(TernhactlTest, WatchShowsChangesAndKeepsTheLastStatusWhenTheDaemonStops) {
     Status status;
     auto server = std::make_unique<ControlServer>(status);
     test::Process watch({TERNHACTL_DIR "/ternhactl", "status", "--watch", "0.1"});
@@ -450,7 +450,7 @@ TEST_F(TernhactlTest, WatchShowsChangesAsTheyComeAndKeepsTheLastStatusWhenTheDae
     EXPECT_TRUE(watch.waitFor(5s).has_value());
 }
 
-TEST_F(TernhactlTest, AsksBeforeAReboot) {
+TEST_F(TernhactlTest, RebootAsksForConfirmation) {
     Status status;
     const ControlServer server(status);
     const auto refused = shell("echo n | ternhactl reboot-peer");
@@ -461,7 +461,7 @@ TEST_F(TernhactlTest, AsksBeforeAReboot) {
     EXPECT_FALSE(status.isRemoteRebooting());
 }
 
-TEST_F(TernhactlTest, TellsWhatBecameOfAnOrderToReboot) {
+TEST_F(TernhactlTest, ReportsTheOutcomeOfAReboot) {
     remoteIP("127.0.0.2");
     Status status;
     const ControlServer server(status);
@@ -481,7 +481,7 @@ TEST_F(TernhactlTest, TellsWhatBecameOfAnOrderToReboot) {
     EXPECT_EQ(status.getRemoteNodeState(), TERN::HA::Daemon::NodeRebooting);
 }
 
-TEST_F(TernhactlTest, SaysThatThePeerWasNotRebooted) {
+TEST_F(TernhactlTest, ReportsAPeerThatWasNotRebooted) {
     const RawServer server;
     const std::string report = R"({"version":1,"peer":{"alive":{"value":true}}})";
     std::thread answer([&] {
@@ -495,7 +495,7 @@ TEST_F(TernhactlTest, SaysThatThePeerWasNotRebooted) {
     EXPECT_THAT(result.output, EndsWith("The peer still answers: it was not rebooted.\n"));
 }
 
-TEST_F(TernhactlTest, OrdersNoSecondRebootMeanwhile) {
+TEST_F(TernhactlTest, RefusesASecondRebootMeanwhile) {
     Status status;
     status.setRemoteAlive(true);
     status.addRemoteNodeState(TERN::HA::Daemon::NodeRebootPending);
@@ -510,7 +510,7 @@ constexpr char EVENTS[] =
     "{\"event\":\"resync\",\"new\":\"resync\",\"old\":\"no-resync\",\"time\":0}\n"
     "{\"event\":\"peer\",\"new\":\"peer-dead\",\"old\":\"peer-alive\",\"time\":60}\n";
 
-TEST_F(TernhactlTest, PrintsEventsAsTheyComeUntilTheDaemonEnds) {
+TEST_F(TernhactlTest, PrintsEventsUntilTheDaemonEnds) {
     const RawServer server;
     for (const std::string option : {"", " --json"}) {
         std::thread answer([&server] { server.answerOnce(EVENTS); });
@@ -526,7 +526,7 @@ TEST_F(TernhactlTest, PrintsEventsAsTheyComeUntilTheDaemonEnds) {
     }
 }
 
-TEST_F(TernhactlTest, SaysThatEventsCannotBeWritten) {
+TEST_F(TernhactlTest, ReportsOutputErrorsOfEvents) {
     const RawServer server;
     std::thread answer([&server] { server.answerOnce(EVENTS); });
     const auto result = shell("ternhactl events >/dev/full");
@@ -549,7 +549,7 @@ TEST_F(TernhactlTest, WaitsUntilAConditionHolds) {
     EXPECT_EQ(waitFor("resync --timeout 600"), 0);
 }
 
-TEST_F(TernhactlTest, StopsWaitingForAConditionInTime) {
+TEST_F(TernhactlTest, WaitEndsAtItsTimeout) {
     const RawServer server;
     std::thread answer([&server] {
         const int connection = server.accept();

@@ -75,7 +75,7 @@ class DaemonTest : public ::testing::Test {
     }
 };
 
-TEST_F(DaemonTest, MakesItsDirectoriesAndSocketForItselfAlone) {
+TEST_F(DaemonTest, CreatesPrivateDirectoriesAndSocket) {
     auto daemon = startAndWait();
     EXPECT_EQ(modeOf("/tmp/ha"), 0700U);
     EXPECT_EQ(modeOf("/var/log/ha"), 0700U);
@@ -86,7 +86,7 @@ TEST_F(DaemonTest, MakesItsDirectoriesAndSocketForItselfAlone) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, LeavesDirectoriesThatAreThere) {
+TEST_F(DaemonTest, KeepsExistingDirectories) {
     test::makeDirectories("/var/log/ha");
     ASSERT_EQ(chmod("/var/log/ha", 0750), 0);
     auto daemon = startAndWait();
@@ -101,13 +101,13 @@ void expectRefusal(const std::string& reason) {
     EXPECT_FALSE(test::exists(test::CONTROL_SOCKET));
 }
 
-TEST_F(DaemonTest, RefusesABufferDirectoryThatIsALink) {
+TEST_F(DaemonTest, RefusesASymbolicLinkAsBufferDirectory) {
     test::makeDirectories("/tmp/elsewhere");
     std::filesystem::create_symlink("/tmp/elsewhere", "/tmp/ha");
     expectRefusal("not a directory");
 }
 
-TEST_F(DaemonTest, RefusesABufferDirectoryThatIsAFile) {
+TEST_F(DaemonTest, RefusesAFileAsBufferDirectory) {
     test::writeFile("/tmp/ha", "");
     expectRefusal("not a directory");
 }
@@ -121,7 +121,7 @@ TEST_F(DaemonTest, RefusesABufferDirectoryOfAnotherUser) {
     expectRefusal("belongs to another user");
 }
 
-TEST_F(DaemonTest, RefusesABufferDirectoryThatOthersCanWriteTo) {
+TEST_F(DaemonTest, RefusesAWorldWritableBufferDirectory) {
     test::makeDirectories("/tmp/ha");
     ASSERT_EQ(chmod("/tmp/ha", 0777), 0);
     expectRefusal("others can write to it");
@@ -147,7 +147,7 @@ TEST_F(DaemonTest, RefusesABufferDirectoryWithAFifoInIt) {
     EXPECT_EQ(result.error, "ternhad: /tmp/ha/ha.daemon.record: neither a file nor a directory\n");
 }
 
-TEST_F(DaemonTest, UsesABufferDirectoryOfItsOwn) {
+TEST_F(DaemonTest, AcceptsItsOwnBufferDirectory) {
     test::makeDirectories("/tmp/ha");
     ASSERT_EQ(chmod("/tmp/ha", 0700), 0);
     test::writeFile("/tmp/ha/info_hd.remote", "{}");
@@ -218,7 +218,7 @@ class SilentClient {
     test::Descriptor _fd{socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0), "cannot make a socket"};
 };
 
-TEST_F(DaemonTest, SilentClientsDelayNobodyAndLoseTheirConnectionsAfterFiveSeconds) {
+TEST_F(DaemonTest, SilentClientsDelayNobodyAndAreDroppedAfterFiveSeconds) {
     auto daemon = startAndWait();
     const test::Stopwatch stopwatch;
     const std::vector<SilentClient> silent(15);
@@ -232,14 +232,14 @@ TEST_F(DaemonTest, SilentClientsDelayNobodyAndLoseTheirConnectionsAfterFiveSecon
     stop(daemon);
 }
 
-TEST_F(DaemonTest, AVanishedControlSocketIsMadeAgain) {
+TEST_F(DaemonTest, RemovedControlSocketIsCreatedAgain) {
     auto daemon = startAndWait();
     test::removeTree(test::CONTROL_SOCKET);
     EXPECT_TRUE(test::eventually(15s, isUp));
     stop(daemon);
 }
 
-TEST_F(DaemonTest, ASecondDaemonLeavesTheFirstAlone) {
+TEST_F(DaemonTest, SecondInstanceExitsAndLeavesTheFirstAlone) {
     auto daemon = startAndWait();
     const auto second = test::run(test::daemonArguments("127.0.0.5", "127.0.0.2", "lo"));
     EXPECT_EQ(second.exitCode, 3);
@@ -248,7 +248,7 @@ TEST_F(DaemonTest, ASecondDaemonLeavesTheFirstAlone) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, AThousandClientsInARowAreServed) {
+TEST_F(DaemonTest, ServesAThousandClientsInARow) {
     auto daemon = startAndWait();
     for (int i = 0; i < 1000; ++i) {
         ASSERT_TRUE(test::statusAt().isObject()) << i;
@@ -256,7 +256,7 @@ TEST_F(DaemonTest, AThousandClientsInARowAreServed) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, AHundredClientsAtOnceAreServedAlthoughSomeLeave) {
+TEST_F(DaemonTest, ServesAHundredClientsAtOnceAlthoughSomeDisconnect) {
     auto daemon = startAndWait();
     std::atomic<int> served{0};
     std::vector<std::thread> clients;
@@ -278,7 +278,7 @@ TEST_F(DaemonTest, AHundredClientsAtOnceAreServedAlthoughSomeLeave) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, ReadsItsConfigurationAndTheCommandLineWins) {
+TEST_F(DaemonTest, CommandLineOverridesTheConfigurationFile) {
     test::writeFile("/tmp/ternhad.conf",
                     "# of this node\nlocal-ip = 127.0.0.1\nremote-ip = 127.0.0.9\ninterface = lo\n"
                     "socket = /run/other/control.sock\n");
@@ -293,7 +293,7 @@ TEST_F(DaemonTest, ReadsItsConfigurationAndTheCommandLineWins) {
 
 class StopTest : public DaemonTest, public ::testing::WithParamInterface<int> {};
 
-TEST_P(StopTest, LeavesTheLogOnDiskAndNoSocket) {
+TEST_P(StopTest, MovesTheLogToDiskAndRemovesTheSocket) {
     auto daemon = startAndWait();
     stop(daemon, GetParam());
     EXPECT_FALSE(test::exists(test::CONTROL_SOCKET));
@@ -318,7 +318,7 @@ TEST_F(DaemonTest, AStoppedCheckDoesNotDeclareThePeerDead) {
     EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
 }
 
-TEST_F(DaemonTest, APingThatWouldTakeLongDoesNotDelayTheStop) {
+TEST_F(DaemonTest, SlowPingDoesNotDelayTheStop) {
     test::replaceProgram("/bin/ping", ": > /tmp/pinging; exec sleep 60");
     test::UdpSocket peer("127.0.0.2", 7499);
     auto daemon = start();
@@ -332,7 +332,7 @@ TEST_F(DaemonTest, APingThatWouldTakeLongDoesNotDelayTheStop) {
     EXPECT_NE(test::run({"pgrep", "sleep"}).exitCode, 0);
 }
 
-TEST_F(DaemonTest, HangupMovesAndRotatesTheLogs) {
+TEST_F(DaemonTest, SighupMovesAndRotatesTheLogs) {
     auto daemon = startAndWait({"--log-interval", "3600"});
     daemon.signal(SIGHUP);
     EXPECT_TRUE(test::eventually(10s, [] {
@@ -345,7 +345,7 @@ TEST_F(DaemonTest, HangupMovesAndRotatesTheLogs) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, ALogThatHasGrownIsRotated) {
+TEST_F(DaemonTest, LargeLogIsRotated) {
     auto daemon = startAndWait({"--log-interval", "0.1", "--rotate-size", "4096"});
     test::appendFile("/tmp/ha/ha.daemon.log", std::string(5000, 'x') + "\n");
     EXPECT_TRUE(test::eventually(10s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
@@ -353,7 +353,7 @@ TEST_F(DaemonTest, ALogThatHasGrownIsRotated) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, ALogThatCannotBeCompressedDoesNotCostAnArchiveAtEachMove) {
+TEST_F(DaemonTest, FailedCompressionKeepsTheArchives) {
     test::replaceProgram("/bin/xz", "echo \"$1\" >> /tmp/compressions; exit 1");
     const std::string archive = "/var/log/ha/ha.daemon.log.0.xz";
     test::writeFile(archive, "kept");
@@ -380,13 +380,13 @@ TEST_F(DaemonTest, ALogThatCannotBeCompressedDoesNotCostAnArchiveAtEachMove) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, AnAddressOfAnotherMachineEndsIt) {
+TEST_F(DaemonTest, ExitsWhenTheAddressIsNotLocal) {
     const auto result = test::run(test::daemonArguments("10.9.8.7", "127.0.0.2", "lo"));
     EXPECT_EQ(result.exitCode, 1);
     EXPECT_EQ(result.error, "ternhad: cannot serve the peer on 10.9.8.7: Cannot assign requested address\n");
 }
 
-TEST_F(DaemonTest, ATakenPortEndsIt) {
+TEST_F(DaemonTest, ExitsWhenThePortIsTaken) {
     const test::UdpSocket other("127.0.0.1", 7499);
     const auto result = test::run(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
     EXPECT_EQ(result.exitCode, 1);
@@ -394,7 +394,7 @@ TEST_F(DaemonTest, ATakenPortEndsIt) {
     EXPECT_FALSE(test::exists(test::CONTROL_SOCKET));
 }
 
-TEST_F(DaemonTest, ASocketThatCannotBeBoundEndsIt) {
+TEST_F(DaemonTest, ExitsWhenTheControlSocketCannotBeBound) {
     test::writeFile(test::CONTROL_SOCKET, "kept");
     const auto result = test::run(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
     EXPECT_EQ(result.exitCode, 1);
@@ -402,7 +402,7 @@ TEST_F(DaemonTest, ASocketThatCannotBeBoundEndsIt) {
     EXPECT_THAT(result.error, HasSubstr("cannot bind the control socket /run/ternha/control.sock"));
 }
 
-TEST_F(DaemonTest, AnUnknownQuestionEndsItBySignal) {
+TEST_F(DaemonTest, UnknownRequestAbortsIt) {
     auto daemon = startAndWait();
     waitForAnswers();
     test::UdpSocket stranger("127.0.0.3", 40000);
@@ -422,7 +422,7 @@ int answersAt(test::UdpSocket& socket, const std::string& expected, std::chrono:
     return count;
 }
 
-TEST_F(DaemonTest, AFloodOfQuestionsGetsNoAnswerTwiceOrForSomebodyElse) {
+TEST_F(DaemonTest, FloodOfRequestsGetsNoDuplicateOrMisdirectedReply) {
     test::writeFile("/tmp/.ha.hostname.original", "node-a");
     auto daemon = startAndWait();
     waitForAnswers();
@@ -460,7 +460,7 @@ TEST_F(DaemonTest, AFloodOfQuestionsGetsNoAnswerTwiceOrForSomebodyElse) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, KnowsItsOwnTroubles) {
+TEST_F(DaemonTest, ReportsItsOwnResyncAndDiskErrors) {
     test::writeFile("/proc/drbd", " 0: cs:StandAlone ro:Primary/Unknown\n");
     auto daemon = startAndWait();
     ASSERT_TRUE(test::eventually(10s, [] { return !test::statusAt()["isDRBDConnect"].asBool(); }));
@@ -489,7 +489,7 @@ TEST_F(DaemonTest, KnowsItsOwnTroubles) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, RecordsASnapshotWhenItStarts) {
+TEST_F(DaemonTest, TakesASnapshotAtTheStart) {
     auto daemon = startAndWait({"--snapshot-interval", "3600"});
     EXPECT_TRUE(test::eventually(10s, [] {
         const std::string record = test::wholeLog("", "ha.daemon.record");
@@ -500,7 +500,7 @@ TEST_F(DaemonTest, RecordsASnapshotWhenItStarts) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, RecordsSnapshotsAtTheirInterval) {
+TEST_F(DaemonTest, TakesSnapshotsAtTheirInterval) {
     auto daemon = startAndWait({"--snapshot-interval", "0.2"});
     EXPECT_TRUE(test::eventually(10s, [] {
         return test::messages(test::wholeLog()).size() > 0 && test::recordEntries().size() >= 12;
@@ -522,7 +522,7 @@ void play(test::UdpSocket& peer, const std::function<std::string(const std::stri
     }));
 }
 
-TEST_F(DaemonTest, TakesAReportThatCannotBeReadForTrouble) {
+TEST_F(DaemonTest, UnreadableDiskReportCountsAsDiskErrors) {
     test::UdpSocket peer("127.0.0.2", 7499);
     auto daemon = start();
     play(
@@ -536,7 +536,7 @@ TEST_F(DaemonTest, TakesAReportThatCannotBeReadForTrouble) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, ALostAnswerIsNoDeath) {
+TEST_F(DaemonTest, OneLostReplyKeepsThePeerAlive) {
     test::UdpSocket peer("127.0.0.2", 7499);
     auto daemon = start();
     int questions = 0;
@@ -553,7 +553,7 @@ TEST_F(DaemonTest, ALostAnswerIsNoDeath) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, APeerThatAnswersNothingAnyMoreIsDead) {
+TEST_F(DaemonTest, SilentPeerIsDead) {
     test::UdpSocket peer("127.0.0.2", 7499);
     auto daemon = start();
     play(
@@ -571,7 +571,7 @@ TEST_F(DaemonTest, APeerThatAnswersNothingAnyMoreIsDead) {
     stop(daemon);
 }
 
-TEST_F(DaemonTest, WhatIsNotAnsweredLeavesTheKnownState) {
+TEST_F(DaemonTest, MissingReplyKeepsTheLastState) {
     test::UdpSocket peer("127.0.0.2", 7499);
     auto daemon = start();
     const std::string report = R"({"errHandlingDisk":["sda"],"isDiskErrHandling":true})";

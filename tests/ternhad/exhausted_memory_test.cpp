@@ -41,7 +41,7 @@ class ExhaustedMemoryTest : public ::testing::Test {
     Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
 };
 
-TEST_F(ExhaustedMemoryTest, ThatComesBackHasEndedNothing) {
+TEST_F(ExhaustedMemoryTest, TemporaryExhaustionEndsNothing) {
     a.write("/tmp/no-memory", "");
     EXPECT_TRUE(test::eventually(20s, [this] { return failedSteps() > 20; })) << a.daemon->error();
     test::removeTree(a.node.path("/tmp/no-memory"));
@@ -57,7 +57,7 @@ TEST_F(ExhaustedMemoryTest, ThatComesBackHasEndedNothing) {
 }
 
 // What it says would be old.
-TEST_F(ExhaustedMemoryTest, ThatStaysAwayEndsTheDaemon) {
+TEST_F(ExhaustedMemoryTest, LastingExhaustionEndsTheDaemon) {
     const test::Stopwatch stopwatch;
     a.write("/tmp/no-memory", "");
     const auto status = a.daemon->waitFor(60s);

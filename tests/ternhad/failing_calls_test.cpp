@@ -28,7 +28,7 @@ class FailingCallsTest : public test::SickMachineTest {
 };
 
 // Not with sanitizers either, which need descriptors of their own.
-TEST_F(FailingCallsTest, LackOfDescriptorsIsNeitherThePeersDeathNorItsDiskErrors) {
+TEST_F(FailingCallsTest, LackOfDescriptorsMeansNeitherDeadPeerNorDiskErrors) {
     start();
     // Any new descriptor takes the lowest free number.
     rlim_t free = 0;
@@ -52,7 +52,7 @@ TEST_F(FailingCallsTest, LackOfDescriptorsIsNeitherThePeersDeathNorItsDiskErrors
     expectEndInTime();
 }
 
-TEST_F(FailingCallsTest, ProbesThatCannotLeaveAreLoggedOnceAndAreNotThePeersDeath) {
+TEST_F(FailingCallsTest, UnsentProbesAreLoggedOnceAndKeepThePeerAlive) {
     start({"--dead-after", "0.6"});
     test::writeFile("/tmp/no-buffers", "");
     EXPECT_TRUE(test::eventually(20s, [] {
@@ -71,7 +71,7 @@ TEST_F(FailingCallsTest, ProbesThatCannotLeaveAreLoggedOnceAndAreNotThePeersDeat
     expectEndInTime();
 }
 
-TEST_F(FailingCallsTest, ProbesThatCannotLeaveFromTheStartAreNotThePeersDeath) {
+TEST_F(FailingCallsTest, UnsentProbesFromTheStartLeaveThePeerUnknown) {
     test::writeFile("/tmp/no-buffers", "");
     startAlone({"--dead-after", "0.6"});
     EXPECT_FALSE(test::eventually(3s, [this] { return says("peer-dead"); }));
@@ -80,7 +80,7 @@ TEST_F(FailingCallsTest, ProbesThatCannotLeaveFromTheStartAreNotThePeersDeath) {
     expectEndInTime();
 }
 
-TEST_F(FailingCallsTest, AHangingSyncHindersNoReboot) {
+TEST_F(FailingCallsTest, HungSyncDoesNotPreventAReboot) {
     start();
     test::writeFile("/tmp/hanging-sync", "");
     orderReboot();
@@ -101,7 +101,7 @@ double processorTime(pid_t process) {
     return (user + kernel) / static_cast<double>(sysconf(_SC_CLK_TCK));
 }
 
-TEST_F(FailingCallsTest, AFlushThatEndsAfterItsOrderCostsNoProcessor) {
+TEST_F(FailingCallsTest, LateFlushCostsNoProcessorTime) {
     test::removeTree(test::TRIGGER);
     test::makeDirectories(test::TRIGGER);
     start();
@@ -118,7 +118,7 @@ TEST_F(FailingCallsTest, AFlushThatEndsAfterItsOrderCostsNoProcessor) {
     expectEndInTime();
 }
 
-TEST_F(FailingCallsTest, FrozenDisksDoNotHinderARestart) {
+TEST_F(FailingCallsTest, FrozenDisksDoNotPreventARestart) {
     start();
     expectEndInTime();
     test::writeFile("/tmp/frozen-disks", "");
@@ -126,7 +126,7 @@ TEST_F(FailingCallsTest, FrozenDisksDoNotHinderARestart) {
     expectEndInTime();
 }
 
-TEST_F(FailingCallsTest, StepsOfTheWallClockChangeNothing) {
+TEST_F(FailingCallsTest, WallClockStepsChangeNothing) {
     start({"--dead-after", "0.6"});
     for (int i = 0; i < 5; ++i) {
         test::writeFile("/tmp/stepped-clock", "");
@@ -156,7 +156,7 @@ class Undying {
     pid_t _process;
 };
 
-TEST_F(FailingCallsTest, ALogKeeperThatHangsIsReplacedAndLeftBehind) {
+TEST_F(FailingCallsTest, HungLogKeeperIsReplacedAndLeftBehind) {
     test::replaceProgram("/bin/xz", ": > /tmp/compressing; exec sleep 600");
     start({"--log-interval", "3600", "--dead-after", "0.6"});
     const pid_t keeper = test::childOf(daemon->pid());
@@ -180,7 +180,7 @@ TEST_F(FailingCallsTest, ALogKeeperThatHangsIsReplacedAndLeftBehind) {
 }
 
 // It is looked at before it is read, and an order must not slip through between the two.
-TEST_F(FailingCallsTest, AnOrderThatComesInPiecesIsRefusedByTheStatusSocket) {
+TEST_F(FailingCallsTest, StatusSocketRefusesARebootRequestInPieces) {
     start({"--status-socket", "/run/ternha/status.sock", "--status-group", "daemon"});
     test::writeFile("/tmp/slow-client", "");
     const auto order = test::control("--socket /run/ternha/status.sock reboot-peer --yes");

@@ -101,7 +101,7 @@ TEST_F(FailureDetectorTest, TimeInWhichTheProcessWasStoppedDoesNotCountBeforeThe
     EXPECT_TRUE(detector.isPeerDead());
 }
 
-TEST_F(FailureDetectorTest, ProbesThatCannotLeaveAreNotMissedBeforeTheFirstReply) {
+TEST_F(FailureDetectorTest, UnsentProbesAreNotMissedBeforeTheFirstReply) {
     sending = Sending::fails;
     runUntil(100s);
     EXPECT_FALSE(detector.isPeerDead());
@@ -111,7 +111,7 @@ TEST_F(FailureDetectorTest, ProbesThatCannotLeaveAreNotMissedBeforeTheFirstReply
     EXPECT_TRUE(detector.isPeerDead());
 }
 
-TEST_F(FailureDetectorTest, ALostFirstProbeIsFollowedByFrequentOnes) {
+TEST_F(FailureDetectorTest, LostFirstProbeIsFollowedByFrequentOnes) {
     isReplying = false;
     runUntil(1s);
     EXPECT_EQ(probes, (std::vector<Duration>{0s, 300ms, 450ms, 600ms, 750ms, 900ms}));
@@ -127,14 +127,14 @@ TEST_F(FailureDetectorTest, ProbesGoOutEveryCheckIntervalWhileRepliesCome) {
     EXPECT_EQ(probes, (std::vector<Duration>{0s, 1s, 2s, 3s, 4s}));
 }
 
-TEST_F(FailureDetectorTest, PeerIsDeadWhenDeadAfterHasPassedSinceTheLastProvenLife) {
+TEST_F(FailureDetectorTest, PeerIsDeadWhenDeadAfterHasPassedSinceTheLastProof) {
     runUntil(2500ms);
     isReplying = false;
     runUntil(10s);
     EXPECT_EQ(died, 5s);  // proven by the reply to the probe of 2 s
 }
 
-TEST_F(FailureDetectorTest, AMissedReplyMakesProbesFrequentUntilTheTimeIsUp) {
+TEST_F(FailureDetectorTest, MissedProbeMakesProbesFrequentUntilTheTimeIsUp) {
     runUntil(500ms);
     isReplying = false;
     runUntil(2999ms);
@@ -147,7 +147,7 @@ TEST_F(FailureDetectorTest, AMissedReplyMakesProbesFrequentUntilTheTimeIsUp) {
     EXPECT_EQ(probes.back() - probes[probes.size() - 2], 1s);
 }
 
-TEST_F(FailureDetectorTest, AReplyEndsTheFrequentProbes) {
+TEST_F(FailureDetectorTest, ReplyEndsTheFrequentProbes) {
     runUntil(500ms);
     isReplying = false;
     runUntil(1500ms);
@@ -157,7 +157,7 @@ TEST_F(FailureDetectorTest, AReplyEndsTheFrequentProbes) {
     EXPECT_EQ(probes.back() - probes[probes.size() - 2], 1s);
 }
 
-TEST_F(FailureDetectorTest, AReplyProvesLifeAtTheTimeOfItsProbeNotOfItsArrival) {
+TEST_F(FailureDetectorTest, ReplyIsProofAsOfItsProbeNotItsArrival) {
     roundTrip = 900ms;
     runUntil(950ms);
     replies.clear();
@@ -166,7 +166,7 @@ TEST_F(FailureDetectorTest, AReplyProvesLifeAtTheTimeOfItsProbeNotOfItsArrival) 
     EXPECT_EQ(died, 3s);
 }
 
-TEST_F(FailureDetectorTest, AReplyThatIsOlderThanDeadAfterProvesNothing) {
+TEST_F(FailureDetectorTest, ReplyOlderThanDeadAfterIsIgnored) {
     runUntil(500ms);
     isReplying = false;
     runUntil(1100ms);
@@ -177,7 +177,7 @@ TEST_F(FailureDetectorTest, AReplyThatIsOlderThanDeadAfterProvesNothing) {
     EXPECT_FALSE(detector.isPeerAlive());
 }
 
-TEST_F(FailureDetectorTest, ALateReplyWithinDeadAfterBringsThePeerBack) {
+TEST_F(FailureDetectorTest, LateReplyWithinDeadAfterMakesThePeerAliveAgain) {
     runUntil(500ms);
     isReplying = false;
     runUntil(3500ms);
@@ -199,7 +199,7 @@ TEST_F(FailureDetectorTest, TimeInWhichTheProcessWasStoppedDoesNotCount) {
     EXPECT_LE(died, 66s);
 }
 
-TEST_F(FailureDetectorTest, AProbeThatWasUnderWayDuringAStopIsNotMissed) {
+TEST_F(FailureDetectorTest, ProbeInFlightDuringAStopIsNotMissed) {
     isReplying = false;
     runUntil(0s);
     replies.push_back({start + 1ms, 0});
@@ -215,7 +215,7 @@ TEST_F(FailureDetectorTest, AProbeThatWasUnderWayDuringAStopIsNotMissed) {
     EXPECT_EQ(died, Duration::max());
 }
 
-TEST_F(FailureDetectorTest, OrdinaryLatenessOfABusyMachineDelaysNoDecision) {
+TEST_F(FailureDetectorTest, OrdinarySchedulingDelayDelaysNoDecision) {
     runUntil(500ms);
     isReplying = false;
     while (died == Duration::max()) {
@@ -225,7 +225,7 @@ TEST_F(FailureDetectorTest, OrdinaryLatenessOfABusyMachineDelaysNoDecision) {
     EXPECT_LE(died, 3100ms);
 }
 
-TEST_F(FailureDetectorTest, ProbesThatCannotLeaveAreNotMissed) {
+TEST_F(FailureDetectorTest, UnsentProbesAreNotMissed) {
     runUntil(2500ms);
     sending = Sending::fails;
     runUntil(100s);
@@ -237,7 +237,7 @@ TEST_F(FailureDetectorTest, ProbesThatCannotLeaveAreNotMissed) {
     EXPECT_LE(died, 103s);
 }
 
-TEST_F(FailureDetectorTest, ProbesThatCannotLeaveJustBeforeTheTimeIsUpCostNoWakeUpsOfTheirOwn) {
+TEST_F(FailureDetectorTest, UnsentProbesJustBeforeTheTimeIsUpCauseNoExtraWakeUps) {
     runUntil(2500ms);
     isReplying = false;
     runUntil(4999ms);  // a millisecond is left
@@ -251,7 +251,7 @@ TEST_F(FailureDetectorTest, ProbesThatCannotLeaveJustBeforeTheTimeIsUpCostNoWake
     EXPECT_EQ(died, Duration::max());
 }
 
-TEST_F(FailureDetectorTest, AnotherProbeIsTriedSoonAfterOneThatCouldNotLeave) {
+TEST_F(FailureDetectorTest, UnsentProbeIsRetriedSoon) {
     sending = Sending::fails;
     runUntil(100ms);
     sending = Sending::works;
@@ -259,7 +259,7 @@ TEST_F(FailureDetectorTest, AnotherProbeIsTriedSoonAfterOneThatCouldNotLeave) {
     EXPECT_EQ(probes, (std::vector<Duration>{150ms}));
 }
 
-TEST_F(FailureDetectorTest, ASlowLinkIsAlive) {
+TEST_F(FailureDetectorTest, SlowLinkKeepsThePeerAlive) {
     roundTrip = 2s;
     runUntil(100s);
     EXPECT_EQ(died, Duration::max());

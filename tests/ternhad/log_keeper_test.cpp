@@ -12,7 +12,7 @@ using ::testing::HasSubstr;
 using ::testing::Not;
 using LogKeeperTest = test::SickMachineTest;
 
-TEST_F(LogKeeperTest, AHangingLogDiskDelaysNeitherTheEndNorARestart) {
+TEST_F(LogKeeperTest, HungLogDiskDelaysNeitherStopNorRestart) {
     start({"--log-interval", "0.1"});
     test::hang(test::LOG_FILE);
     EXPECT_FALSE(test::eventually(1s, [] { return !isPeerAlive(); }));
@@ -22,7 +22,7 @@ TEST_F(LogKeeperTest, AHangingLogDiskDelaysNeitherTheEndNorARestart) {
     expectEndInTime();
 }
 
-TEST_F(LogKeeperTest, ACompressionThatHangsDoesNotDelayTheEndAndLosesNoLine) {
+TEST_F(LogKeeperTest, HungCompressionDelaysNoStopAndLosesNoLine) {
     test::replaceProgram("/bin/xz", ": > /tmp/compressing; exec sleep 60");
     start();
     daemon->signal(SIGHUP);
@@ -32,7 +32,7 @@ TEST_F(LogKeeperTest, ACompressionThatHangsDoesNotDelayTheEndAndLosesNoLine) {
     EXPECT_NE(test::run({"pgrep", "sleep"}).exitCode, 0);
 }
 
-TEST_F(LogKeeperTest, TheLogKeeperIsStartedAgainWhenItDies) {
+TEST_F(LogKeeperTest, IsRestartedWhenItDies) {
     start({"--log-interval", "3600"});
     const pid_t keeper = test::childOf(daemon->pid());
     ASSERT_GT(keeper, 0);
@@ -48,7 +48,7 @@ TEST_F(LogKeeperTest, TheLogKeeperIsStartedAgainWhenItDies) {
     expectEndInTime();
 }
 
-TEST_F(LogKeeperTest, TheLogKeeperDiesWithTheDaemon) {
+TEST_F(LogKeeperTest, DiesWithTheDaemon) {
     start();
     const pid_t keeper = test::childOf(daemon->pid());
     ASSERT_GT(keeper, 0);
@@ -56,7 +56,7 @@ TEST_F(LogKeeperTest, TheLogKeeperDiesWithTheDaemon) {
     EXPECT_TRUE(test::eventually(10s, [&] { return kill(keeper, 0) != 0; }));
 }
 
-TEST_F(LogKeeperTest, TheLogKeeperHoldsNoSocket) {
+TEST_F(LogKeeperTest, HoldsNoSocket) {
     start();
     const pid_t keeper = test::childOf(daemon->pid());
     for (const auto& entry : std::filesystem::directory_iterator("/proc/" + std::to_string(keeper) + "/fd")) {

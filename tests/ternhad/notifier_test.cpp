@@ -18,7 +18,7 @@ class ServiceNotifierTest : public ::testing::Test {
     test::ServiceManager manager;
 };
 
-TEST_F(ServiceNotifierTest, TellsEachState) {
+TEST_F(ServiceNotifierTest, ReportsEachState) {
     ternhad::notifyReady();
     EXPECT_EQ(told(), "READY=1");
     ternhad::notifyAlive();
@@ -31,7 +31,7 @@ TEST_F(ServiceNotifierTest, TellsEachState) {
     EXPECT_EQ(told(), "STOPPING=1");
 }
 
-TEST_F(ServiceNotifierTest, IsSilentWithoutAManager) {
+TEST_F(ServiceNotifierTest, IsSilentWithoutASupervisor) {
     unsetenv("NOTIFY_SOCKET");
     ternhad::notifyReady();
     ternhad::notifyAlive();
@@ -40,14 +40,14 @@ TEST_F(ServiceNotifierTest, IsSilentWithoutAManager) {
     EXPECT_EQ(told(), "");
 }
 
-TEST_F(ServiceNotifierTest, KnowsTheIntervalThatItsManagerWatches) {
+TEST_F(ServiceNotifierTest, ReadsTheWatchdogInterval) {
     setenv("WATCHDOG_USEC", "120000000", 1);
     setenv("WATCHDOG_PID", std::to_string(getpid()).c_str(), 1);
     EXPECT_EQ(ternhad::watchdogInterval(), std::chrono::microseconds(2min));
     EXPECT_EQ(ternhad::watchdogInterval(), std::chrono::microseconds(2min));
 }
 
-TEST_F(ServiceNotifierTest, IsNotWatchedWhenAnotherProcessIs) {
+TEST_F(ServiceNotifierTest, IgnoresTheWatchdogOfAnotherProcess) {
     EXPECT_EQ(ternhad::watchdogInterval(), std::nullopt);
     setenv("WATCHDOG_USEC", "120000000", 1);
     setenv("WATCHDOG_PID", std::to_string(getpid() + 1).c_str(), 1);

@@ -46,7 +46,7 @@ class NotifyTest : public ::testing::Test {
     }
 };
 
-TEST_F(NotifyTest, RunsAtEachChangeAndTellsWhat) {
+TEST_F(NotifyTest, RunsAtEachChangeWithItsEnvironment) {
     auto daemon = start("echo \"$EVENT $OLD $NEW $TIME $PEER\" >>/tmp/changes\n");
     EXPECT_TRUE(eventuallyHas("resync unknown no-resync "));
     setResync(true);
@@ -80,7 +80,7 @@ TEST_F(NotifyTest, RunsOneAtATimeInOrder) {
     EXPECT_EQ(result().find("OVERLAP"), std::string::npos);
 }
 
-TEST_F(NotifyTest, AProgramThatFailsOrHangsIsLoggedAndDelaysNothing) {
+TEST_F(NotifyTest, FailedOrHungProgramIsLoggedAndDelaysNothing) {
     auto daemon = start(
         "[ $NEW != no-resync ] || exit 7\n[ $NEW != resync ] || { echo $$ >/tmp/changes; exec sleep 1000; "
         "}\n");
@@ -93,7 +93,7 @@ TEST_F(NotifyTest, AProgramThatFailsOrHangsIsLoggedAndDelaysNothing) {
     EXPECT_EQ(kill(std::stoi(result()), 0), -1);
 }
 
-TEST_F(NotifyTest, ChangesThatASlowProgramMissesAreLogged) {
+TEST_F(NotifyTest, ChangesBeyondTheQueueAreLogged) {
     // The program waits until more has changed than the queue holds: 256, of two flags.
     auto daemon = start("until [ -e /tmp/go ]; do sleep 0.05; done\n", "0.05");
     const auto change = [](bool isTrouble) {
@@ -113,7 +113,7 @@ TEST_F(NotifyTest, ChangesThatASlowProgramMissesAreLogged) {
     EXPECT_TRUE(eventuallyLogs("Ran /tmp/on-change for connected: exit code 0\n"));
 }
 
-TEST_F(NotifyTest, TheDaemonEndsInTimeWhileTheProgramRuns) {
+TEST_F(NotifyTest, RunningProgramDoesNotDelayTheStop) {
     auto daemon = start("echo $$ >/tmp/changes; exec sleep 1000\n");
     EXPECT_TRUE(test::eventually(10s, [] { return !result().empty(); }));
     daemon.signal(SIGTERM);

@@ -34,7 +34,7 @@ void PrintTo(const WrongUsage& usage, std::ostream* stream) {
 
 class WrongUsageTest : public OptionsTest, public ::testing::WithParamInterface<WrongUsage> {};
 
-TEST_P(WrongUsageTest, IsExplainedBeforeAnythingIsOpened) {
+TEST_P(WrongUsageTest, IsReportedBeforeAnythingIsOpened) {
     const auto result = ternhad(GetParam().arguments);
     EXPECT_EQ(result.exitCode, 2);
     EXPECT_THAT(result.error, HasSubstr(GetParam().message));
@@ -119,7 +119,7 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{"NoSuchConfiguration", plus({"--config", "/nowhere.conf"}), "/nowhere.conf"}),
     [](const auto& usage) { return usage.param.name; });
 
-TEST_F(OptionsTest, AnUnknownKeyInTheConfigurationIsAnError) {
+TEST_F(OptionsTest, UnknownNameInTheConfigurationIsAnError) {
     test::writeFile("/tmp/ternhad.conf",
                     "local-ip = 127.0.0.1\nremote-ip = 127.0.0.2\ninterface = lo\nfrobnicate = 1\n");
     const auto result = ternhad({"--config", "/tmp/ternhad.conf"});
@@ -169,7 +169,7 @@ INSTANTIATE_TEST_SUITE_P(
                   "status-socket = /run/x: needs --status-group"}),
     [](const auto& line) { return line.param.name; });
 
-TEST_F(OptionsTest, AFileThatLacksANameOrCannotBeReadIsNamed) {
+TEST_F(OptionsTest, UnreadableOrIncompleteFileIsNamed) {
     test::writeFile("/tmp/ternhad.conf", "local-ip = 127.0.0.1\nremote-ip = 127.0.0.2\n");
     const auto messageOn = [](const std::string& file) {
         const auto result = ternhad({"--config", file});
@@ -182,14 +182,14 @@ TEST_F(OptionsTest, AFileThatLacksANameOrCannotBeReadIsNamed) {
     EXPECT_EQ(messageOn("/tmp/ternhad.conf/x"), "ternhad: /tmp/ternhad.conf/x: Not a directory\n");
 }
 
-TEST_F(OptionsTest, TheCommandLineIsNotBlamedOnTheFile) {
+TEST_F(OptionsTest, CommandLineErrorsDoNotNameTheFile) {
     test::writeFile("/tmp/ternhad.conf", "local-ip = 127.0.0.1\nremote-ip = 127.0.0.2\ninterface = lo\n");
     const auto result = ternhad({"--config", "/tmp/ternhad.conf", "--local-ip", "127.0.0.300"});
     EXPECT_EQ(result.exitCode, 2);
     EXPECT_THAT(result.error, StartsWith("--local-ip: not an IPv4 address: 127.0.0.300\n"));
 }
 
-TEST_F(OptionsTest, TheConfigurationIsCheckedWithoutAStart) {
+TEST_F(OptionsTest, CheckConfigChecksWithoutStarting) {
     test::writeFile("/tmp/notify", "#!/bin/sh\n");
     ASSERT_EQ(chmod("/tmp/notify", 0777), 0);
     test::writeFile("/tmp/ternhad.conf",
@@ -210,7 +210,7 @@ TEST_F(OptionsTest, TheConfigurationIsCheckedWithoutAStart) {
     EXPECT_FALSE(test::exists("/tmp/ha"));
 }
 
-TEST_F(OptionsTest, TheBroadcastAddressOfAnInterfaceIsNoNode) {
+TEST_F(OptionsTest, BroadcastAddressOfAnInterfaceIsRefused) {
     ASSERT_EQ(test::run({"ip", "link", "add", "eth1", "type", "veth", "peer", "name", "eth2"}).exitCode, 0);
     ASSERT_EQ(test::run({"ip", "address", "add", "10.5.0.1/24", "broadcast", "+", "dev", "eth1"}).exitCode,
               0);
@@ -222,7 +222,7 @@ TEST_F(OptionsTest, TheBroadcastAddressOfAnInterfaceIsNoNode) {
     EXPECT_THAT(own.error, HasSubstr("--local-ip: the broadcast address of a network: 10.5.0.255"));
 }
 
-TEST_F(OptionsTest, TheOtherEndOfAPointToPointLinkIsAPeer) {
+TEST_F(OptionsTest, OtherEndOfAPointToPointLinkIsAccepted) {
     ASSERT_EQ(test::run({"ip", "link", "add", "eth1", "type", "veth", "peer", "name", "eth2"}).exitCode, 0);
     ASSERT_EQ(test::run({"ip", "address", "add", "10.5.0.1", "peer", "10.5.0.2", "dev", "eth1"}).exitCode, 0);
     EXPECT_EQ(ternhad({"--local-ip", "10.5.0.1", "--remote-ip", "10.5.0.2", "--interface", "eth1",
@@ -231,7 +231,7 @@ TEST_F(OptionsTest, TheOtherEndOfAPointToPointLinkIsAPeer) {
               0);
 }
 
-TEST_F(OptionsTest, HelpAndVersionAreNoErrors) {
+TEST_F(OptionsTest, HelpAndVersionSucceed) {
     const auto help = ternhad({"--help"});
     EXPECT_EQ(help.exitCode, 0);
     for (const char* option :

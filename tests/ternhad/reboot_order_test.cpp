@@ -24,7 +24,7 @@ class RebootOrderTest : public ::testing::Test {
 };
 
 // The peer's kernel is a file here: it takes the order, and nothing happens.
-TEST_F(RebootOrderTest, APeerThatIgnoresItWasNotRebooted) {
+TEST_F(RebootOrderTest, PeerThatIgnoresItWasNotRebooted) {
     a.start();
     b.start();
     ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));
@@ -48,7 +48,7 @@ TEST_F(RebootOrderTest, APeerThatIgnoresItWasNotRebooted) {
     }));
 }
 
-TEST_F(RebootOrderTest, APeerThatObeysWentDownAndADeadOneWasDeadBefore) {
+TEST_F(RebootOrderTest, ObeyingPeerWentDownAndDeadPeerWasAlreadyDead) {
     a.start();
     b.start();
     ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));
@@ -72,7 +72,7 @@ TEST_F(RebootOrderTest, APeerThatObeysWentDownAndADeadOneWasDeadBefore) {
 }
 
 // Long before it counts as dead.
-TEST_F(RebootOrderTest, APeerThatObeysWentDownAlthoughItIsNotDeadYet) {
+TEST_F(RebootOrderTest, ObeyingPeerWentDownAlthoughNotYetDeclaredDead) {
     a.start({"--dead-after", "60"});
     b.start();
     ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));

@@ -45,7 +45,7 @@ class ReportingTest : public ::testing::Test {
     }
 };
 
-TEST_F(ReportingTest, AReportOfTooManyDisksLeavesNoNames) {
+TEST_F(ReportingTest, ReportOfTooManyDisksLeavesNoNames) {
     test::PlayedPeer peer;
     peer.setReply("is_disk_err_handling", R"({"errHandlingDisk":["sda"],"isDiskErrHandling":true})");
     auto daemon = start();
@@ -65,7 +65,7 @@ TEST_F(ReportingTest, AReportOfTooManyDisksLeavesNoNames) {
     EXPECT_TRUE(test::eventually(10s, [] { return control("disks").output.empty(); }));
 }
 
-TEST_F(ReportingTest, WhatWasNeverMeasuredIsUnknownAndWhatADeadPeerSaidLastKnown) {
+TEST_F(ReportingTest, NeverMeasuredIsUnknownAndADeadPeersStateLastKnown) {
     auto daemon = start({"--dead-after", "1"});
     EXPECT_TRUE(test::eventually(10s, [] { return report()["peer"]["alive"]["value"] == false; }));
     EXPECT_EQ(control("disks").output, "peer: unknown\n");
@@ -96,7 +96,7 @@ TEST_F(ReportingTest, BeforeTheFirstReplyThePeerIsUnknownNotDead) {
     EXPECT_THAT(control("check").output, HasSubstr("peer not probed yet"));
 }
 
-TEST_F(ReportingTest, AnInterfaceThatIsNotThereOrDownHasNoRate) {
+TEST_F(ReportingTest, MissingOrDownInterfaceHasNoRate) {
     auto daemon = start({}, "eth9");
     EXPECT_THAT(daemon.error(),
                 HasSubstr("there is no network interface eth9 (yet): its packet rate is unknown\n"));
@@ -113,7 +113,7 @@ TEST_F(ReportingTest, AnInterfaceThatIsNotThereOrDownHasNoRate) {
     EXPECT_EQ(test::statusAt()["heartbeatPacketFailRate"].asDouble(), 0);
 }
 
-TEST_F(ReportingTest, KernelFilesThatAreMissingAreLoggedOnceAndSeenWhenTheyAppear) {
+TEST_F(ReportingTest, MissingKernelFilesAreLoggedOnceAndFoundWhenTheyAppear) {
     auto daemon = start({"--log-interval", "0.1"});
     const auto rounds = [](int wanted) {
         // A round of the checks reads the directories; the record of processes does not.
@@ -163,7 +163,7 @@ TEST_F(ReportingTest, FollowersSeeEachChangeAndWaitersTheirCondition) {
     EXPECT_THAT(follower.error(), HasSubstr("the connection was closed"));
 }
 
-TEST_F(ReportingTest, ARequestThatIsNestedTooDeepIsRefused) {
+TEST_F(ReportingTest, RequestNestedTooDeepIsRefused) {
     auto daemon = start();
     sockaddr_un address = {};
     address.sun_family = AF_UNIX;
@@ -178,7 +178,7 @@ TEST_F(ReportingTest, ARequestThatIsNestedTooDeepIsRefused) {
     EXPECT_FALSE(test::statusAt().isNull());
 }
 
-TEST_F(ReportingTest, AFollowerThatDoesNotReadDelaysNobody) {
+TEST_F(ReportingTest, FollowerThatDoesNotReadDelaysNobody) {
     test::writeFile("/sys/block/md0/md/sync_action", "idle\n");
     auto daemon = start();
     test::Process stopped({TERNHACTL, "events"});

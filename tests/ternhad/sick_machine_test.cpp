@@ -20,7 +20,7 @@ using test::SickMachineTest;
 using ::testing::HasSubstr;
 using ::testing::Not;
 
-TEST_F(SickMachineTest, AFifoForTheHostNameHangsNobody) {
+TEST_F(SickMachineTest, FifoAsHostNameFileDelaysNothing) {
     ASSERT_EQ(mkfifo("/tmp/.ha.hostname.original", 0600), 0);
     start();
     EXPECT_TRUE(replies("remote_hostname"));
@@ -28,7 +28,7 @@ TEST_F(SickMachineTest, AFifoForTheHostNameHangsNobody) {
     expectEndInTime();
 }
 
-TEST_F(SickMachineTest, AHangingBufferDelaysNoChangeOfState) {
+TEST_F(SickMachineTest, HungBufferDelaysNoStateChange) {
     start();
     test::hang(test::BUFFER_FILE);
     peer.reset();
@@ -39,14 +39,14 @@ TEST_F(SickMachineTest, AHangingBufferDelaysNoChangeOfState) {
     expectEndInTime();
 }
 
-TEST_F(SickMachineTest, AHangingBufferHindersNoReboot) {
+TEST_F(SickMachineTest, HungBufferDoesNotPreventAReboot) {
     start();
     test::hang(test::BUFFER_FILE);
     orderReboot();
     EXPECT_TRUE(test::eventually(20s, isRebooted));
 }
 
-TEST_F(SickMachineTest, AHangingLogDiskHindersNoReboot) {
+TEST_F(SickMachineTest, HungLogDiskDoesNotPreventAReboot) {
     start();
     test::hang(test::LOG_FILE);
     orderReboot();
@@ -54,14 +54,14 @@ TEST_F(SickMachineTest, AHangingLogDiskHindersNoReboot) {
     EXPECT_TRUE(replies("is_alive"));
 }
 
-TEST_F(SickMachineTest, ARebootThatIsNotHinderedDoesNotWait) {
+TEST_F(SickMachineTest, RebootDoesNotWaitOnAHealthyMachine) {
     start();
     const test::Stopwatch stopwatch;
     orderReboot();
     EXPECT_TRUE(test::eventually(4s, isRebooted)) << "the deadline is for what hangs";
 }
 
-TEST_F(SickMachineTest, AnOrderThatTheKernelDoesNotTakeIsAnswered) {
+TEST_F(SickMachineTest, FailedRebootIsReplied) {
     test::removeTree(test::TRIGGER);
     test::makeDirectories(test::TRIGGER);
     start();
@@ -108,7 +108,7 @@ TEST_F(SickMachineTest, ProbesComeBeforeRepliesAndRepliesBeforeAllElse) {
     expectEndInTime();
 }
 
-TEST_F(SickMachineTest, ARequestThatAStopInterruptsTellsNothingOfThePeer) {
+TEST_F(SickMachineTest, RequestInterruptedByAStopIsDiscarded) {
     start();
     ASSERT_TRUE(test::eventually(20s, [this] { return says("peer-no-disk-errors"); }));
     peer->beReticent();
@@ -122,7 +122,7 @@ TEST_F(SickMachineTest, ARequestThatAStopInterruptsTellsNothingOfThePeer) {
     expectEndInTime();
 }
 
-TEST_F(SickMachineTest, AStoppedDaemonDoesNotDeclareThePeerDead) {
+TEST_F(SickMachineTest, StoppedDaemonDoesNotDeclareThePeerDead) {
     start({"--dead-after", "0.6"});
     for (int i = 0; i < 3; ++i) {
         daemon->signal(SIGSTOP);
@@ -150,7 +150,7 @@ std::string exchange(const std::string& request, std::chrono::seconds limit) {
     return reply;
 }
 
-TEST_F(SickMachineTest, AnOrderBlocksOnlyItsOwnClientAndASecondOneIsRefused) {
+TEST_F(SickMachineTest, RebootBlocksOnlyItsOwnClientAndASecondOneIsRefused) {
     start();
     std::thread order([] { exchange(R"({"act":"R"})", 60s); });
     EXPECT_TRUE(test::eventually(

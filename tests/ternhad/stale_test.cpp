@@ -33,7 +33,7 @@ class StaleTest : public ::testing::Test {
     test::Process daemon;
 };
 
-TEST_F(StaleTest, WhatADeadPeerSaidHoldsOnlyOnceItSaysItAgain) {
+TEST_F(StaleTest, StateOfADeadPeerIsStaleUntilItReportsAgain) {
     peer.reset();
     ASSERT_EQ(control("wait peer-dead --timeout 20").exitCode, 0);
     EXPECT_EQ(control("wait peer-no-resync --timeout 0.2").exitCode, 1);
@@ -51,7 +51,7 @@ TEST_F(StaleTest, WhatADeadPeerSaidHoldsOnlyOnceItSaysItAgain) {
     EXPECT_THAT(control("metrics").output, HasSubstr("ternha_transitions_total{flag=\"peer-resync\"} 0\n"));
 }
 
-TEST_F(StaleTest, WhatAnAlivePeerNoLongerTellsIsLastKnown) {
+TEST_F(StaleTest, StateOfAnAlivePeerThatStopsReportingIsLastKnown) {
     EXPECT_THAT(control("metrics").output, HasSubstr("\nternha_peer_md_resync 0\n"));
     peer->ignore("is_md_resync");
     EXPECT_TRUE(eventuallyPrints("status --json=1", R"("stale":true,"value":false)"));
@@ -68,7 +68,7 @@ TEST_F(StaleTest, WhatAnAlivePeerNoLongerTellsIsLastKnown) {
     EXPECT_THAT(control("metrics").output, HasSubstr("\nternha_peer_md_resync 0\n"));
 }
 
-TEST_F(StaleTest, AReplyThatComesAfterThePeersDeathTellsNothingAnyMore) {
+TEST_F(StaleTest, ReplyAfterThePeerWasDeclaredDeadIsDiscarded) {
     peer->dieAt("is_md_resync");
     ASSERT_EQ(control("wait peer-dead --timeout 20").exitCode, 0);
     peer->replyLate("resync");

@@ -33,7 +33,7 @@ class StatusSocketTest : public ::testing::Test {
     }
 };
 
-TEST_F(StatusSocketTest, ServesItsGroupAndTakesNoOrders) {
+TEST_F(StatusSocketTest, ServesItsGroupAndRefusesReboots) {
     auto daemon = start();
     const std::string socket = std::string("--socket ") + STATUS_SOCKET;
     EXPECT_THAT(runAs(1, socket + " check").output, HasSubstr("TERNHA "));
@@ -50,7 +50,7 @@ TEST_F(StatusSocketTest, ServesItsGroupAndTakesNoOrders) {
     EXPECT_FALSE(test::exists(STATUS_SOCKET));
 }
 
-TEST_F(StatusSocketTest, ItsDirectoryLetsTheGroupThroughAndNobodyListIt) {
+TEST_F(StatusSocketTest, DirectoryIsTraversableButNotListable) {
     auto daemon = start();
     EXPECT_EQ(test::run({"stat", "-c", "%a", "/run/ternha"}).output, "711\n");
     daemon.signal(SIGTERM);
@@ -65,7 +65,7 @@ TEST_F(StatusSocketTest, ItsDirectoryLetsTheGroupThroughAndNobodyListIt) {
     }
 }
 
-TEST_F(StatusSocketTest, TheDaemonRunsWithoutItUntilItCanBeMade) {
+TEST_F(StatusSocketTest, DaemonRunsWithoutItUntilItCanBeCreated) {
     auto daemon = start("/run/missing/below/status.sock");
     EXPECT_THAT(daemon.error(),
                 HasSubstr("cannot bind the status socket /run/missing/below/status.sock: No such "
@@ -77,7 +77,7 @@ TEST_F(StatusSocketTest, TheDaemonRunsWithoutItUntilItCanBeMade) {
     EXPECT_FALSE(test::statusAt().isNull());
 }
 
-TEST_F(StatusSocketTest, ItsFollowersTakeNoPlaceOfRoots) {
+TEST_F(StatusSocketTest, FollowersDoNotCountAgainstTheControlSocket) {
     auto daemon = start();
     std::vector<test::Process> followers;
     for (int i = 0; i < 16; ++i) {

@@ -29,7 +29,7 @@ class TwoNodesTest : public ::testing::Test {
     Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
 };
 
-TEST_F(TwoNodesTest, LearnThatTheOtherIsAliveAndItsName) {
+TEST_F(TwoNodesTest, LearnThePeersLivenessAndName) {
     for (Machine* machine : {&a, &b}) {
         EXPECT_TRUE(test::eventually(10s, [&] {
             return machine->log().find("Remote hostname is " +
@@ -41,7 +41,7 @@ TEST_F(TwoNodesTest, LearnThatTheOtherIsAliveAndItsName) {
     }
 }
 
-TEST_F(TwoNodesTest, LoseEachOtherWithTheLinkAndFindEachOtherAgain) {
+TEST_F(TwoNodesTest, DetectACutLinkAndItsReturn) {
     test::setLink(a.node, false);
     EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(false); }));
     test::setLink(a.node, true);
@@ -57,14 +57,14 @@ TEST_F(TwoNodesTest, LoseEachOtherWithTheLinkAndFindEachOtherAgain) {
     }
 }
 
-TEST_F(TwoNodesTest, ADaemonThatStandsStillIsDeadUntilItGoesOn) {
+TEST_F(TwoNodesTest, StoppedDaemonIsDeadUntilItContinues) {
     b.daemon->signal(SIGSTOP);
     EXPECT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", false); }));
     b.daemon->signal(SIGCONT);
     EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
 }
 
-TEST(SuspendedDaemonTest, ComesBackToTheTruthWithinTwoIntervals) {
+TEST(SuspendedDaemonTest, IsUpToDateWithinTwoIntervals) {
     constexpr auto INTERVAL = 3s;
     Machine a{"node-a", "10.0.0.1", "10.0.0.2"};
     Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
@@ -87,7 +87,7 @@ TEST(SuspendedDaemonTest, ComesBackToTheTruthWithinTwoIntervals) {
     EXPECT_TRUE(test::eventually(2 * INTERVAL, [&] { return isTrue(true); }));
 }
 
-TEST_F(TwoNodesTest, ADaemonThatWasKilledIsDeadUntilItIsStartedAgain) {
+TEST_F(TwoNodesTest, KilledDaemonIsDeadUntilItIsRestarted) {
     b.daemon->signal(SIGKILL);
     ASSERT_TRUE(b.daemon->waitFor(10s).has_value());
     EXPECT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", false); }));
@@ -95,7 +95,7 @@ TEST_F(TwoNodesTest, ADaemonThatWasKilledIsDeadUntilItIsStartedAgain) {
     EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
 }
 
-TEST_F(TwoNodesTest, TellEachOtherOfResyncsAndDisks) {
+TEST_F(TwoNodesTest, ReportResyncsAndDiskErrorsToEachOther) {
     a.write("/sys/block/md0/md/sync_action", "resync\n");
     EXPECT_TRUE(test::eventually(20s, [this] { return b.sees("isRemoteMDResync", true); }));
     EXPECT_FALSE(b.status()["isMDResync"].asBool());
@@ -117,7 +117,7 @@ TEST_F(TwoNodesTest, TellEachOtherOfResyncsAndDisks) {
     })) << b.status();
 }
 
-TEST_F(TwoNodesTest, RecordASnapshotWhenTheOtherDiesOrBeginsAResync) {
+TEST_F(TwoNodesTest, TakeASnapshotWhenThePeerIsDeadOrResyncs) {
     ASSERT_TRUE(test::eventually(10s, [&] { return b.record().find("MemTotal") != std::string::npos; }));
 
     const std::string atStart = b.record();
@@ -132,7 +132,7 @@ TEST_F(TwoNodesTest, RecordASnapshotWhenTheOtherDiesOrBeginsAResync) {
         20s, [&] { return b.record().find("\"isRemoteAlive\":false", before) != std::string::npos; }));
 }
 
-TEST_F(TwoNodesTest, MeasureTheLinkWhileTheOtherIsAlive) {
+TEST_F(TwoNodesTest, MeasureTheLinkWhileThePeerIsAlive) {
     EXPECT_TRUE(test::eventually(20s, [this] { return a.status()["heartbeatLatency"].asDouble() > 0; }));
     EXPECT_EQ(a.status()["heartbeatPacketFailRate"].asDouble(), 0);
     test::setLink(b.node, false);
@@ -141,7 +141,7 @@ TEST_F(TwoNodesTest, MeasureTheLinkWhileTheOtherIsAlive) {
     }));
 }
 
-TEST_F(TwoNodesTest, AnOrderedRebootReachesTheOthersKernelWithItsLogsOnDisk) {
+TEST_F(TwoNodesTest, RebootReachesThePeersKernelWithItsLogsOnDisk) {
     bool isDone = false;
     std::thread order([&] {
         isDone = TERN::HA::Daemon::MonitordSocket(a.node.path(test::CONTROL_SOCKET), 40).rebootRemote();

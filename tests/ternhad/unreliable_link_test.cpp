@@ -44,7 +44,7 @@ class UnreliableLinkTest : public ::testing::TestWithParam<unsigned int> {
     bool isDiskTrouble = false;
 };
 
-TEST_P(UnreliableLinkTest, LeavesNoWrongStateAndNobodyDead) {
+TEST_P(UnreliableLinkTest, CausesNeitherWrongStateNorFalsePositive) {
     const test::UnreliableLink link(a.node, a.address, b.node, b.address, {10, 10, 5}, GetParam());
     for (test::Machine* machine : {&a, &b}) {
         machine->daemon.emplace(

@@ -29,7 +29,7 @@ class WatchedDaemonTest : public ::testing::Test {
     test::ServiceManager manager;
 };
 
-TEST_F(WatchedDaemonTest, TellsItsManagerThatItIsReadyAndThatItStops) {
+TEST_F(WatchedDaemonTest, ReportsReadinessAndStop) {
     test::Process daemon = start(1h);
     EXPECT_TRUE(hears("READY=1")) << daemon.error();
     daemon.signal(SIGTERM);
@@ -38,7 +38,7 @@ TEST_F(WatchedDaemonTest, TellsItsManagerThatItIsReadyAndThatItStops) {
     EXPECT_THAT(manager.told(), ::testing::AnyOf("", ::testing::StartsWith("STATUS=")));
 }
 
-TEST_F(WatchedDaemonTest, TellsItsManagerTheStateOfTheNode) {
+TEST_F(WatchedDaemonTest, ReportsTheStateAsStatusLine) {
     test::writeFile("/sys/block/md0/md/sync_action", "resync\n");
     test::Process daemon = start(1h);
     std::string status;
@@ -52,7 +52,7 @@ TEST_F(WatchedDaemonTest, TellsItsManagerTheStateOfTheNode) {
     EXPECT_TRUE(daemon.waitFor(10s).has_value());
 }
 
-TEST_F(WatchedDaemonTest, TellsItsManagerWhatWasLastKnownOfADeadPeer) {
+TEST_F(WatchedDaemonTest, ReportsADeadPeersLastKnownStateAsStatusLine) {
     const auto isTold = [this](const std::string& begin, const std::string& end) {
         return test::eventually(20s, [&, told = manager.told()]() mutable {
             for (; !told.empty(); told = manager.told()) {
@@ -73,7 +73,7 @@ TEST_F(WatchedDaemonTest, TellsItsManagerWhatWasLastKnownOfADeadPeer) {
     EXPECT_TRUE(isTold("STATUS=peer dead since 20", ", not-connected; last known: peer-resync"));
 }
 
-TEST_F(WatchedDaemonTest, ShowsItsProgressAgainAndAgain) {
+TEST_F(WatchedDaemonTest, KeepsTheWatchdogQuiet) {
     test::Process daemon = start(4s);
     ASSERT_TRUE(hears("READY=1")) << daemon.error();
     // The pass that serves the peer ends with a question, or after 30 seconds.
@@ -88,7 +88,7 @@ TEST_F(WatchedDaemonTest, ShowsItsProgressAgainAndAgain) {
     EXPECT_TRUE(daemon.waitFor(10s).has_value());
 }
 
-TEST_F(WatchedDaemonTest, IsSilentWhileAThreadHangs) {
+TEST_F(WatchedDaemonTest, LetsTheWatchdogExpireWhileAThreadHangs) {
     test::writeFile("/proc/drbd", "");
     test::removeTree("/proc/drbd");
     ASSERT_EQ(mkfifo("/proc/drbd", 0600), 0);  // nobody writes: opening it waits
