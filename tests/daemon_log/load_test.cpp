@@ -24,7 +24,7 @@ using TERN::HA::Daemon::daemonLog;
 using TERN::HA::Daemon::DaemonLog;
 
 constexpr char DIRECTORY[] = "/var/log/ha";
-constexpr auto DURATION = 60s;
+constexpr auto DURATION = 20s;
 constexpr int BURST = 20;
 
 // Append numbered lines in bursts for DURATION; return their number.
@@ -89,7 +89,7 @@ TEST(LogUnderLoadTest, ConcurrentRotationNeitherTearsNorDuplicatesLines) {
     std::thread mover([&isOver] {
         for (int moves = 1; !isOver; ++moves) {
             daemonLog->writeLogToDisk();
-            if (moves % 200 == 0) {
+            if (moves % 100 == 0) {
                 daemonLog->rotate();
             }
             std::this_thread::sleep_for(20ms);

@@ -230,7 +230,7 @@ TEST_F(TernhactlTest, FullBacklogEndsInATimeout) {
     std::vector<test::Process> waiting;  // fill the queue
     for (int i = 0; i < 12; ++i) {
         waiting.emplace_back(
-            std::vector<std::string>{TERNHACTL_DIR "/ternhactl", "--timeout", "20", "status"});
+            std::vector<std::string>{TERNHACTL_DIR "/ternhactl", "--timeout", "60", "status"});
     }
     const auto isFull = [] {
         const auto result = shell("ternhactl --timeout 1 status");
@@ -238,18 +238,18 @@ TEST_F(TernhactlTest, FullBacklogEndsInATimeout) {
     };
     ASSERT_TRUE(test::eventually(20s, isFull));
     const test::Stopwatch stopwatch;
-    EXPECT_EQ(shell("ternhactl --timeout 1 status").exitCode, 3);
-    EXPECT_LT(stopwatch.elapsed(), 1900ms);
+    EXPECT_EQ(shell("ternhactl --timeout 5 status").exitCode, 3);
+    EXPECT_LT(stopwatch.elapsed(), 9s);  // one time-out, not one for each step
 }
 
 TEST_F(TernhactlTest, HalfAReplyEndsInATimeout) {
     const RawServer server;
     const test::Stopwatch stopwatch;
-    test::Process status({TERNHACTL_DIR "/ternhactl", "--timeout", "1", "status"});
+    test::Process status({TERNHACTL_DIR "/ternhactl", "--timeout", "5", "status"});
     const int connection = server.accept();
     RawServer::send(connection, R"({"version":1,)");
     EXPECT_EQ(test::resultOf(std::move(status)).exitCode, 3);
-    EXPECT_LT(stopwatch.elapsed(), 1900ms);
+    EXPECT_LT(stopwatch.elapsed(), 9s);
     close(connection);
 }
 

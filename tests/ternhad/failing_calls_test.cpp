@@ -141,6 +141,7 @@ TEST_F(FailingCallsTest, WallClockStepsChangeNothing) {
     expectEndInTime();
 }
 
+#ifndef IS_EMULATED  // user-mode emulation knows no ptrace
 // Holds a process as a hanging disk would: when it is killed, it is not gone until the object is.
 class Undying {
  public:
@@ -178,6 +179,7 @@ TEST_F(FailingCallsTest, HungLogKeeperIsReplacedAndLeftBehind) {
     expectEndInTime();
     EXPECT_EQ(kill(keeper, 0), 0);
 }
+#endif
 
 // It is looked at before it is read, and an order must not slip through between the two.
 TEST_F(FailingCallsTest, StatusSocketRefusesARebootRequestInPieces) {
