@@ -69,6 +69,14 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
       _nodeWatcher(options, _health, _events, _shutdown, _progress),
       _watchdog(watchdogInterval()),
       _nextWatchdog(Clock::now()) {
+    // Before the threads that have descriptor tables of their own: a change that one of them reports sets an
+    // event by its descriptor, which in its table would be something else, such as a socket to the peer.
+    if (!options.statusSocket.empty()) {
+        _statusStreams.emplace(_health.transitions(), _reporter, _shutdown);
+        _statusServer.emplace(options.statusSocket, ControlServer::Access::reading, _health, _reporter,
+                              *_statusStreams, _events, _shutdown);
+        _statusServer->listener().shareWith(options.statusGroupId);
+    }
     drbdIF(options.interface);
     localIP(options.localIp);
     remoteIP(options.remoteIp);
@@ -128,13 +136,9 @@ bool Daemon::startThreads() try {
 // The node does not depend on it: the server tries again until it has its socket. Its clients have places of
 // their own, so that they cannot take root's.
 void Daemon::startStatusServer() {
-    if (_options.statusSocket.empty()) {
+    if (!_statusServer) {
         return;
     }
-    _statusStreams.emplace(_health.transitions(), _reporter, _shutdown);
-    _statusServer.emplace(_options.statusSocket, ControlServer::Access::reading, _health, _reporter,
-                          *_statusStreams, _events, _shutdown);
-    _statusServer->listener().shareWith(_options.statusGroupId);
     if (!_statusServer->listener().listen()) {
         writeJournal(Level::warning, "cannot bind the status socket " + _options.statusSocket + ": " +
                                          std::strerror(errno) + "; trying again");

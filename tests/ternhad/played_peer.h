@@ -1,5 +1,7 @@
 #pragma once
 
+#include <gtest/gtest.h>
+
 #include <atomic>
 #include <map>
 #include <mutex>
@@ -48,12 +50,20 @@ class PlayedPeer {
     }
 
  private:
+    static bool isKnown(const std::string& request) {
+        return request.empty() || request == "is_alive" || request == "is_md_resync" ||
+               request == "is_disk_err_handling" || request == "remote_hostname" ||
+               request == "reboot_remote";
+    }
+
     void serve() {
         while (!_isStopping) {
             const auto request = _socket.receive(std::chrono::minutes(1));
             if (!request) {
                 continue;
             }
+            // Would abort a real peer. The empty one is the end.
+            EXPECT_TRUE(isKnown(request->bytes)) << testing::PrintToString(request->bytes);
             const std::lock_guard<std::mutex> lock(_mutex);
             if (!_unanswered && request->bytes == _lastRequest) {
                 _unanswered = request;

@@ -5,6 +5,7 @@
 
 #include "support/sandbox.h"
 #include "ternhad/daemon.h"
+#include "ternhad/played_peer.h"
 
 namespace {
 
@@ -48,6 +49,19 @@ TEST_F(StatusSocketTest, ServesItsGroupAndRefusesReboots) {
     daemon.signal(SIGTERM);
     EXPECT_TRUE(daemon.waitFor(10s).has_value());
     EXPECT_FALSE(test::exists(STATUS_SOCKET));
+}
+
+TEST_F(StatusSocketTest, PeerReceivesNothingButRequests) {
+    auto daemon = start();
+    const std::string socket = std::string("--socket ") + STATUS_SOCKET;
+    for (int round = 0; round < 2; ++round) {
+        {
+            test::PlayedPeer peer;  // fails at whatever is no request
+            EXPECT_EQ(runAs(1, socket + " wait peer-alive --timeout 30").exitCode, 0);
+            EXPECT_EQ(runAs(1, socket + " wait peer-no-resync --timeout 30").exitCode, 0);
+        }
+        EXPECT_EQ(runAs(1, socket + " wait peer-dead --timeout 30").exitCode, 0);
+    }
 }
 
 TEST_F(StatusSocketTest, DirectoryIsTraversableButNotListable) {
