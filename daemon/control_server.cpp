@@ -47,8 +47,13 @@ bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Val
         return MonitordSocket::serverHandle(request, reply);
     }
     const bool wasAlive = _orders->isPeerAlive();
+    const bool wasRebooting = _orders->status().isRemoteRebooting();
     const auto start = Clock::now();
     const bool isServed = MonitordSocket::serverHandle(request, reply);
+    if (!wasAlive && !wasRebooting) {
+        // Nobody knows whether it heard the order.
+        _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
+    }
     _orders->findings().setOrderOutcome(wasAlive ? outcomeSince(start) : Findings::OrderOutcome::wasDead);
     return isServed;
 }

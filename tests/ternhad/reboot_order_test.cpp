@@ -71,6 +71,14 @@ TEST_F(RebootOrderTest, ObeyingPeerWentDownAndDeadPeerWasAlreadyDead) {
     EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it was already dead"));
 }
 
+TEST_F(RebootOrderTest, ADeadPeerDoesNotCountAsRebootingAfterAnOrder) {
+    a.start();
+    ASSERT_EQ(a.node.run({TERNHACTL, "wait", "peer-dead", "--timeout", "20"}).exitCode, 0);
+    EXPECT_EQ(order().exitCode, 1);
+    EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it was already dead"));
+    EXPECT_EQ(a.node.run({TERNHACTL, "rebooting"}).output, "no\n");
+}
+
 // Long before it counts as dead.
 TEST_F(RebootOrderTest, ObeyingPeerWentDownAlthoughNotYetDeclaredDead) {
     a.start({"--dead-after", "60"});
