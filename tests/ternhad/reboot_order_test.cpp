@@ -71,7 +71,7 @@ TEST_F(RebootOrderTest, ObeyingPeerWentDownAndDeadPeerWasAlreadyDead) {
     EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it was already dead"));
 }
 
-TEST_F(RebootOrderTest, ADeadPeerDoesNotCountAsRebootingAfterAnOrder) {
+TEST_F(RebootOrderTest, DeadPeerDoesNotCountAsRebootingAfterARequest) {
     a.start();
     ASSERT_EQ(a.node.run({TERNHACTL, "wait", "peer-dead", "--timeout", "20"}).exitCode, 0);
     EXPECT_EQ(order().exitCode, 1);
