@@ -69,8 +69,7 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
       _nodeWatcher(options, _health, _events, _shutdown, _progress),
       _watchdog(watchdogInterval()),
       _nextWatchdog(Clock::now()) {
-    // Before the threads that have descriptor tables of their own: a change that one of them reports sets an
-    // event by its descriptor, which in its table would be something else, such as a socket to the peer.
+    // The threads of the peer set events of theirs, which so must be made before.
     if (!options.statusSocket.empty()) {
         _statusStreams.emplace(_health.transitions(), _reporter, _shutdown);
         _statusServer.emplace(options.statusSocket, ControlServer::Access::reading, _health, _reporter,

@@ -8,18 +8,36 @@
 #include <array>
 #include <cerrno>
 #include <cstdint>
+#include <stdexcept>
 #include <system_error>
 
 namespace ternhad {
 
-Event::Event() : _fd(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-    if (_fd < 0) {
+namespace {
+
+std::atomic<bool> isSealed{false};
+
+int newEvent() {
+    if (isSealed) {
+        throw std::logic_error("an event that some threads do not have");
+    }
+    const int fd = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+    if (fd < 0) {
         throw std::system_error(errno, std::generic_category(), "eventfd");
     }
+    return fd;
 }
+
+}  // namespace
+
+Event::Event() : _fd(newEvent()) {}
 
 Event::~Event() {
     close(_fd);
+}
+
+void Event::seal() noexcept {
+    isSealed = true;
 }
 
 void Event::set() noexcept {

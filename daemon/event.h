@@ -12,9 +12,13 @@ using Clock = std::chrono::steady_clock;
 // allocates. Make it before threads that isolate their descriptors: to those it would be another file.
 class Event {
  public:
-    // Throws std::system_error when no descriptor is to be had.
+    // Throws std::system_error when no descriptor is to be had, and std::logic_error after seal().
     Event();
     ~Event();
+
+    // Forbids further events. A thread that gets a descriptor table of its own calls this first: there, the
+    // number of a later event would be another file or socket.
+    static void seal() noexcept;
 
     Event(const Event&) = delete;
     Event& operator=(const Event&) = delete;

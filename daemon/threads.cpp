@@ -77,6 +77,7 @@ bool isolateDescriptors() noexcept {
 #ifdef __SANITIZE_THREAD__
     return false;  // the thread sanitizer knows one table of descriptors, and would see races between two
 #else
+    Event::seal();
     return unshare(CLONE_FILES) == 0;
 #endif
 }

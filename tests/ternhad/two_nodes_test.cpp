@@ -57,6 +57,29 @@ TEST_F(TwoNodesTest, DetectACutLinkAndItsReturn) {
     }
 }
 
+TEST(TwoNodesWithStatusSocketsTest, SurviveACutLink) {
+    Machine a{"node-a", "10.0.0.1", "10.0.0.2"};
+    Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
+    test::connect(a.node, "10.0.0.1", b.node, "10.0.0.2");
+    for (Machine* machine : {&a, &b}) {
+        machine->start({"--status-socket", "/run/ternha/status.sock", "--status-group", "daemon",
+                        "--dead-after", "0.6"});
+    }
+    const auto bothSee = [&](bool alive) {
+        return a.sees("isRemoteAlive", alive) && b.sees("isRemoteAlive", alive);
+    };
+    ASSERT_TRUE(test::eventually(20s, [&] { return bothSee(true); }));
+    for (int i = 0; i < 3; ++i) {
+        test::setLink(a.node, false);
+        EXPECT_TRUE(test::eventually(20s, [&] { return bothSee(false); }));
+        test::setLink(a.node, true);
+        EXPECT_TRUE(test::eventually(20s, [&] { return bothSee(true); }));
+    }
+    for (Machine* machine : {&a, &b}) {
+        EXPECT_FALSE(machine->daemon->waitFor(0s).has_value()) << "ended: " << machine->log();
+    }
+}
+
 TEST_F(TwoNodesTest, StoppedDaemonIsDeadUntilItContinues) {
     b.daemon->signal(SIGSTOP);
     EXPECT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", false); }));
