@@ -17,7 +17,6 @@ namespace ternhactl {
 
 namespace {
 
-constexpr char REFUSAL[] = "refused: ";  // a reason follows
 constexpr char NOT_TERNHADS[] = "the reply is not ternhad's";
 constexpr std::size_t LONGEST_REPLY = std::size_t{256} * 1024;
 constexpr char NO_REPLY[] = "the connection was closed without a reply";

@@ -11,6 +11,9 @@
 
 namespace ternhactl {
 
+// What ternhad sends in place of a reply that it refuses; a reason follows.
+inline constexpr char REFUSAL[] = "refused: ";
+
 // The daemon does not answer; what() tells why.
 struct NoAnswer : std::runtime_error {
     using std::runtime_error::runtime_error;

@@ -123,7 +123,11 @@ LocalState readLocalState() {
     LocalState state;
     readDrbd(state);
     readArrays(state);
-    state.hasAtaPorts = !entries("/sys/class/ata_port", "ata").empty();
+    for (const auto& port : entries("/sys/class/ata_port", "ata")) {
+        state.hasAtaPorts = true;
+        state.isErrorHandlingKnown =
+            state.isErrorHandlingKnown || std::filesystem::exists(port / "error_handling");
+    }
     return state;
 }
 

@@ -16,6 +16,7 @@ struct LocalState {
     bool hasArrays = false;                        // md
     std::vector<std::string> arrayProblems;        // as "md0 degraded"
     bool hasAtaPorts = false;
+    bool isErrorHandlingKnown = false;  // not every kernel's ATA ports tell of it
 };
 
 // Reads /proc/drbd and sysfs; any user may. What cannot be read counts as not there.

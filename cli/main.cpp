@@ -95,7 +95,10 @@ ExitCode unknown(const std::string& reason) {
     return ExitCode::NoAnswer;
 }
 
-std::string noAnswer(const Settings& settings, const char* reason) {
+std::string noAnswer(const Settings& settings, const std::string& reason) {
+    if (reason.rfind(REFUSAL, 0) == 0) {
+        return "ternhad on " + settings.socket + ' ' + reason;
+    }
     return "ternhad does not answer on " + settings.socket + ": " + reason;
 }
 

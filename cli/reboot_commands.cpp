@@ -62,7 +62,7 @@ ExitCode rebootPeer(const Settings& settings) {
         std::cout << "The peer still answers: it was not rebooted.\n";
         return ExitCode::No;
     }
-    std::cout << "The peer went down. It counts as rebooting until it answers again.\n";
+    std::cout << "The peer went down, or the link to it. It counts as rebooting until it replies again.\n";
     return ExitCode::Success;
 }
 

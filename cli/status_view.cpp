@@ -125,8 +125,8 @@ void addNode(View& view, const Report& report, const LocalState& local, double n
         view.row("RAID arrays", Look::Trouble, joined(local.arrayProblems));
     }
     std::string disks = yesNo(report.diskErrors, now);
-    if (!local.hasAtaPorts && report.diskErrors.is(false)) {
-        disks = "no ATA ports";
+    if (!local.isErrorHandlingKnown && report.diskErrors.is(false)) {
+        disks = local.hasAtaPorts ? "unknown (the ATA ports do not tell)" : "no ATA ports";
     } else if (!report.disks.empty()) {
         disks += ": " + joined(report.disks);
     }

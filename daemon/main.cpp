@@ -56,8 +56,8 @@ int main(int argc, char** argv) try {
         ternhad::writeJournal(ternhad::Level::warning, warning);
     }
     if (options.isCheckOnly) {
-        std::cout << ternhad::configurationText(options) << std::flush;
-        return std::cout ? EXIT_SUCCESS : FAILURE;
+        std::cout << ternhad::configurationText(options);
+        return ternhad::isPrinted() ? EXIT_SUCCESS : FAILURE;
     }
     openlog("ternhad", LOG_PID, LOG_DAEMON);
     return run(options);

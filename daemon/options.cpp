@@ -14,6 +14,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <filesystem>
 #include <iostream>
 #include <memory>
 #include <utility>
@@ -26,6 +27,7 @@ namespace ternhad {
 
 namespace {
 
+constexpr int FAILURE = 1;
 constexpr int WRONG_USAGE = 2;
 constexpr double DAY = 86400;
 constexpr Seconds ROUNDING = std::chrono::nanoseconds(1);  // three times 0.2 is more than 0.6
@@ -125,6 +127,15 @@ void addInterval(CLI::App& app, const std::string& name, Seconds& value, double 
 
 }  // namespace
 
+bool isPrinted() {
+    std::cout.flush();
+    if (!std::cout) {
+        std::cerr << "ternhad: cannot write to standard output: " << std::strerror(errno) << '\n';
+        return false;
+    }
+    return true;
+}
+
 std::optional<int> parseOptions(int argc, const char* const* argv, Options& options) {
     CLI::App app(
         "High-availability daemon of one node: watches its peer over the replication link, replies to the "
@@ -200,7 +211,8 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
             if (options.statusGroup.empty()) {
                 throw CLI::ValidationError("--status-socket", "needs --status-group");
             }
-            if (options.statusSocket == options.socket) {
+            if (std::filesystem::path(options.statusSocket).lexically_normal() ==
+                std::filesystem::path(options.socket).lexically_normal()) {
                 throw CLI::ValidationError("--status-socket", "the same path as --socket");
             }
             options.statusGroupId = getgrnam(options.statusGroup.c_str())->gr_gid;
@@ -211,7 +223,10 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
             std::cerr << "ternhad: " << located << '\n';
             return WRONG_USAGE;
         }
-        return app.exit(error) == 0 ? 0 : WRONG_USAGE;
+        if (app.exit(error) != 0) {
+            return WRONG_USAGE;
+        }
+        return isPrinted() ? 0 : FAILURE;
     }
     return std::nullopt;
 }

@@ -27,6 +27,9 @@ struct Options {
     std::int64_t rotateSize = 1048576;  // bytes of a log at which it is rotated
 };
 
+// Flushes standard output. False, after a message on standard error, when it cannot be written.
+bool isPrinted();
+
 // Reads the command line and the configuration file that it names. Returns the exit code when the process is
 // to end at once: 0 after --help and --version, 2 after a message on standard error about what is wrong.
 std::optional<int> parseOptions(int argc, const char* const* argv, Options& options);

@@ -477,7 +477,7 @@ TEST_F(TernhactlTest, ReportsTheOutcomeOfAReboot) {
     const auto result = test::resultOf(std::move(obeyed));
     EXPECT_EQ(result.exitCode, 0);
     EXPECT_THAT(result.output,
-                EndsWith("The peer went down. It counts as rebooting until it answers again.\n"));
+                EndsWith("The peer went down, or the link to it. It counts as rebooting until it replies again.\n"));
     EXPECT_EQ(status.getRemoteNodeState(), TERN::HA::Daemon::NodeRebooting);
 }
 

@@ -231,6 +231,24 @@ TEST_F(OptionsTest, OtherEndOfAPointToPointLinkIsAccepted) {
               0);
 }
 
+TEST_F(OptionsTest, OutputErrorsAreReported) {
+    for (const std::string arguments :
+         {"--help", "--version",
+          "--local-ip 127.0.0.1 --remote-ip 127.0.0.2 --interface lo --check-config"}) {
+        const auto result = test::run({"/bin/sh", "-c", TERNHAD " " + arguments + " >/dev/full"});
+        EXPECT_EQ(result.exitCode, 1) << arguments;
+        EXPECT_EQ(result.error, "ternhad: cannot write to standard output: No space left on device\n");
+    }
+}
+
+TEST_F(OptionsTest, StatusSocketIsNotTheControlSocketByAnotherName) {
+    const auto result =
+        ternhad({"--local-ip", "127.0.0.1", "--remote-ip", "127.0.0.2", "--interface", "lo", "--status-group",
+                 "daemon", "--status-socket", "/run/ternha/../ternha/control.sock"});
+    EXPECT_EQ(result.exitCode, 2);
+    EXPECT_THAT(result.error, HasSubstr("the same path as --socket"));
+}
+
 TEST_F(OptionsTest, HelpAndVersionSucceed) {
     const auto help = ternhad({"--help"});
     EXPECT_EQ(help.exitCode, 0);

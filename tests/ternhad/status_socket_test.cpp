@@ -42,7 +42,9 @@ TEST_F(StatusSocketTest, ServesItsGroupAndRefusesReboots) {
     EXPECT_EQ(runAs(1, socket + " wait not-connected --timeout 30").exitCode, 0);
     const auto order = runAs(1, socket + " reboot-peer --yes");
     EXPECT_EQ(order.exitCode, 3);
-    EXPECT_THAT(order.output, HasSubstr("refused: this socket takes no orders\n"));
+    EXPECT_THAT(
+        order.output,
+        HasSubstr("ternhactl: ternhad on /run/ternha/status.sock refused: this socket takes no orders\n"));
     EXPECT_THAT(runAs(1, "status").output, HasSubstr("Permission denied"));
     EXPECT_THAT(runAs(2, socket + " status").output, HasSubstr("Permission denied"));
     EXPECT_THAT(test::wholeLog(), Not(HasSubstr("Reboot of the peer ordered")));
