@@ -63,7 +63,7 @@ void moveLines(const File& from, const File& to) {
             return;
         }
         // Another writer may be in the middle of an append.
-        if (count == -1 || ++waits > LINE_END_WAITS) {
+        if (++waits > LINE_END_WAITS) {
             break;
         }
         std::this_thread::sleep_for(LINE_END_WAIT);

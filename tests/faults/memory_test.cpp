@@ -323,9 +323,12 @@ TEST_F(MemoryTest, HostnameRequestFailsCleanly) {
     std::string hostname;
     Operation name{"GetRemoteHostname",
                    [&hostname] { hostname = std::string(); },
-                   [&hostname] { return yesNo(GetRemoteHostname()(hostname)); },
-                   "yes",
-                   {"no"},
+                   [&hostname] {
+                       const bool isKnown = GetRemoteHostname()(hostname);
+                       return yesNo(isKnown) + ": " + hostname;
+                   },
+                   "yes: a-host-with-quite-a-long-name",
+                   {"no: "},
                    [&hostname] { return hostname; },
                    "a-host-with-quite-a-long-name",
                    {""}};
