@@ -102,8 +102,8 @@ TEST_F(StatusSocketTest, FollowersDoNotCountAgainstTheControlSocket) {
         followers.emplace_back(
             std::vector<std::string>{TERNHACTL, "--socket", STATUS_SOCKET, "wait", "peer-alive"});
     }
-    EXPECT_TRUE(test::eventually(20s, [] {
-        return runAs(1, std::string("--socket ") + STATUS_SOCKET + " wait peer-alive --timeout 0.2")
+    EXPECT_TRUE(test::eventually(60s, [] {
+        return runAs(1, std::string("--socket ") + STATUS_SOCKET + " wait peer-alive --timeout 3")
                    .output.find("refused: too many clients follow the events\n") != std::string::npos;
     }));
     EXPECT_EQ(runAs(0, "wait not-connected --timeout 20").exitCode, 0);
