@@ -310,12 +310,11 @@ TEST_F(RecipesTest, PacemakerLearnsWhetherTheNodeIsFit) {
         0);
     test::Process corosync = a.node.start({"corosync", "-f"});
     test::Process pacemaker = a.node.start({"/bin/sh", "-c", "PCMK_logfile=none exec pacemakerd -f"});
-    ASSERT_TRUE(
-        test::eventually(120s,
-                         [&] {
-                             return a.node.run({"attrd_updater", "-n", "probe", "-U", "1"}).exitCode == 0;
-                         }))
-        << corosync.error() << pacemaker.error();
+    const auto isUp = [&] {
+        const auto result = a.node.run({"attrd_updater", "-n", "probe", "-U", "1"});
+        return result.exitCode == 0;
+    };
+    ASSERT_TRUE(test::eventually(120s, isUp)) << corosync.error() << pacemaker.error();
 
     ASSERT_TRUE(cluster.start());
     test::Process attribute = a.node.start({"/usr/local/sbin/ternha-attribute"});

@@ -56,7 +56,7 @@ class DaemonTest : public ::testing::Test {
     }
 
     // Until it listens for the peer's questions, too: those that come before are lost.
-    static void waitForAnswers() {
+    static void waitForReplies() {
         test::UdpSocket asker("127.0.0.4");
         EXPECT_TRUE(test::eventually(10s, [&asker] {
             asker.send("is_alive", "127.0.0.1", 7499);
@@ -404,7 +404,7 @@ TEST_F(DaemonTest, ExitsWhenTheControlSocketCannotBeBound) {
 
 TEST_F(DaemonTest, UnknownRequestAbortsIt) {
     auto daemon = startAndWait();
-    waitForAnswers();
+    waitForReplies();
     test::UdpSocket stranger("127.0.0.3", 40000);
     stranger.send("who_are_you", "127.0.0.1", 7499);
     const auto status = daemon.waitFor(10s);
@@ -413,7 +413,7 @@ TEST_F(DaemonTest, UnknownRequestAbortsIt) {
 }
 
 // The answers that have come back to a socket so far, each of which must be `expected`.
-int answersAt(test::UdpSocket& socket, const std::string& expected, std::chrono::milliseconds limit) {
+int repliesAt(test::UdpSocket& socket, const std::string& expected, std::chrono::milliseconds limit) {
     int count = 0;
     while (const auto answer = socket.receive(limit)) {
         EXPECT_EQ(answer->bytes, expected);
@@ -425,30 +425,30 @@ int answersAt(test::UdpSocket& socket, const std::string& expected, std::chrono:
 TEST_F(DaemonTest, FloodOfRequestsGetsNoDuplicateOrMisdirectedReply) {
     test::writeFile("/tmp/.ha.hostname.original", "node-a");
     auto daemon = startAndWait();
-    waitForAnswers();
+    waitForReplies();
     const std::map<std::string, std::string> answers = {
         {"is_alive", "alive"},
         {"is_md_resync", "not_resync"},
         {"is_disk_err_handling", R"({"errHandlingDisk":[],"isDiskErrHandling":false})"},
         {"remote_hostname", "node-a"}};
-    constexpr int QUESTIONS = 25000;
+    static constexpr int REQUESTS = 25000;
     std::vector<std::thread> askers;
     std::atomic<int> answered{0};
     for (const auto& [question, expected] : answers) {
-        askers.emplace_back([&, question = question, expected = expected] {
+        askers.emplace_back([&answered, request = question, reply = expected] {
             test::UdpSocket socket("127.0.0.2");
             int own = 0;
-            for (int i = 0; i < QUESTIONS; ++i) {
-                socket.send(question, "127.0.0.1", 7499);
+            for (int i = 0; i < REQUESTS; ++i) {
+                socket.send(request, "127.0.0.1", 7499);
                 if (i % 50 == 0) {
-                    own += answersAt(socket, expected, 0ms);
+                    own += repliesAt(socket, reply, 0ms);
                 }
             }
-            own += answersAt(socket, expected, 1s);
-            EXPECT_LE(own, QUESTIONS);
-            // And now, that all is quiet, one answer for one question.
-            socket.send(question, "127.0.0.1", 7499);
-            EXPECT_EQ(answersAt(socket, expected, 1s), 1);
+            own += repliesAt(socket, reply, 1s);
+            EXPECT_LE(own, REQUESTS);
+            // And now, that all is quiet, one reply for one request.
+            socket.send(request, "127.0.0.1", 7499);
+            EXPECT_EQ(repliesAt(socket, reply, 1s), 1);
             answered += own;
         });
     }
@@ -456,7 +456,7 @@ TEST_F(DaemonTest, FloodOfRequestsGetsNoDuplicateOrMisdirectedReply) {
         asker.join();
     }
     EXPECT_GT(answered, 0);
-    std::printf("%d of %d questions answered\n", answered.load(), 4 * QUESTIONS);
+    std::printf("%d of %d requests replied to\n", answered.load(), 4 * REQUESTS);
     stop(daemon);
 }
 

@@ -31,9 +31,11 @@ TEST_F(RebootOrderTest, PeerThatIgnoresItWasNotRebooted) {
     test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
     EXPECT_TRUE(eventuallyLogs("Reboot of the peer ordered, which is alive"));
     // Nobody else waits for it.
-    EXPECT_TRUE(test::eventually(10s, [this] {
-        return a.node.run({TERNHACTL, "rebooting"}).output == "yes\n";
-    }));
+    const auto isRebooting = [this](const char* answer) {
+        const auto result = a.node.run({TERNHACTL, "rebooting"});
+        return result.output == answer;
+    };
+    EXPECT_TRUE(test::eventually(10s, [&] { return isRebooting("yes\n"); }));
     EXPECT_THAT(a.node.run({TERNHACTL, "check"}).output, HasSubstr("peer being rebooted"));
     const auto second = order();
     EXPECT_EQ(second.exitCode, 1);
@@ -43,9 +45,7 @@ TEST_F(RebootOrderTest, PeerThatIgnoresItWasNotRebooted) {
     EXPECT_EQ(result.exitCode, 1);
     EXPECT_THAT(result.output, EndsWith("The peer still answers: it was not rebooted.\n"));
     EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it still answers, not rebooted"));
-    EXPECT_TRUE(test::eventually(10s, [this] {
-        return a.node.run({TERNHACTL, "rebooting"}).output == "no\n";
-    }));
+    EXPECT_TRUE(test::eventually(10s, [&] { return isRebooting("no\n"); }));
 }
 
 TEST_F(RebootOrderTest, ObeyingPeerWentDownAndDeadPeerWasAlreadyDead) {
