@@ -7,6 +7,7 @@
 #include <atomic>
 #include <chrono>
 #include <csignal>
+#include <cstdio>
 #include <optional>
 #include <string>
 #include <thread>
@@ -66,8 +67,10 @@ class Peer {
 
 // Makes every open of this file for writing hang, as on a disk that hangs.
 inline void hang(const char* file) {
-    removeTree(file);
-    ASSERT_EQ(mkfifo(file, 0600), 0);
+    // In one step: the daemon would make the file again.
+    const std::string fifo = std::string(file) + ".fifo";
+    ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+    ASSERT_EQ(std::rename(fifo.c_str(), file), 0);
 }
 
 // The log keeper of a daemon; -1 while there is none.
