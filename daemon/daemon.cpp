@@ -69,7 +69,8 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
       _nodeWatcher(options, _health, _events, _shutdown, _progress),
       _watchdog(watchdogInterval()),
       _nextWatchdog(Clock::now()) {
-    // The threads of the peer set events of theirs, which so must be made before.
+    // Here and not in startStatusServer(): the probes thread sets an event of the streams, and knows only
+    // descriptors that are older than itself.
     if (!options.statusSocket.empty()) {
         _statusStreams.emplace(_health.transitions(), _reporter, _shutdown);
         _statusServer.emplace(options.statusSocket, ControlServer::Access::reading, _health, _reporter,

@@ -9,7 +9,7 @@ namespace ternhad {
 using Clock = std::chrono::steady_clock;
 
 // A flag that a thread can wait for, alone or together with sockets. Thread-safe; set() neither blocks nor
-// allocates. Make it before threads that isolate their descriptors: to those it would be another file.
+// allocates.
 class Event {
  public:
     // Throws std::system_error when no descriptor is to be had, and std::logic_error after seal().

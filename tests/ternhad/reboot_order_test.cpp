@@ -19,6 +19,28 @@ class RebootOrderTest : public ::testing::Test {
         return test::eventually(10s, [&] { return a.log().find(text + "\n") != std::string::npos; });
     }
 
+    // What `ternhactl rebooting` prints.
+    bool isRebooting(const std::string& reply) {
+        const auto result = a.node.run({TERNHACTL, "rebooting"});
+        return result.output == reply;
+    }
+
+    // Reboots a peer that is killed as soon as its trigger is written.
+    void rebootObeyingPeer() {
+        test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
+        EXPECT_TRUE(test::eventually(20s, [this] {
+            return test::exists(b.node.path("/proc/sysrq-trigger")) &&
+                   test::readFile(b.node.path("/proc/sysrq-trigger")) == "b";
+        }));
+        b.daemon->signal(SIGKILL);
+        const auto result = test::resultOf(std::move(ordered));
+        EXPECT_EQ(result.exitCode, 0);
+        const std::string end =
+            "The peer went down, or the link to it. It counts as rebooting until it replies again.\n";
+        EXPECT_THAT(result.output, EndsWith(end));
+        EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it went down"));
+    }
+
     test::Machine a{"node-a", "10.0.0.1", "10.0.0.2"};
     test::Machine b{"node-b", "10.0.0.2", "10.0.0.1"};
 };
@@ -31,10 +53,6 @@ TEST_F(RebootOrderTest, PeerThatIgnoresItWasNotRebooted) {
     test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
     EXPECT_TRUE(eventuallyLogs("Reboot of the peer ordered, which is alive"));
     // Nobody else waits for it.
-    const auto isRebooting = [this](const char* answer) {
-        const auto result = a.node.run({TERNHACTL, "rebooting"});
-        return result.output == answer;
-    };
     EXPECT_TRUE(test::eventually(10s, [&] { return isRebooting("yes\n"); }));
     EXPECT_THAT(a.node.run({TERNHACTL, "check"}).output, HasSubstr("peer being rebooted"));
     const auto second = order();
@@ -52,18 +70,7 @@ TEST_F(RebootOrderTest, ObeyingPeerWentDownAndDeadPeerWasAlreadyDead) {
     a.start();
     b.start();
     ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));
-    test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
-    EXPECT_TRUE(test::eventually(20s, [this] {
-        return test::exists(b.node.path("/proc/sysrq-trigger")) &&
-               test::readFile(b.node.path("/proc/sysrq-trigger")) == "b";
-    }));
-    b.daemon->signal(SIGKILL);
-    const auto result = test::resultOf(std::move(ordered));
-    EXPECT_EQ(result.exitCode, 0);
-    EXPECT_THAT(
-        result.output,
-        EndsWith("The peer went down, or the link to it. It counts as rebooting until it replies again.\n"));
-    EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it went down"));
+    rebootObeyingPeer();
 
     const auto again = order();
     EXPECT_EQ(again.exitCode, 1);
@@ -79,7 +86,7 @@ TEST_F(RebootOrderTest, DeadPeerDoesNotCountAsRebootingAfterARequest) {
     }));
     EXPECT_EQ(order().exitCode, 1);
     EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it was already dead"));
-    EXPECT_EQ(a.node.run({TERNHACTL, "rebooting"}).output, "no\n");
+    EXPECT_TRUE(isRebooting("no\n"));
 }
 
 // Long before it counts as dead.
@@ -87,22 +94,8 @@ TEST_F(RebootOrderTest, ObeyingPeerWentDownAlthoughNotYetDeclaredDead) {
     a.start({"--dead-after", "60"});
     b.start();
     ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));
-    test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
-    EXPECT_TRUE(test::eventually(20s, [this] {
-        return test::exists(b.node.path("/proc/sysrq-trigger")) &&
-               test::readFile(b.node.path("/proc/sysrq-trigger")) == "b";
-    }));
-    b.daemon->signal(SIGKILL);
-    const auto result = test::resultOf(std::move(ordered));
-    EXPECT_EQ(result.exitCode, 0);
-    EXPECT_THAT(
-        result.output,
-        EndsWith("The peer went down, or the link to it. It counts as rebooting until it replies again.\n"));
-    EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it went down"));
+    rebootObeyingPeer();
     EXPECT_TRUE(a.sees("isRemoteAlive", true));
-    const auto isRebooting = [this](const std::string& answer) {
-        return a.node.run({TERNHACTL, "rebooting"}).output == answer;
-    };
     EXPECT_FALSE(test::eventually(7s, [&] { return !isRebooting("yes\n"); }));
     b.start();
     EXPECT_TRUE(test::eventually(30s, [&] { return isRebooting("no\n"); }));
