@@ -44,9 +44,10 @@ class Control:
     """A control group of node a, with the given controller and limits."""
 
     def __init__(self, controller, limits):
-        self.path = Path(f"/sys/fs/cgroup/{controller}/ternha-pressure")
+        name = f"ternha-pressure-{os.getpid()}"  # two of these may run, one for each setting
+        self.path = Path(f"/sys/fs/cgroup/{controller}") / name
         if not self.path.parent.exists():
-            self.path = Path("/sys/fs/cgroup/ternha-pressure")
+            self.path = Path("/sys/fs/cgroup") / name
         self.path.mkdir(exist_ok=True)
         for names, value in limits:
             next(self.path / name for name in names if (self.path / name).exists()).write_text(str(value))
