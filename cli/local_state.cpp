@@ -119,6 +119,13 @@ void readArrays(LocalState& state) {
 
 }  // namespace
 
+std::string LocalState::missingDrbd() const {
+    if (!hasDrbd) {
+        return "no /proc/drbd";
+    }
+    return hasResources ? "" : "no resource";
+}
+
 LocalState readLocalState() {
     LocalState state;
     readDrbd(state);

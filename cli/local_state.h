@@ -17,6 +17,9 @@ struct LocalState {
     std::vector<std::string> arrayProblems;        // as "md0 degraded"
     bool hasAtaPorts = false;
     bool isErrorHandlingKnown = false;  // not every kernel's ATA ports tell of it
+
+    // What DRBD lacks to connect at all, as "no /proc/drbd"; empty when it lacks nothing.
+    std::string missingDrbd() const;
 };
 
 // Reads /proc/drbd and sysfs; any user may. What cannot be read counts as not there.

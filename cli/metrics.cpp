@@ -36,7 +36,8 @@ class Text {
     }
 
     void gauge(const char* name, const char* help, const Report::Flag& flag) {
-        gauge(name, help, flag.isKnown() ? std::optional<double>(*flag.value ? 1 : 0) : std::nullopt);
+        const auto value = flag.current();
+        gauge(name, help, value ? std::optional<double>(*value ? 1 : 0) : std::nullopt);
     }
 
     std::string str() const { return _text.str(); }

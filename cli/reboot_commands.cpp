@@ -23,10 +23,13 @@ bool confirm() {
 
 // An older daemon does not tell.
 std::string outcomeOf(const Report& before, const Report& after) {
-    return !after.orderOutcome.empty()  ? after.orderOutcome
-           : before.peerAlive.is(false) ? WAS_DEAD
-           : after.peerAlive.is(false)  ? WENT_DOWN
-                                        : "still-answers";
+    if (!after.orderOutcome.empty()) {
+        return after.orderOutcome;
+    }
+    if (before.peerAlive.is(false)) {
+        return WAS_DEAD;
+    }
+    return after.peerAlive.is(false) ? WENT_DOWN : "still-answers";
 }
 
 }  // namespace

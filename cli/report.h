@@ -23,6 +23,7 @@ struct Report {
 
         bool isKnown() const { return value && !isStale; }
         bool is(bool expected) const { return isKnown() && value == expected; }
+        std::optional<bool> current() const { return isStale ? std::nullopt : value; }
     };
     struct Figure {
         std::optional<double> value;

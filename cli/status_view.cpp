@@ -140,9 +140,8 @@ std::string drbdState(const Report::Flag& connected, const LocalState& local, do
     if (*connected.value) {
         return "connected" + sinceOf(connected.since, now);
     }
-    return "not connected" + (!local.hasDrbd       ? " (no /proc/drbd)"
-                              : local.hasResources ? sinceOf(connected.since, now)
-                                                   : " (no resource)");
+    const std::string missing = local.missingDrbd();
+    return "not connected" + (missing.empty() ? sinceOf(connected.since, now) : " (" + missing + ")");
 }
 
 void addDrbd(View& view, const Report& report, const LocalState& local, double now) {

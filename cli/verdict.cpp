@@ -38,7 +38,10 @@ std::string unknownState(const Report::Flag& flag, const char* verb, double now)
 
 // The older of two flags that must both be known; null when they are.
 const Report::Flag* unknownOf(const Report::Flag& a, const Report::Flag& b) {
-    return a.isKnown() && b.isKnown() ? nullptr : a.isKnown() ? &b : &a;
+    if (!a.isKnown()) {
+        return &a;
+    }
+    return b.isKnown() ? nullptr : &b;
 }
 
 // One figure of the performance data.
@@ -66,9 +69,8 @@ Verdict verdict(const Report& report, const LocalState& local) {
     if (!local.unsupportedDrbd.empty()) {
         critical.push_back("DRBD " + local.unsupportedDrbd + " is not supported, 8.4 is");
     } else if (report.connected.is(false)) {
-        critical.push_back("DRBD not connected" + std::string(!local.hasDrbd       ? " (no /proc/drbd)"
-                                                              : local.hasResources ? ""
-                                                                                   : " (no resource)"));
+        const std::string missing = local.missingDrbd();
+        critical.push_back("DRBD not connected" + (missing.empty() ? "" : " (" + missing + ")"));
     } else {
         if (!report.connected.isKnown()) {
             unknown.push_back("DRBD " + unknownState(report.connected, "checked", now));
@@ -131,12 +133,12 @@ Verdict verdictOfNode(const Report& report, const LocalState& local) {
     } else if (const auto* flag = unknownOf(report.resync, report.diskErrors)) {
         result.level = Verdict::Level::Unknown;
         result.reasons = {"this node " + unknownState(*flag, "checked", now)};
-    } else if (!local.hasDrbd || !local.unsupportedDrbd.empty() || !local.hasResources) {
+    } else if (!local.unsupportedDrbd.empty()) {
         result.level = Verdict::Level::Unknown;
-        result.reasons = {!local.hasDrbd                  ? "replica unknown: no /proc/drbd"
-                          : local.unsupportedDrbd.empty() ? "replica unknown: DRBD has no resource"
-                                                          : "replica unknown: DRBD " + local.unsupportedDrbd +
-                                                                " is not supported, 8.4 is"};
+        result.reasons = {"replica unknown: DRBD " + local.unsupportedDrbd + " is not supported, 8.4 is"};
+    } else if (const std::string missing = local.missingDrbd(); !missing.empty()) {
+        result.level = Verdict::Level::Unknown;
+        result.reasons = {"replica unknown: DRBD has " + missing};
     } else {
         result.reasons = {"this node could serve alone"};
     }

@@ -17,7 +17,9 @@ constexpr auto REFRESH = std::chrono::seconds(5);  // what becomes stale is no c
 std::string timeText(std::chrono::system_clock::time_point time) {
     const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
     std::tm fields = {};
-    localtime_r(&seconds, &fields);
+    if (localtime_r(&seconds, &fields) == nullptr) {
+        return "an unknown time";
+    }
     std::array<char, 32> text = {};
     const std::size_t size = std::strftime(text.data(), text.size(), "%F %T", &fields);
     return {text.data(), size};

@@ -21,8 +21,7 @@ constexpr unsigned int CLIENT_TIMEOUT = 0;  // a client's; this end does not use
 constexpr auto SILENCE_LIMIT = std::chrono::seconds(5);
 constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the socket file
 constexpr std::size_t MOST_CLIENTS = 16;
-constexpr auto OBEYED = std::chrono::seconds(6);     // after an order a peer that obeys replies no more
-constexpr auto FOLLOWED = std::chrono::seconds(29);  // at least, unless it is seen dead
+constexpr auto OBEYED = std::chrono::seconds(6);  // after an order a peer that obeys replies no more
 constexpr char RESTORING[] = "make the vanished control socket again";
 constexpr char ACCEPTING[] = "accept control clients";
 constexpr char ORDER = 'R';  // the actions
@@ -54,20 +53,21 @@ bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Val
         // Nobody knows whether it heard the order.
         _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
     }
-    _orders->findings().setOrderOutcome(wasAlive ? outcomeSince(start) : Findings::OrderOutcome::wasDead);
+    if (!wasAlive) {
+        _orders->findings().setOrderOutcome(Findings::OrderOutcome::wasDead);
+    } else if (isServed && hasGoneDown(start)) {
+        _orders->findings().setOrderOutcome(Findings::OrderOutcome::wentDown);
+    } else {
+        _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
+        _orders->findings().setOrderOutcome(Findings::OrderOutcome::stillAnswers);
+    }
     return isServed;
 }
 
-// With a long `dead-after` a peer that went down is not dead yet: what counts is whether it has replied
-// since.
-Findings::OrderOutcome ControlServer::Endpoint::outcomeSince(Clock::time_point start) {
-    const bool isSilent =
-        Clock::now() >= start + FOLLOWED && _orders->findings().lastReplyTime() < start + OBEYED;
-    if (!_orders->isPeerAlive() || isSilent) {
-        return Findings::OrderOutcome::wentDown;
-    }
-    _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
-    return Findings::OrderOutcome::stillAnswers;
+// The library has waited until the peer was dead, or for 30 seconds. With a long `dead-after` a peer that
+// went down is not dead yet: what counts is whether it has replied since.
+bool ControlServer::Endpoint::hasGoneDown(Clock::time_point start) const {
+    return !_orders->isPeerAlive() || _orders->findings().lastReplyTime() < start + OBEYED;
 }
 
 ControlServer::ControlServer(const std::string& path, Access access, Health& health, const Reporter& reporter,
@@ -217,12 +217,13 @@ void ControlServer::carryOutOrder() {
     if (_shutdown.isRequested()) {
         return;
     }
-    const auto outcome = _health.findings().orderOutcome();
-    TERNHAD_LOG(_events,
-                std::string("Reboot of the peer: ") +
-                    (outcome == Findings::OrderOutcome::stillAnswers ? "it still answers, not rebooted"
-                     : outcome == Findings::OrderOutcome::wentDown   ? "it went down"
-                                                                     : "it was already dead"));
+    std::string outcome = "it was already dead";
+    if (_health.findings().orderOutcome() == Findings::OrderOutcome::stillAnswers) {
+        outcome = "it still answers, not rebooted";
+    } else if (_health.findings().orderOutcome() == Findings::OrderOutcome::wentDown) {
+        outcome = "it went down";
+    }
+    TERNHAD_LOG(_events, "Reboot of the peer: " + outcome);
 }
 
 }  // namespace ternhad

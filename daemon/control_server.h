@@ -52,7 +52,7 @@ class ControlServer {
         void serve(int fd) { _serverListen(fd); }
 
      private:
-        Findings::OrderOutcome outcomeSince(Clock::time_point start);
+        bool hasGoneDown(Clock::time_point start) const;
 
         const Reporter& _reporter;
         Health* _orders;

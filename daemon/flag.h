@@ -37,7 +37,10 @@ inline bool isReportedByPeer(Flag flag) {
 }
 
 inline const char* conditionOf(Flag flag, std::optional<bool> value) {
-    return !value ? "unknown" : *value ? nameOf(flag).set : nameOf(flag).clear;
+    if (!value) {
+        return "unknown";
+    }
+    return *value ? nameOf(flag).set : nameOf(flag).clear;
 }
 
 }  // namespace ternhad

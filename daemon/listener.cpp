@@ -21,6 +21,10 @@ sockaddr_un addressOf(const std::string& path) {
     return address;
 }
 
+bool share(const std::string& path, gid_t group) {
+    return chown(path.c_str(), static_cast<uid_t>(-1), group) == 0 && chmod(path.c_str(), SHARED_MODE) == 0;
+}
+
 }  // namespace
 
 bool Listener::listen() {
@@ -36,7 +40,8 @@ bool Listener::listen() {
     _fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
     const sockaddr_un address = addressOf(_path);
     if (_fd < 0 || bind(_fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
-        ::listen(_fd, BACKLOG) != 0 || lstat(_path.c_str(), &info) != 0 || (_group && !share())) {
+        ::listen(_fd, BACKLOG) != 0 || lstat(_path.c_str(), &info) != 0 ||
+        (_group && !share(_path, *_group))) {
         const int error = errno;
         close();
         errno = error;
@@ -45,11 +50,6 @@ bool Listener::listen() {
     _device = info.st_dev;
     _inode = info.st_ino;
     return true;
-}
-
-bool Listener::share() const {
-    return chown(_path.c_str(), static_cast<uid_t>(-1), *_group) == 0 &&
-           chmod(_path.c_str(), SHARED_MODE) == 0;
 }
 
 bool Listener::hasFile() const {

@@ -34,7 +34,6 @@ class Listener {
     const std::string& path() const { return _path; }
 
  private:
-    bool share() const;
     void close();
 
     std::string _path;

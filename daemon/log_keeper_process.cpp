@@ -65,7 +65,7 @@ void recordSnapshot(const std::string& status) {
     attempt(TERN::HA::Daemon::recordDF);
     attempt(TERN::HA::Daemon::recordMemoryInfo);
     limitMemory(RLIM_INFINITY);
-    malloc_trim(0);
+    (void)malloc_trim(0);  // there may be nothing to give back
 }
 
 }  // namespace

@@ -27,7 +27,7 @@ class NodeWatcher {
     struct KernelFiles {
         const char* pattern;
         const char* what;
-        std::optional<bool> wereThere = {};
+        std::optional<bool> wereThere;
     };
 
     void check();
@@ -42,9 +42,10 @@ class NodeWatcher {
     const Shutdown& _shutdown;
     Progress& _progress;
 
-    KernelFiles _drbd{"/proc/drbd", "DRBD"};
-    KernelFiles _arrays{"/sys/block/md*/md/sync_action", "md arrays with redundancy"};
-    KernelFiles _ports{"/sys/class/ata_port/ata*/error_handling", "ATA ports that tell of error handling"};
+    KernelFiles _drbd{"/proc/drbd", "DRBD", {}};
+    KernelFiles _arrays{"/sys/block/md*/md/sync_action", "md arrays with redundancy", {}};
+    KernelFiles _ports{
+        "/sys/class/ata_port/ata*/error_handling", "ATA ports that tell of error handling", {}};
 };
 
 }  // namespace ternhad

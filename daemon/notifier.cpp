@@ -39,7 +39,6 @@ std::vector<std::string> environmentOf(const Transition& transition, const std::
 // Null-terminated, for as long as `texts` live.
 std::vector<char*> pointersTo(std::vector<std::string>& texts) {
     std::vector<char*> pointers;
-    pointers.reserve(texts.size() + 1);
     for (std::string& text : texts) {
         pointers.push_back(text.data());
     }

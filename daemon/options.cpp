@@ -116,7 +116,8 @@ void addInterval(CLI::App& app, const std::string& name, Seconds& value, double 
     app.add_option_function<double>(
            name,
            [&value, name, range, least, most](double seconds) {
-               if (!(seconds >= least && seconds <= most)) {
+               const bool isInRange = seconds >= least && seconds <= most;  // "nan" is not
+               if (!isInRange) {
                    throw CLI::ValidationError(name, "not in the range " + range);
                }
                value = Seconds(seconds);

@@ -62,7 +62,9 @@ class Prober::Socket final : public HASocketCommClient {
     bool renew() const {
         sockaddr none = {};
         none.sa_family = AF_UNSPEC;
-        (void)connect(sockFd, &none, sizeof none);
+        if (connect(sockFd, &none, sizeof none) != 0) {
+            return false;
+        }
         discardOldReplies();
         return connect(sockFd, reinterpret_cast<const sockaddr*>(&peerAddr), sizeof peerAddr) == 0;
     }

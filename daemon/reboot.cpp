@@ -37,18 +37,19 @@ void Reboot::flush() {
 }
 
 void Reboot::order() noexcept {
-    if (!isOrdered()) {
+    if (!_isOrdered) {
         _flushed.take();
+        _isOrdered = true;
         _deadline = Clock::now() + DEADLINE;
         _ordered.set();
     }
 }
 
 bool Reboot::complete() noexcept {
-    if (!_flushed.take() && Clock::now() < *_deadline) {
+    if (!_flushed.take() && Clock::now() < _deadline) {
         return true;
     }
-    _deadline.reset();
+    _isOrdered = false;
     const int trigger = open("/proc/sysrq-trigger", O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
     const bool isWritten = trigger >= 0 && write(trigger, "b", 1) == 1;
     if (!isWritten) {

@@ -1,7 +1,5 @@
 #pragma once
 
-#include <optional>
-
 #include "checker.h"
 #include "event.h"
 #include "events.h"
@@ -20,10 +18,10 @@ class Reboot {
     // The rest is for the thread that serves the peer, and waits for nothing.
 
     void order() noexcept;
-    bool isOrdered() const noexcept { return _deadline.has_value(); }
+    bool isOrdered() const noexcept { return _isOrdered; }
 
     // While a reboot is ordered: call complete() at this time, or when the event is set.
-    Clock::time_point deadline() const noexcept { return *_deadline; }
+    Clock::time_point deadline() const noexcept { return _deadline; }
     const Event& flushed() const noexcept { return _flushed; }
 
     // Has the kernel restart when it is time. False when it is and the kernel cannot be told; the order is
@@ -35,7 +33,8 @@ class Reboot {
     const Shutdown& _shutdown;
     Event _ordered;
     Event _flushed;
-    std::optional<Clock::time_point> _deadline;
+    bool _isOrdered = false;
+    Clock::time_point _deadline;
 };
 
 // The peer checks whose library versions would read or write files in the thread that serves the peer.

@@ -13,10 +13,18 @@ namespace {
 
 constexpr auto MEASUREMENT = std::chrono::seconds(10);  // a ping takes as long
 
-const char* nameOf(Findings::OrderOutcome outcome) {
-    return outcome == Findings::OrderOutcome::wentDown       ? "went-down"
-           : outcome == Findings::OrderOutcome::stillAnswers ? "still-answers"
-                                                             : "was-dead";
+Json::Value toJson(Findings::OrderOutcome outcome) {
+    switch (outcome) {
+        case Findings::OrderOutcome::wentDown:
+            return "went-down";
+        case Findings::OrderOutcome::stillAnswers:
+            return "still-answers";
+        case Findings::OrderOutcome::wasDead:
+            return "was-dead";
+        case Findings::OrderOutcome::none:
+            break;
+    }
+    return {};
 }
 
 Json::Value textOrNull(const std::string& text) {
@@ -80,8 +88,7 @@ Json::Value Reporter::report() const {
     peer["rebooting"] = flag(Flag::peerRebooting);
     peer["resync"] = flag(Flag::peerResync);
     peer["diskErrors"] = flag(Flag::peerDiskErrors);
-    const auto outcome = findings.orderOutcome();
-    peer["orderOutcome"] = outcome == Findings::OrderOutcome::none ? Json::Value() : nameOf(outcome);
+    peer["orderOutcome"] = toJson(findings.orderOutcome());
     peer["disks"] =
         findings.arePeerDisksKnown() ? _health.status().getErrHandlingDiskRemote() : Json::Value();
 

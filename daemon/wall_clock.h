@@ -8,7 +8,7 @@ namespace ternhad {
 // The wall clock, asked of the kernel: the standard library's own fails after 2038 on 32-bit machines.
 inline std::chrono::system_clock::time_point wallClock() noexcept {
     timespec now = {};
-    clock_gettime(CLOCK_REALTIME, &now);
+    (void)clock_gettime(CLOCK_REALTIME, &now);  // cannot fail
     return std::chrono::system_clock::time_point(
         std::chrono::duration_cast<std::chrono::system_clock::duration>(
             std::chrono::seconds(now.tv_sec) + std::chrono::nanoseconds(now.tv_nsec)));

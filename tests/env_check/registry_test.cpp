@@ -123,7 +123,7 @@ TEST_F(RegistryTest, BaseClassSendsNothing) {
 using Slot = void (*)();
 const Slot* slotsOf(const EnvCheck& check) {
     const Slot* table = nullptr;
-    std::memcpy(&table, static_cast<const void*>(&check), sizeof table);
+    std::memcpy(static_cast<void*>(&table), static_cast<const void*>(&check), sizeof table);
     return table;
 }
 

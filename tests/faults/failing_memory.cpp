@@ -17,8 +17,13 @@ thread_local int countdown = 0;
 const char* const EXHAUSTED_WHILE = std::getenv("NO_MEMORY_WHILE");
 
 bool fails() {
-    return (countdown > 0 && --countdown == 0) ||
-           (EXHAUSTED_WHILE != nullptr && access(EXHAUSTED_WHILE, F_OK) == 0);
+    if (countdown > 0) {
+        --countdown;
+        if (countdown == 0) {
+            return true;
+        }
+    }
+    return EXHAUSTED_WHILE != nullptr && access(EXHAUSTED_WHILE, F_OK) == 0;
 }
 
 }  // namespace

@@ -1,12 +1,15 @@
 #pragma once
 
 #include <json/json.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 
 #include <csignal>
 #include <string>
 #include <vector>
 
 #include "control.h"
+#include "support/descriptor.h"
 #include "support/files.h"
 #include "support/node.h"
 #include "support/programs.h"
@@ -36,6 +39,17 @@ inline std::string wholeLog(const std::string& root = "", const std::string& nam
         }
     }
     return text;
+}
+
+// A connection to a daemon's control socket.
+inline Descriptor connectedClient() {
+    Descriptor client(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0), "cannot make a socket");
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    std::string(CONTROL_SOCKET).copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
+    const int result = connect(client.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    check(result == 0, "cannot connect");
+    return client;
 }
 
 // The status that the daemon with this control socket reports; null when it does not answer.

@@ -6,7 +6,6 @@
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -16,6 +15,7 @@
 #include <filesystem>
 #include <functional>
 #include <map>
+#include <system_error>
 #include <thread>
 
 #include "support/sandbox.h"
@@ -172,13 +172,12 @@ int connectAsAnotherUser() {
             syscall(SYS_setresuid, 1000, 1000, 1000) != 0) {
             return;
         }
-        const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_un address = {};
-        address.sun_family = AF_UNIX;
-        std::string(test::CONTROL_SOCKET)
-            .copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
-        error = connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0 ? 0 : errno;
-        close(fd);
+        try {
+            test::connectedClient();
+            error = 0;
+        } catch (const std::system_error& failure) {
+            error = failure.code().value();
+        }
     }).join();
     return error;
 }
@@ -198,14 +197,6 @@ TEST_F(DaemonTest, AnotherUserCannotReachTheSocket) {
 // A connection over which nothing is sent.
 class SilentClient {
  public:
-    SilentClient() {
-        sockaddr_un address = {};
-        address.sun_family = AF_UNIX;
-        std::string(test::CONTROL_SOCKET)
-            .copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
-        EXPECT_EQ(connect(_fd.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-    }
-
     // What the daemon has sent when it has closed the connection.
     std::string receiveAll() const {
         std::string all(4096, '\0');
@@ -215,7 +206,7 @@ class SilentClient {
     }
 
  private:
-    test::Descriptor _fd{socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0), "cannot make a socket"};
+    test::Descriptor _fd = test::connectedClient();
 };
 
 TEST_F(DaemonTest, SilentClientsDelayNobodyAndAreDroppedAfterFiveSeconds) {
@@ -234,6 +225,21 @@ TEST_F(DaemonTest, SilentClientsDelayNobodyAndAreDroppedAfterFiveSeconds) {
 
 TEST_F(DaemonTest, RemovedControlSocketIsCreatedAgain) {
     auto daemon = startAndWait();
+    test::removeTree(test::CONTROL_SOCKET);
+    EXPECT_TRUE(test::eventually(15s, isUp));
+    stop(daemon);
+}
+
+TEST_F(DaemonTest, ControlSocketThatCannotBeCreatedAgainIsLoggedOnce) {
+    auto daemon = startAndWait();
+    test::removeTree(test::CONTROL_SOCKET);
+    test::writeFile(test::CONTROL_SOCKET, "");
+    const std::string line = "Cannot make the vanished control socket again: File exists\n";
+    EXPECT_TRUE(test::eventually(15s, [&] { return test::wholeLog().find(line) != std::string::npos; }));
+    EXPECT_FALSE(test::eventually(6s, [&] {
+        const std::string log = test::wholeLog();
+        return log.find(line) != log.rfind(line);
+    }));
     test::removeTree(test::CONTROL_SOCKET);
     EXPECT_TRUE(test::eventually(15s, isUp));
     stop(daemon);

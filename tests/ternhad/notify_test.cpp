@@ -113,6 +113,11 @@ TEST_F(NotifyTest, ChangesBeyondTheQueueAreLogged) {
     EXPECT_TRUE(eventuallyLogs("Ran /tmp/on-change for connected: exit code 0\n"));
 }
 
+TEST_F(NotifyTest, ProgramGetsNoBlockedSignals) {
+    auto daemon = start("grep SigBlk /proc/self/status >/tmp/changes\n");
+    EXPECT_TRUE(eventuallyHas("SigBlk:\t0000000000000000\n"));
+}
+
 TEST_F(NotifyTest, RunningProgramDoesNotDelayTheStop) {
     auto daemon = start("echo $$ >/tmp/changes; exec sleep 1000\n");
     EXPECT_TRUE(test::eventually(10s, [] { return !result().empty(); }));

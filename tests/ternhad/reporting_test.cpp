@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 
 #include <sstream>
 
@@ -165,11 +164,7 @@ TEST_F(ReportingTest, FollowersSeeEachChangeAndWaitersTheirCondition) {
 
 TEST_F(ReportingTest, RequestNestedTooDeepIsRefused) {
     auto daemon = start();
-    sockaddr_un address = {};
-    address.sun_family = AF_UNIX;
-    std::string(test::CONTROL_SOCKET).copy(static_cast<char*>(address.sun_path), sizeof address.sun_path - 1);
-    const test::Descriptor client(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0), "cannot make a socket");
-    ASSERT_EQ(connect(client.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    const test::Descriptor client = test::connectedClient();
     const std::string request(2000, '[');
     ASSERT_EQ(send(client.get(), request.data(), request.size(), 0), 2000);
     char reply = 0;
