@@ -121,7 +121,7 @@ void ControlServer::run(Progress* progress) {
 }
 
 void ControlServer::wait() const {
-    std::array<pollfd, MOST_CLIENTS + 2> waits;
+    std::array<pollfd, MOST_CLIENTS + 1> waits;  // one client less while more are accepted
     std::size_t count = 0;
     auto end = Clock::now() + ROUND;
     waits.at(count++) = {_shutdown.event().fd(), POLLIN, 0};

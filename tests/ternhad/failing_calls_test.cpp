@@ -106,6 +106,12 @@ double processorTime(pid_t process) {
     return (user + kernel) / static_cast<double>(sysconf(_SC_CLK_TCK));
 }
 
+void expectIdle(pid_t process) {
+    const double before = processorTime(process);
+    std::this_thread::sleep_for(3s);  // what is measured
+    EXPECT_LT(processorTime(process) - before, 1.5);
+}
+
 TEST_F(FailingCallsTest, LateFlushCostsNoProcessorTime) {
     test::removeTree(test::TRIGGER);
     test::makeDirectories(test::TRIGGER);
@@ -117,9 +123,16 @@ TEST_F(FailingCallsTest, LateFlushCostsNoProcessorTime) {
                std::string::npos;
     }));
     test::removeTree("/tmp/hanging-sync");
-    const double before = processorTime(daemon->pid());
-    std::this_thread::sleep_for(3s);  // what is measured
-    EXPECT_LT(processorTime(daemon->pid()) - before, 1.5);
+    expectIdle(daemon->pid());
+    expectEndInTime();
+}
+
+TEST_F(FailingCallsTest, FollowerCostsNoProcessorTime) {
+    start();
+    const test::Process follower({TERNHACTL, "events"});
+    peer.reset();
+    ASSERT_TRUE(test::eventually(20s, [&] { return !follower.output().empty(); }));
+    expectIdle(daemon->pid());
     expectEndInTime();
 }
 
@@ -146,7 +159,7 @@ TEST_F(FailingCallsTest, WallClockStepsChangeNothing) {
     expectEndInTime();
 }
 
-#ifndef IS_EMULATED  // user-mode emulation knows no ptrace
+#ifndef IS_EMULATED  // user-mode emulation knows no ptrace, and no limit of memory
 // Holds a process as a hanging disk would: when it is killed, it is not gone until the object is.
 class Undying {
  public:
@@ -183,6 +196,18 @@ TEST_F(FailingCallsTest, HungLogKeeperIsReplacedAndLeftBehind) {
     test::removeTree("/tmp/an-hour-later");
     expectEndInTime();
     EXPECT_EQ(kill(keeper, 0), 0);
+}
+
+TEST_F(FailingCallsTest, SnapshotLeavesOutWhatDoesNotFitItsMemory) {
+    test::replaceProgram("/bin/ps", "echo PROCESSES; head -c 100000000 /dev/zero | tr '\\0' x");
+    start({"--snapshot-interval", "3600"});
+    EXPECT_TRUE(test::eventually(
+        20s, [] { return test::wholeLog("", "ha.daemon.record").find("MemTotal:") != std::string::npos; }));
+    const std::string record = test::wholeLog("", "ha.daemon.record");
+    EXPECT_THAT(record, HasSubstr("Mounted on"));
+    EXPECT_THAT(record, Not(HasSubstr("PROCESSES")));
+    test::restoreProgram("/bin/ps");
+    expectEndInTime();
 }
 #endif
 
