@@ -14,6 +14,8 @@ namespace {
 
 using Clock = Connection::Clock;
 
+constexpr char LOST[] = "lost";  // the event in place of those that the daemon could not keep
+
 constexpr auto NO_LIMIT = std::chrono::hours(24 * 365);
 
 // Asks for the changes. The first line of the reply is the report, which tells what holds already; a line for
@@ -52,18 +54,24 @@ ExitCode wait(const Settings& settings) {
         (settings.waitLimit
              ? std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(*settings.waitLimit))
              : NO_LIMIT);
-    const Deadline firstDeadline(settings.timeout);
-    Connection connection(settings, "E", firstDeadline);
-    bool isSo = holds(Report(firstLine(connection, firstDeadline)), settings.condition);
-    while (!isSo) {
-        const auto line = connection.line(deadline);
-        if (!line) {
-            std::cerr << "ternhactl: not in time: " << settings.condition << '\n';
-            return ExitCode::No;
+    for (;;) {
+        const Deadline firstDeadline(settings.timeout);
+        Connection connection(settings, "E", firstDeadline);
+        if (holds(Report(firstLine(connection, firstDeadline)), settings.condition)) {
+            return ExitCode::Success;
         }
-        isSo = text(*line, "new") == settings.condition;
+        std::optional<Json::Value> line;
+        do {
+            line = connection.line(deadline);
+            if (!line) {
+                std::cerr << "ternhactl: not in time: " << settings.condition << '\n';
+                return ExitCode::No;
+            }
+            if (text(*line, "new") == settings.condition) {
+                return ExitCode::Success;
+            }
+        } while (text(*line, "event") != LOST);  // else see what holds now
     }
-    return ExitCode::Success;
 }
 
 ExitCode events(const Settings& settings) {
@@ -79,6 +87,9 @@ ExitCode events(const Settings& settings) {
         }
         if (settings.json != Settings::Json::None) {
             std::cout << Json::writeString(compact, *event) << '\n' << std::flush;
+        } else if (text(*event, "event") == LOST) {
+            std::cout << when(*event) << ' ' << (*event)["count"].asString() << " changes lost\n"
+                      << std::flush;
         } else {
             std::cout << when(*event) << ' ' << text(*event, "new") << " (was " << text(*event, "old") << ')'
                       << '\n'

@@ -82,6 +82,7 @@ void addCommands(CLI::App& app, Settings& settings, Command& command) {
                    "Whether this node could serve alone: neither peer nor link");
     add("metrics", "Print the figures in Prometheus' text format", printMetrics)
         ->add_option("--output", settings.output, "Replace FILE by them in one step instead")
+        ->check([](const std::string& file) { return file.empty() ? "The name of FILE is empty" : ""; })
         ->type_name("FILE");
 }
 

@@ -1,4 +1,6 @@
 #include <iostream>
+#include <optional>
+#include <string>
 
 #include "client.h"
 #include "commands.h"
@@ -32,6 +34,29 @@ std::string outcomeOf(const Report& before, const Report& after) {
     return after.peerAlive.is(false) ? WENT_DOWN : "still-answers";
 }
 
+// Orders the reboot and fetches what became of it. False, after a message on standard error, when that is
+// unknown; throws NoAnswer when nothing was ordered.
+bool order(const Settings& settings, std::optional<Report>& after) {
+    const Deadline deadline(REBOOT_TIMEOUT);
+    Connection connection(settings, "R", deadline);
+    const char* done = "sent";
+    try {
+        if (!connection.reply(deadline.time)) {
+            throw NoAnswer("no reply within " + std::to_string(deadline.seconds) + " s");
+        }
+        done = "carried out";
+        after.emplace(fetchReport(settings));
+        return true;
+    } catch (const NoAnswer& error) {
+        if (std::string(error.what()).rfind(REFUSAL, 0) == 0) {
+            throw;
+        }
+        complain(settings, error.what());
+        std::cerr << "ternhactl: the order was " << done << ", its outcome is unknown\n";
+        return false;
+    }
+}
+
 }  // namespace
 
 ExitCode rebooting(const Settings& settings) {
@@ -51,12 +76,15 @@ ExitCode rebootPeer(const Settings& settings) {
         return ExitCode::No;
     }
     std::cout << "Ordering the reboot and following the peer down, up to 33 seconds...\n" << std::flush;
-    ask(settings, "R", Deadline(REBOOT_TIMEOUT));
+    std::optional<Report> after;
+    if (!order(settings, after)) {
+        return ExitCode::Unknown;
+    }
     if (!before.peerAlive.value) {
-        std::cout << "The peer has not been probed yet: nobody knows whether it heard the order.\n";
+        std::cout << "The peer had not replied yet: nobody knows whether it heard the order.\n";
         return ExitCode::No;
     }
-    const std::string outcome = outcomeOf(before, Report(fetchReport(settings)));
+    const std::string outcome = outcomeOf(before, *after);
     if (outcome == WAS_DEAD) {
         std::cout << "The peer was already dead: nobody knows whether it heard the order.\n";
         return ExitCode::No;

@@ -48,6 +48,11 @@ struct Report {
     Flag peerResync;
     Flag peerDiskErrors;
     std::optional<std::vector<std::string>> peerDisks;  // device names
+
+    // The peer handles errors of more disks than its report can name.
+    bool hasTooManyPeerDisks() const {
+        return peerDiskErrors.value == true && (!peerDisks || peerDisks->empty());
+    }
     Flag connected;
     Flag resync;
     Flag diskErrors;
@@ -55,6 +60,8 @@ struct Report {
     Figure latency;                  // milliseconds
     Figure nonOkRate;                // 0 to 1
 };
+
+inline constexpr char TOO_MANY_DISKS[] = "more disks than a report holds";
 
 using FlagMember = Report::Flag Report::*;
 

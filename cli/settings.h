@@ -26,6 +26,7 @@ enum class ExitCode {
     Success = 0,       // done; rebooting: yes; check: all is well
     No = 1,            // rebooting: no; reboot-peer: not rebooted; wait: not in time; check: warning
     Critical = 2,      // check: the peer or the DRBD link is down
+    Unknown = 2,       // reboot-peer: ordered, but the outcome is unknown
     NoAnswer = 3,      // the daemon does not answer or cannot be reached; check: unknown
     WrongUsage = 64,   // the command line is wrong
     OutputError = 74,  // the output cannot be written

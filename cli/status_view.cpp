@@ -15,7 +15,6 @@ namespace {
 constexpr char RED[] = "\033[31m";
 constexpr char DIM[] = "\033[2m";
 constexpr char PLAIN[] = "\033[0m";
-constexpr char TOO_MANY_DISKS[] = "more disks than a report holds";
 
 enum class Look { Normal, Trouble, Stale };
 
@@ -67,10 +66,6 @@ std::string yesNo(const Report::Flag& flag, double now) {
     return *flag.value ? "yes" + sinceOf(flag.since, now) : "no";
 }
 
-bool isWithoutNames(const Report& report) {
-    return report.peerDiskErrors.value == true && (!report.peerDisks || report.peerDisks->empty());
-}
-
 std::string headline(const Report& report, const LocalState& local, double now) {
     const Verdict result = verdict(report, local);
     const bool isOk = result.level == Verdict::Level::Ok;
@@ -109,7 +104,7 @@ void addPeer(View& view, const Report& report, double now) {
 
     addFlag(view, "RAID resync", report.peerResync, yesNo(report.peerResync, now), now);
     std::string disks = yesNo(report.peerDiskErrors, now);
-    if (isWithoutNames(report)) {
+    if (report.hasTooManyPeerDisks()) {
         disks += std::string(", ") + TOO_MANY_DISKS;
     } else if (report.peerDisks && !report.peerDisks->empty()) {
         disks += ": " + joined(readable(*report.peerDisks));
@@ -204,7 +199,7 @@ std::string dimmed(const std::string& text, bool useColour) {
 std::string diskList(const Report& report) {
     const double now = report.time.value_or(currentTime());
     std::vector<std::string> peerDisks = readable(report.peerDisks.value_or(std::vector<std::string>()));
-    if (isWithoutNames(report)) {
+    if (report.hasTooManyPeerDisks()) {
         peerDisks = {TOO_MANY_DISKS};
     }
     return disksOf("peer", report.peerDiskErrors, peerDisks, now) +

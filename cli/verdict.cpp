@@ -64,7 +64,7 @@ Verdict verdict(const Report& report, const LocalState& local) {
     if (report.peerAlive.is(false)) {
         critical.push_back("peer dead" + sinceOf(report.peerAlive.since, now));
     } else if (!report.peerAlive.value) {
-        unknown.emplace_back("peer not probed yet");
+        unknown.emplace_back("peer has not replied yet");
     }
     if (!local.unsupportedDrbd.empty()) {
         critical.push_back("DRBD " + local.unsupportedDrbd + " is not supported, 8.4 is");
@@ -84,10 +84,14 @@ Verdict verdict(const Report& report, const LocalState& local) {
     if (const auto* flag = unknownOf(report.resync, report.diskErrors)) {
         unknown.push_back("this node " + unknownState(*flag, "checked", now));
     }
+    std::string disks = "peer handles disk errors";
+    if (report.hasTooManyPeerDisks()) {
+        disks += std::string(" (") + TOO_MANY_DISKS + ')';
+    }
     const std::array<std::pair<bool, const char*>, 5> unwise = {{
         {report.peerRebooting.is(true), "peer being rebooted"},
         {report.peerResync.is(true), "peer resynchronises RAID"},
-        {report.peerDiskErrors.is(true), "peer handles disk errors"},
+        {report.peerDiskErrors.is(true), disks.c_str()},
         {report.resync.is(true), "RAID resync"},
         {report.diskErrors.is(true), "disk errors"},
     }};

@@ -11,6 +11,7 @@
 #include <atomic>
 #include <csignal>
 #include <mutex>
+#include <optional>
 #include <ostream>
 #include <sstream>
 #include <thread>
@@ -403,7 +404,7 @@ TEST_F(TernhactlTest, ShowsMissingAndMistypedFieldsAsUnknown) {
     const auto result = shell("ternhactl check");
     answer.join();
     EXPECT_EQ(result.output,
-              "TERNHA UNKNOWN - peer not probed yet, DRBD not checked yet, this node not checked yet | "
+              "TERNHA UNKNOWN - peer has not replied yet, DRBD not checked yet, this node not checked yet | "
               "latency=U;;;0 nonok=U;;;0;100\n");
     EXPECT_EQ(result.exitCode, 3);
 }
@@ -495,6 +496,27 @@ TEST_F(TernhactlTest, ReportsAPeerThatWasNotRebooted) {
     EXPECT_THAT(result.output, EndsWith("The peer still answers: it was not rebooted.\n"));
 }
 
+TEST_F(TernhactlTest, ReportsAnOrderWhoseOutcomeIsUnknown) {
+    const std::string report = R"({"version":1,"peer":{"alive":{"value":true}}})";
+    const std::string silence = "ternhactl: ternhad does not answer on /run/ternha/control.sock: ";
+    for (const bool isCarriedOut : {true, false}) {
+        std::optional<RawServer> server(std::in_place);
+        std::thread answer([&] {
+            server->answerOnce(report);
+            server->answerOnce(isCarriedOut ? "null" : "");
+            server.reset();  // as a daemon that has ended
+            test::removeTree(SOCKET);
+        });
+        const auto result = shell("ternhactl reboot-peer --yes");
+        answer.join();
+        EXPECT_EQ(result.exitCode, 2);
+        EXPECT_THAT(result.output, HasSubstr(silence));
+        EXPECT_THAT(result.output,
+                    EndsWith(isCarriedOut ? "the order was carried out, its outcome is unknown\n"
+                                          : "the order was sent, its outcome is unknown\n"));
+    }
+}
+
 TEST_F(TernhactlTest, RefusesASecondRebootMeanwhile) {
     Status status;
     status.setRemoteAlive(true);
@@ -524,6 +546,21 @@ TEST_F(TernhactlTest, PrintsEventsUntilTheDaemonEnds) {
                       "ternhactl: ternhad does not answer on /run/ternha/control.sock: the connection was "
                       "closed\n");
     }
+}
+
+TEST_F(TernhactlTest, ReportsLostEventsAndWaitsOn) {
+    const RawServer server;
+    const std::string lost = "{\"version\":1}\n{\"count\":12,\"event\":\"lost\",\"time\":60}\n";
+    std::thread answer([&] { server.answerOnce(lost); });
+    EXPECT_THAT(shell("ternhactl events").output, HasSubstr("1970-01-01T00:01:00+0000 12 changes lost\n"));
+    answer.join();
+    // The condition may have come true among them.
+    std::thread answers([&] {
+        server.answerOnce(lost);
+        server.answerOnce(std::string(EVENTS).substr(0, std::string(EVENTS).find('\n') + 1));
+    });
+    EXPECT_EQ(shell("ternhactl wait peer-alive").exitCode, 0);
+    answers.join();
 }
 
 TEST_F(TernhactlTest, ReportsOutputErrorsOfEvents) {

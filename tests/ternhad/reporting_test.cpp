@@ -92,7 +92,7 @@ TEST_F(ReportingTest, BeforeTheFirstReplyThePeerIsUnknownNotDead) {
     auto daemon = start({"--dead-after", "30"});
     EXPECT_TRUE(test::eventually(10s, [] { return report()["node"]["resync"]["value"].isBool(); }));
     EXPECT_TRUE(report()["peer"]["alive"]["value"].isNull());
-    EXPECT_THAT(control("check").output, HasSubstr("peer not probed yet"));
+    EXPECT_THAT(control("check").output, HasSubstr("peer has not replied yet"));
 }
 
 TEST_F(ReportingTest, MissingOrDownInterfaceHasNoRate) {
