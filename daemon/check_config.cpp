@@ -60,7 +60,7 @@ std::vector<std::string> warningsOf(const Options& options) {
     if (if_nametoindex(options.interface.c_str()) == 0) {
         warnings.push_back("there is no network interface " + options.interface +
                            " (yet): its packet rate is unknown");
-    } else if (options.isCheckOnly && !hasAddress(options.interface, options.localIp)) {
+    } else if (!hasAddress(options.interface, options.localIp)) {
         warnings.push_back("interface " + options.interface + " does not have the address " +
                            options.localIp);
     }

@@ -10,6 +10,8 @@ namespace ternhad {
 
 namespace {
 
+constexpr char BYTE_ORDER_MARK[] = "\xEF\xBB\xBF";
+
 // A mistake in the file whose place the message tells already.
 class LocatedError : public CLI::ConfigError {
  public:
@@ -34,6 +36,13 @@ bool names(const std::string& text, const std::string& option) {
            (std::isalnum(static_cast<unsigned char>(text[end])) == 0 && text[end] != '-');
 }
 
+// Whether a comment follows the value, which may contain one in quotes.
+bool hasComment(const std::string& value) {
+    const std::string trimmed = CLI::detail::trim_copy(value);
+    const bool isQuoted = !trimmed.empty() && (trimmed.front() == '"' || trimmed.front() == '\'');
+    return !isQuoted && (value.find(" #") != std::string::npos || value.find(" ;") != std::string::npos);
+}
+
 // Why the file cannot be read. A directory can be opened, but not read.
 std::string reasonOf(const std::string& path) {
     errno = 0;
@@ -48,6 +57,9 @@ std::string ConfigFile::path() const {
 }
 
 void ConfigFile::scan(const std::string& text) const {
+    if (text.rfind(BYTE_ORDER_MARK, 0) == 0) {
+        throw LocatedError(path() + ":1: ", "the file begins with a byte order mark: save it without one");
+    }
     std::istringstream input(text);
     std::string line;
     for (int number = 1; std::getline(input, line); ++number) {
@@ -64,6 +76,9 @@ void ConfigFile::scan(const std::string& text) const {
         const CLI::Option* const option = _app.get_option_no_throw("--" + name);
         if (name.empty() || option == nullptr || !option->get_configurable()) {
             throw LocatedError(place, "unknown name: " + name);
+        }
+        if (hasComment(line.substr(equals + 1))) {
+            throw LocatedError(place, "a comment needs a line of its own: " + line);
         }
         const auto [known, isNew] = _lines.insert({name, {number, line}});
         if (!isNew) {
@@ -90,12 +105,15 @@ std::string ConfigFile::located(const CLI::ParseError& error,
     if (dynamic_cast<const CLI::FileError*>(&error) != nullptr) {
         return path() + ": " + reasonOf(path());
     }
-    for (const auto& [name, line] : _lines) {
-        const std::string option = "--" + name;
-        if (names(text, option) && !isGiven(option, arguments)) {
-            if (text.rfind(option + ": ", 0) == 0) {
-                text.erase(0, option.size() + 2);
+    // The option that the message begins with is to blame before one that it mentions.
+    for (const bool isSubject : {true, false}) {
+        for (const auto& [name, line] : _lines) {
+            const std::string option = "--" + name;
+            if (isGiven(option, arguments) ||
+                !(isSubject ? text.rfind(option + ": ", 0) == 0 : names(text, option))) {
+                continue;
             }
+            text.erase(0, isSubject ? option.size() + 2 : 0);
             return path() + ':' + std::to_string(line.number) + ": " + line.text + ": " + text;
         }
     }

@@ -158,6 +158,10 @@ INSTANTIATE_TEST_SUITE_P(
         WrongLine{"Path", "socket = here", "socket = here: not an absolute path: here"},
         WrongLine{"Pair", "dead-after = 2",
                   "dead-after = 2: --check-interval: above a third of --dead-after"},
+        WrongLine{"Comment", "dead-after = 3 # comment",
+                  "a comment needs a line of its own: dead-after = 3 # comment"},
+        WrongLine{"OtherComment", "dead-after = 3 ; comment",
+                  "a comment needs a line of its own: dead-after = 3 ; comment"},
         WrongLine{"NoValue", "rotate-size", "not NAME = VALUE: rotate-size"},
         WrongLine{"Section", "[daemon]", "not NAME = VALUE: [daemon]"},
         WrongLine{"Twice", "interface = eth1", "interface stands in line 3 already"},
@@ -168,6 +172,25 @@ INSTANTIATE_TEST_SUITE_P(
         WrongLine{"SocketOfNobody", "status-socket = /run/x",
                   "status-socket = /run/x: needs --status-group"}),
     [](const auto& line) { return line.param.name; });
+
+TEST_F(OptionsTest, EqualAddressesAreReportedAtThePeers) {
+    const auto messageOf = [](const std::string& addresses) {
+        test::writeFile("/tmp/ternhad.conf", "interface = lo\n" + addresses);
+        return ternhad({"--config", "/tmp/ternhad.conf"}).error;
+    };
+    EXPECT_EQ(messageOf("local-ip = 127.0.0.1\nremote-ip = 127.0.0.1\n"),
+              "ternhad: /tmp/ternhad.conf:3: remote-ip = 127.0.0.1: the same address as --local-ip\n");
+    EXPECT_EQ(messageOf("remote-ip = 127.0.0.1\nlocal-ip = 127.0.0.1\n"),
+              "ternhad: /tmp/ternhad.conf:2: remote-ip = 127.0.0.1: the same address as --local-ip\n");
+}
+
+TEST_F(OptionsTest, ByteOrderMarkIsNamed) {
+    test::writeFile("/tmp/ternhad.conf", "\xEF\xBB\xBFlocal-ip = 127.0.0.1\n");
+    const auto result = ternhad({"--config", "/tmp/ternhad.conf"});
+    EXPECT_EQ(result.exitCode, 2);
+    EXPECT_EQ(result.error,
+              "ternhad: /tmp/ternhad.conf:1: the file begins with a byte order mark: save it without one\n");
+}
 
 TEST_F(OptionsTest, UnreadableOrIncompleteFileIsNamed) {
     test::writeFile("/tmp/ternhad.conf", "local-ip = 127.0.0.1\nremote-ip = 127.0.0.2\n");
