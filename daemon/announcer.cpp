@@ -34,6 +34,9 @@ void Announcer::run() {
         passes.run([this] {
             std::uint64_t lost = 0;
             while (const auto transition = _reader.next(lost)) {
+                if (lost > 0) {
+                    writeJournal(Level::warning, std::to_string(lost) + " changes lost");
+                }
                 announce(*transition);
             }
             if (std::string status = summary(); status != _status) {

@@ -22,11 +22,26 @@ constexpr auto SILENCE_LIMIT = std::chrono::seconds(5);
 constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the socket file
 constexpr std::size_t MOST_CLIENTS = 16;
 constexpr auto OBEYED = std::chrono::seconds(6);  // after an order a peer that obeys replies no more
-constexpr char RESTORING[] = "make the vanished control socket again";
+constexpr char RESTORING[] = "make the missing socket";
 constexpr char ACCEPTING[] = "accept control clients";
 constexpr char ORDER = 'R';  // the actions
 constexpr char REPORT = 'S';
 constexpr char EVENTS = 'E';
+
+const char* describe(Findings::OrderOutcome outcome) {
+    switch (outcome) {
+        case Findings::OrderOutcome::wentDown:
+            return "it went down";
+        case Findings::OrderOutcome::stillAnswers:
+            return "it still answers, not rebooted";
+        case Findings::OrderOutcome::wasDead:
+            return "it was already dead";
+        case Findings::OrderOutcome::none:
+        case Findings::OrderOutcome::wasUnknown:
+            break;
+    }
+    return "unknown, it had not replied yet";
+}
 
 }  // namespace
 
@@ -45,6 +60,7 @@ bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Val
     if (action != ORDER) {
         return MonitordSocket::serverHandle(request, reply);
     }
+    const bool wasKnown = _orders->isPeerKnown();
     const bool wasAlive = _orders->isPeerAlive();
     const bool wasRebooting = _orders->status().isRemoteRebooting();
     const auto start = Clock::now();
@@ -54,7 +70,8 @@ bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Val
         _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
     }
     if (!wasAlive) {
-        _orders->findings().setOrderOutcome(Findings::OrderOutcome::wasDead);
+        _orders->findings().setOrderOutcome(wasKnown ? Findings::OrderOutcome::wasDead
+                                                     : Findings::OrderOutcome::wasUnknown);
     } else if (isServed && hasGoneDown(start)) {
         _orders->findings().setOrderOutcome(Findings::OrderOutcome::wentDown);
     } else {
@@ -70,9 +87,10 @@ bool ControlServer::Endpoint::hasGoneDown(Clock::time_point start) const {
     return !_orders->isPeerAlive() || _orders->findings().lastReplyTime() < start + OBEYED;
 }
 
-ControlServer::ControlServer(const std::string& path, Access access, Health& health, const Reporter& reporter,
-                             EventStreams& streams, Events& events, const Shutdown& shutdown)
-    : _listener(path),
+ControlServer::ControlServer(const std::string& path, mode_t directoryMode, Access access, Health& health,
+                             const Reporter& reporter, EventStreams& streams, Events& events,
+                             const Shutdown& shutdown)
+    : _listener(path, directoryMode),
       _access(access),
       _health(health),
       _streams(streams),
@@ -95,8 +113,10 @@ void ControlServer::restoreFile() {
     if (_listener.hasFile()) {
         return;
     }
+    const bool hadFile = _listener.hasHadFile();
     if (_listener.listen()) {
-        TERNHAD_LOG(_events, "The socket " + _listener.path() + " had vanished, it is there again");
+        TERNHAD_LOG(_events, "The socket " + _listener.path() +
+                                 (hadFile ? " had vanished, it is there again" : " is there now"));
         _isFileLost = false;
     } else if (!_isFileLost) {
         _events.troubleBegan(RESTORING, errno);
@@ -210,20 +230,16 @@ void ControlServer::runOrders() {
 }
 
 void ControlServer::carryOutOrder() {
-    const bool wasAlive = _health.isPeerAlive();
-    TERNHAD_LOG(_events,
-                std::string("Reboot of the peer ordered, which is ") + (wasAlive ? "alive" : "dead"));
+    TERNHAD_LOG(_events, std::string("Reboot of the peer ordered, which ") +
+                             (_health.isPeerAlive()   ? "is alive"
+                              : _health.isPeerKnown() ? "is dead"
+                                                      : "has not replied yet"));
     _orders.serve(_orderer);
     if (_shutdown.isRequested()) {
         return;
     }
-    std::string outcome = "it was already dead";
-    if (_health.findings().orderOutcome() == Findings::OrderOutcome::stillAnswers) {
-        outcome = "it still answers, not rebooted";
-    } else if (_health.findings().orderOutcome() == Findings::OrderOutcome::wentDown) {
-        outcome = "it went down";
-    }
-    TERNHAD_LOG(_events, "Reboot of the peer: " + outcome);
+    TERNHAD_LOG(_events,
+                std::string("Reboot of the peer: ") + describe(_health.findings().orderOutcome()));
 }
 
 }  // namespace ternhad

@@ -22,8 +22,9 @@ class ControlServer {
  public:
     enum class Access { all, reading };  // reading: no orders
 
-    ControlServer(const std::string& path, Access access, Health& health, const Reporter& reporter,
-                  EventStreams& streams, Events& events, const Shutdown& shutdown);
+    // `directoryMode`: see Listener.
+    ControlServer(const std::string& path, mode_t directoryMode, Access access, Health& health,
+                  const Reporter& reporter, EventStreams& streams, Events& events, const Shutdown& shutdown);
     ~ControlServer();
 
     ControlServer(const ControlServer&) = delete;

@@ -16,6 +16,7 @@
 #include <string>
 
 #include "checker.h"
+#include "directories.h"
 #include "env_check.h"
 #include "journal.h"
 #include "passes.h"
@@ -61,8 +62,8 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
       _prober(options, _health, _events, _shutdown, _progress),
       _reporter(options, _health),
       _streams(_health.transitions(), _reporter, _shutdown),
-      _controlServer(options.socket, ControlServer::Access::all, _health, _reporter, _streams, _events,
-                     _shutdown),
+      _controlServer(options.socket, socketDirectoryMode(options), ControlServer::Access::all, _health,
+                     _reporter, _streams, _events, _shutdown),
       _announcer(_health.transitions(), _shutdown),
       _notifier(options, _health, _events, _shutdown),
       _peerWatcher(options, _health, _events, _shutdown),
@@ -73,8 +74,8 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
     // descriptors that are older than itself.
     if (!options.statusSocket.empty()) {
         _statusStreams.emplace(_health.transitions(), _reporter, _shutdown);
-        _statusServer.emplace(options.statusSocket, ControlServer::Access::reading, _health, _reporter,
-                              *_statusStreams, _events, _shutdown);
+        _statusServer.emplace(options.statusSocket, STATUS_DIRECTORY_MODE, ControlServer::Access::reading,
+                              _health, _reporter, *_statusStreams, _events, _shutdown);
         _statusServer->listener().shareWith(options.statusGroupId);
     }
     drbdIF(options.interface);

@@ -18,14 +18,17 @@ namespace {
 constexpr char BUFFER_DIR[] = "/tmp/ha";
 constexpr char RUN_DIR[] = "/run/ternha";
 constexpr mode_t PRIVATE_DIR = 0700;
-constexpr mode_t PASSABLE_DIR = 0711;
 
 bool complain(const std::string& path, const std::string& reason) {
     std::cerr << "ternhad: " << path << ": " << reason << '\n';
     return false;
 }
 
-bool makeDirectory(const std::string& path) {
+std::filesystem::path directoryOf(const std::string& socket) {
+    return std::filesystem::path(socket).lexically_normal().parent_path();
+}
+
+bool makeDirectory(const std::string& path, mode_t mode = PRIVATE_DIR) {
     std::error_code error;
     const std::filesystem::path parent = std::filesystem::path(path).parent_path();
     std::filesystem::create_directories(parent, error);
@@ -36,7 +39,9 @@ bool makeDirectory(const std::string& path) {
     if (lstat(path.c_str(), &info) == 0) {
         return true;  // mkdir would wait for a frozen disk before it looks
     }
-    if (mkdir(path.c_str(), PRIVATE_DIR) != 0 && errno != EEXIST) {
+    if (mkdir(path.c_str(), mode) == 0) {
+        chmod(path.c_str(), mode);  // whatever the umask is
+    } else if (errno != EEXIST) {
         return complain(path, std::strerror(errno));
     }
     return true;
@@ -81,20 +86,22 @@ bool hasOnlyOurFiles(const char* path) {
 
 }  // namespace
 
-void openStatusDirectory(const std::string& socketPath) {
-    const std::string directory = std::filesystem::path(socketPath).parent_path();
-    if (directory != RUN_DIR && mkdir(directory.c_str(), PASSABLE_DIR) != 0) {
-        return;  // somebody else's
-    }
-    if (chmod(directory.c_str(), PASSABLE_DIR) != 0) {  // whatever the umask is
-        complain(directory, std::strerror(errno));
+mode_t socketDirectoryMode(const Options& options) {
+    const bool isShared =
+        !options.statusSocket.empty() && directoryOf(options.statusSocket) == directoryOf(options.socket);
+    return isShared ? STATUS_DIRECTORY_MODE : PRIVATE_DIR;
+}
+
+void openStatusDirectory(const Options& options) {
+    if (directoryOf(options.statusSocket) == RUN_DIR && chmod(RUN_DIR, STATUS_DIRECTORY_MODE) != 0) {
+        complain(RUN_DIR, std::strerror(errno));
     }
 }
 
-bool prepareDirectories(const char* socketPath) {
+bool prepareDirectories(const Options& options) {
     return makeDirectory(BUFFER_DIR) && isOurs(BUFFER_DIR) && hasOnlyOurFiles(BUFFER_DIR) &&
            makeDirectory(TERN::HA::Daemon::LOG_DIR) &&
-           makeDirectory(std::filesystem::path(socketPath).parent_path());
+           makeDirectory(directoryOf(options.socket), socketDirectoryMode(options));
 }
 
 }  // namespace ternhad

@@ -60,7 +60,8 @@ void EventStreams::sendChanges() {
     _reader.event().take();
     std::uint64_t lost = 0;
     while (const auto transition = _reader.next(lost)) {
-        const std::string line = lineOf(Reporter::event(*transition));
+        const std::string line =
+            (lost > 0 ? lineOf(Reporter::lostEvents(lost)) : "") + lineOf(Reporter::event(*transition));
         for (int& fd : _clients) {
             sendTo(fd, line);
         }

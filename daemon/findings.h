@@ -21,7 +21,7 @@ class Findings {
     };
 
     // What became of an order to reboot the peer.
-    enum class OrderOutcome { none, wentDown, stillAnswers, wasDead };
+    enum class OrderOutcome { none, wentDown, stillAnswers, wasDead, wasUnknown };
 
     // The peer has replied to a liveness probe. Neither blocks nor allocates.
     void peerReplied() noexcept {

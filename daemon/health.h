@@ -23,6 +23,9 @@ class Health {
 
     bool isPeerAlive() const noexcept { return _status.isRemoteAlive(); }
 
+    // Nothing until the peer has replied, or could have for long enough.
+    bool isPeerKnown() const noexcept { return _transitions.state(Flag::peerAlive).value.has_value(); }
+
     // The outcome of the liveness probes, as Status::setRemoteAlive stores it; do not call before there is
     // one. Waits for nothing but the record's lock, under which nobody waits.
     void setPeerAlive(bool isAlive) noexcept;

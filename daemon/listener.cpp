@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
 
 namespace ternhad {
 
@@ -29,6 +30,7 @@ bool share(const std::string& path, gid_t group) {
 
 bool Listener::listen() {
     close();
+    makeDirectory();
     struct stat info = {};
     if (lstat(_path.c_str(), &info) == 0) {
         if (!S_ISSOCK(info.st_mode)) {
@@ -50,6 +52,14 @@ bool Listener::listen() {
     _device = info.st_dev;
     _inode = info.st_ino;
     return true;
+}
+
+void Listener::makeDirectory() const {
+    const std::string directory = std::filesystem::path(_path).parent_path();
+    struct stat info = {};
+    if (lstat(directory.c_str(), &info) != 0 && mkdir(directory.c_str(), _directoryMode) == 0) {
+        chmod(directory.c_str(), _directoryMode);  // whatever the umask is
+    }
 }
 
 bool Listener::hasFile() const {

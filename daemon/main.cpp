@@ -32,12 +32,10 @@ int run(const ternhad::Options& options) {
             std::cerr << "ternhad: cannot take the lock in /run/ternha: " << std::strerror(errno) << '\n';
             return FAILURE;
     }
-    if (!ternhad::prepareDirectories(options.socket.c_str())) {
+    if (!ternhad::prepareDirectories(options)) {
         return FAILURE;
     }
-    if (!options.statusSocket.empty()) {
-        ternhad::openStatusDirectory(options.statusSocket);
-    }
+    ternhad::openStatusDirectory(options);
     return ternhad::Daemon(options, lock).run();
 }
 

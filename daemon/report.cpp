@@ -21,6 +21,8 @@ Json::Value toJson(Findings::OrderOutcome outcome) {
             return "still-answers";
         case Findings::OrderOutcome::wasDead:
             return "was-dead";
+        case Findings::OrderOutcome::wasUnknown:
+            return "was-unknown";
         case Findings::OrderOutcome::none:
             break;
     }
@@ -111,6 +113,14 @@ Json::Value Reporter::event(const Transition& transition) {
     json["old"] = conditionOf(transition.flag, transition.old);
     json["new"] = conditionOf(transition.flag, transition.value);
     json["time"] = secondsOf(transition.time);
+    return json;
+}
+
+Json::Value Reporter::lostEvents(std::uint64_t count) {
+    Json::Value json(Json::objectValue);
+    json["event"] = "lost";
+    json["count"] = Json::UInt64{count};
+    json["time"] = secondsOf(wallClock());
     return json;
 }
 

@@ -2,6 +2,8 @@
 
 #include <json/value.h>
 
+#include <cstdint>
+
 #include "health.h"
 #include "options.h"
 #include "transitions.h"
@@ -15,8 +17,9 @@ class Reporter {
 
     Json::Value report() const;
 
-    // A line for each change, and its JSON.
+    // A line for each change, and its JSON; the same of changes that were lost before one.
     static Json::Value event(const Transition& transition);
+    static Json::Value lostEvents(std::uint64_t count);
 
  private:
     Json::Value flag(Flag flag) const;

@@ -234,7 +234,7 @@ TEST_F(DaemonTest, ControlSocketThatCannotBeCreatedAgainIsLoggedOnce) {
     auto daemon = startAndWait();
     test::removeTree(test::CONTROL_SOCKET);
     test::writeFile(test::CONTROL_SOCKET, "");
-    const std::string line = "Cannot make the vanished control socket again: File exists\n";
+    const std::string line = "Cannot make the missing socket: File exists\n";
     EXPECT_TRUE(test::eventually(15s, [&] { return test::wholeLog().find(line) != std::string::npos; }));
     EXPECT_FALSE(test::eventually(6s, [&] {
         const std::string log = test::wholeLog();
@@ -245,9 +245,26 @@ TEST_F(DaemonTest, ControlSocketThatCannotBeCreatedAgainIsLoggedOnce) {
     stop(daemon);
 }
 
+TEST_F(DaemonTest, RemovedSocketDirectoryIsCreatedAgain) {
+    const std::string statusSocket = "/run/ternha/status.sock";
+    for (const bool hasStatusSocket : {false, true}) {
+        auto daemon = startAndWait(hasStatusSocket ? std::vector<std::string>{"--status-socket", statusSocket,
+                                                                              "--status-group", "daemon"}
+                                                   : std::vector<std::string>());
+        test::removeTree("/run/ternha");
+        EXPECT_TRUE(test::eventually(15s, isUp));
+        EXPECT_EQ(modeOf("/run/ternha"), hasStatusSocket ? 0711U : 0700U);
+        EXPECT_EQ(modeOf(test::CONTROL_SOCKET), 0700U);
+        if (hasStatusSocket) {
+            EXPECT_TRUE(test::eventually(15s, [&] { return !test::statusAt(statusSocket).isNull(); }));
+        }
+        stop(daemon);
+    }
+}
+
 TEST_F(DaemonTest, SecondInstanceExitsAndLeavesTheFirstAlone) {
     auto daemon = startAndWait();
-    const auto second = test::run(test::daemonArguments("127.0.0.5", "127.0.0.2", "lo"));
+    const auto second = test::run(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo"));
     EXPECT_EQ(second.exitCode, 3);
     EXPECT_EQ(second.error, "ternhad: already running as process " + std::to_string(daemon.pid()) + "\n");
     EXPECT_TRUE(isUp());

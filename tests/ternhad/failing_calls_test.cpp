@@ -175,6 +175,77 @@ class Undying {
     pid_t _process;
 };
 
+// Holds one thread of a process.
+class HeldThread {
+ public:
+    HeldThread(pid_t process, const std::string& name) {
+        for (const auto& task :
+             std::filesystem::directory_iterator("/proc/" + std::to_string(process) + "/task")) {
+            if (test::readFile(task.path() / "comm") == name + "\n") {
+                _thread = std::stoi(task.path().filename());
+            }
+        }
+        EXPECT_EQ(ptrace(PTRACE_SEIZE, _thread, nullptr, nullptr), 0) << name;
+        EXPECT_EQ(ptrace(PTRACE_INTERRUPT, _thread, nullptr, nullptr), 0);
+        EXPECT_EQ(waitpid(_thread, nullptr, __WALL), _thread);
+    }
+    ~HeldThread() { ptrace(PTRACE_DETACH, _thread, nullptr, nullptr); }
+
+    HeldThread(const HeldThread&) = delete;
+    HeldThread& operator=(const HeldThread&) = delete;
+
+ private:
+    pid_t _thread = -1;
+};
+
+// Changes of flags since the daemon's start.
+int transitions() {
+    std::istringstream metrics(test::control("metrics").output);
+    int sum = 0;
+    for (std::string line; std::getline(metrics, line);) {
+        if (line.rfind("ternha_transitions_total{", 0) == 0) {
+            sum += std::stoi(line.substr(line.find(' ')));
+        }
+    }
+    return sum;
+}
+
+TEST_F(FailingCallsTest, LostChangesAreReported) {
+    daemon.emplace(std::vector<std::string>{TERNHAD, "--local-ip", "127.0.0.1", "--remote-ip", "127.0.0.2",
+                                            "--interface", "lo", "--check-interval", "0.05"});
+    ASSERT_TRUE(test::eventually(20s, [] { return isPeerAlive(); }));
+    test::Process follower({TERNHACTL, "events"});
+    int count = 0;
+    const auto change = [&count] {
+        const bool isEven = ++count % 2 == 0;
+        test::writeFile("/sys/block/md0/md/sync_action", isEven ? "resync\n" : "idle\n");
+        test::writeFile("/proc/drbd", isEven ? " 0: cs:Connected\n" : " 0: cs:StandAlone\n");
+    };
+    const auto isFollowed = [&] {
+        change();
+        return follower.output().find(" resync (was ") != std::string::npos;
+    };
+    ASSERT_TRUE(test::eventually(20s, isFollowed));
+    {
+        const HeldThread streams(daemon->pid(), "streams");
+        const HeldThread journal(daemon->pid(), "journal");
+        const int before = transitions();
+        const auto isTooMuch = [&] {
+            for (int i = 0; i < 20; ++i) {
+                change();
+                std::this_thread::sleep_for(60ms);  // a round
+            }
+            return transitions() > before + 260;
+        };
+        ASSERT_TRUE(test::eventually(120s, isTooMuch));
+    }
+    const std::string message = " changes lost\n";
+    const auto isReported = [&] { return follower.output().find(message) != std::string::npos; };
+    EXPECT_TRUE(test::eventually(10s, isReported));
+    EXPECT_TRUE(test::eventually(10s, [&] { return says(message); }));
+    expectEndInTime();
+}
+
 TEST_F(FailingCallsTest, HungLogKeeperIsReplacedAndLeftBehind) {
     test::replaceProgram("/bin/xz", ": > /tmp/compressing; exec sleep 600");
     start({"--log-interval", "3600", "--dead-after", "0.6"});
@@ -216,7 +287,7 @@ TEST_F(FailingCallsTest, StatusSocketRefusesARebootRequestInPieces) {
     start({"--status-socket", "/run/ternha/status.sock", "--status-group", "daemon"});
     test::writeFile("/tmp/slow-client", "");
     const auto order = test::control("--socket /run/ternha/status.sock reboot-peer --yes");
-    EXPECT_EQ(order.exitCode, 3);
+    EXPECT_EQ(order.exitCode, 2);  // it cannot know
     EXPECT_THAT(order.output, HasSubstr(": the connection was closed without a reply\n"));
     EXPECT_FALSE(peer->isOrdered());
     EXPECT_FALSE(test::statusAt("/run/ternha/status.sock").isNull());

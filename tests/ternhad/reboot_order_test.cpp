@@ -89,6 +89,20 @@ TEST_F(RebootOrderTest, DeadPeerDoesNotCountAsRebootingAfterARequest) {
     EXPECT_TRUE(isRebooting("no\n"));
 }
 
+TEST_F(RebootOrderTest, PeerThatHasNotRepliedYetIsNeitherDeadNorAlive) {
+    a.start({"--dead-after", "60"});
+    ASSERT_TRUE(test::eventually(20s, [this] { return a.node.run({TERNHACTL, "rebooting"}).exitCode == 1; }));
+    const auto result = order();
+    EXPECT_EQ(result.exitCode, 1);
+    EXPECT_THAT(result.output,
+                EndsWith("The peer had not replied yet: nobody knows whether it heard the order.\n"));
+    EXPECT_TRUE(eventuallyLogs("Reboot of the peer ordered, which has not replied yet"));
+    EXPECT_TRUE(eventuallyLogs("Reboot of the peer: unknown, it had not replied yet"));
+    EXPECT_THAT(a.node.run({TERNHACTL, "status", "--json=1"}).output,
+                HasSubstr(R"("orderOutcome":"was-unknown")"));
+    EXPECT_TRUE(isRebooting("no\n"));
+}
+
 // Long before it counts as dead.
 TEST_F(RebootOrderTest, ObeyingPeerWentDownAlthoughNotYetDeclaredDead) {
     a.start({"--dead-after", "60"});

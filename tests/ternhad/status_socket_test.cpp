@@ -81,6 +81,15 @@ TEST_F(StatusSocketTest, DirectoryIsTraversableButNotListable) {
     }
 }
 
+TEST_F(StatusSocketTest, DirectoryOfBothSocketsIsTraversable) {
+    test::Process daemon(test::daemonArguments("127.0.0.1", "127.0.0.2", "lo",
+                                               {"--socket", "/run/both/control.sock", "--status-socket",
+                                                "/run/both/status.sock", "--status-group", "daemon"}));
+    EXPECT_TRUE(test::eventually(
+        10s, [] { return runAs(1, "--socket /run/both/status.sock status --json").exitCode == 0; }));
+    EXPECT_EQ(test::run({"stat", "-c", "%a", "/run/both"}).output, "711\n");
+}
+
 TEST_F(StatusSocketTest, DaemonRunsWithoutItUntilItCanBeCreated) {
     auto daemon = start("/run/missing/below/status.sock");
     EXPECT_TRUE(test::eventually(10s, [&] {
@@ -92,6 +101,11 @@ TEST_F(StatusSocketTest, DaemonRunsWithoutItUntilItCanBeCreated) {
     EXPECT_TRUE(
         test::eventually(20s, [] { return !test::statusAt("/run/missing/below/status.sock").isNull(); }));
     EXPECT_EQ(test::run({"stat", "-c", "%a %G", "/run/missing/below/status.sock"}).output, "660 daemon\n");
+    EXPECT_TRUE(test::eventually(10s, [] {
+        return test::wholeLog().find(" The socket /run/missing/below/status.sock is there now\n") !=
+               std::string::npos;
+    }));
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("vanished")));
     EXPECT_FALSE(test::statusAt().isNull());
 }
 
