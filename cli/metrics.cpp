@@ -89,8 +89,13 @@ void addNode(Text& text, const Report& report) {
     text.gauge("ternha_disk_error_handling", "Whether this node handles disk errors.", report.diskErrors);
 }
 
-void addLink(Text& text, const Report& report) {
-    text.gauge("ternha_drbd_connected", "Whether the DRBD link is up.", report.connected);
+void addLink(Text& text, const Report& report, const LocalState& local) {
+    if (local.unsupportedDrbd.empty()) {
+        text.gauge("ternha_drbd_connected", "Whether the DRBD link is up.", report.connected);
+    } else {
+        text.family("ternha_drbd_unsupported", "gauge", "This node's DRBD is not 8.4, constantly 1.");
+        text.sample("ternha_drbd_unsupported{version=" + quoted(local.unsupportedDrbd) + '}', 1);
+    }
     if (const auto latency = report.latency.current()) {
         text.gauge("ternha_heartbeat_latency_seconds", "Average round trip to the peer.", *latency / 1000);
     }
@@ -137,7 +142,7 @@ void addTransitions(Text& text, const Report& report) {
 
 }  // namespace
 
-std::string metrics(const Report& report, const Verdict& verdict) {
+std::string metrics(const Report& report, const LocalState& local, const Verdict& verdict) {
     Text text;
     addUp(text, true);
     addDaemon(text, report);
@@ -145,7 +150,7 @@ std::string metrics(const Report& report, const Verdict& verdict) {
                static_cast<double>(verdict.level));
     addPeer(text, report);
     addNode(text, report);
-    addLink(text, report);
+    addLink(text, report, local);
     addDisks(text, report);
     addTransitions(text, report);
     return text.str();

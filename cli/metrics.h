@@ -2,13 +2,14 @@
 
 #include <string>
 
+#include "local_state.h"
 #include "report.h"
 #include "verdict.h"
 
 namespace ternhactl {
 
 // Prometheus' text format. What is unknown or stale has no sample.
-std::string metrics(const Report& report, const Verdict& verdict);
+std::string metrics(const Report& report, const LocalState& local, const Verdict& verdict);
 
 // The same when the daemon does not answer.
 std::string metricsOfNoDaemon();

@@ -22,7 +22,8 @@ ExitCode printMetrics(const Settings& settings) {
     std::string text;
     try {
         const Report report(fetchReport(settings));
-        text = metrics(report, verdict(report, readLocalState()));
+        const LocalState local = readLocalState();
+        text = metrics(report, local, verdict(report, local));
     } catch (const NoAnswer& error) {
         complain(settings, error.what());
         text = metricsOfNoDaemon();

@@ -39,6 +39,7 @@ void Announcer::run() {
                 }
                 announce(*transition);
             }
+            announceDrbd();
             if (std::string status = summary(); status != _status) {
                 notifyStatus(status);
                 _status = std::move(status);
@@ -52,6 +53,14 @@ void Announcer::announce(const Transition& transition) {
     writeJournal(isGood ? Level::notice : Level::warning,
                  std::string(conditionOf(transition.flag, transition.value)) + " (was " +
                      conditionOf(transition.flag, transition.old) + ')');
+}
+
+void Announcer::announceDrbd() {
+    std::string version = _findings.unsupportedDrbd();
+    if (version != _unsupportedDrbd && !version.empty()) {
+        writeJournal(Level::warning, "DRBD " + version + " is not supported, 8.4 is");
+    }
+    _unsupportedDrbd = std::move(version);
 }
 
 // The peer's state, whatever is wrong beside it, and what was when it was last known.
@@ -68,6 +77,9 @@ std::string Announcer::summary() const {
         if (state.value && *state.value != nameOf(flag).isSetGood) {
             (state.isStale ? lastKnown : text) += std::string(", ") + conditionOf(flag, state.value);
         }
+    }
+    if (!_unsupportedDrbd.empty()) {
+        text += ", DRBD " + _unsupportedDrbd + " is not supported";
     }
     return lastKnown.empty() ? text : text + "; last known: " + lastKnown.substr(2);
 }

@@ -3,7 +3,7 @@
 #include <string>
 
 #include "event.h"
-#include "transitions.h"
+#include "health.h"
 
 namespace ternhad {
 
@@ -11,20 +11,26 @@ namespace ternhad {
 // state the node is in. For one thread, which may be stuck for as long as the manager is.
 class Announcer {
  public:
-    Announcer(Transitions& transitions, const Shutdown& shutdown)
-        : _transitions(transitions), _reader(transitions), _shutdown(shutdown) {}
+    Announcer(Health& health, const Shutdown& shutdown)
+        : _findings(health.findings()),
+          _transitions(health.transitions()),
+          _reader(_transitions),
+          _shutdown(shutdown) {}
 
     // Body of the thread.
     void run();
 
  private:
     void announce(const Transition& transition);
+    void announceDrbd();
     std::string summary() const;
 
+    const Findings& _findings;
     Transitions& _transitions;
     Transitions::Reader _reader;
     const Shutdown& _shutdown;
     std::string _status;  // as the manager knows it
+    std::string _unsupportedDrbd;
 };
 
 }  // namespace ternhad

@@ -64,7 +64,7 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
       _streams(_health.transitions(), _reporter, _shutdown),
       _controlServer(options.socket, socketDirectoryMode(options), ControlServer::Access::all, _health,
                      _reporter, _streams, _events, _shutdown),
-      _announcer(_health.transitions(), _shutdown),
+      _announcer(_health, _shutdown),
       _notifier(options, _health, _events, _shutdown),
       _peerWatcher(options, _health, _events, _shutdown),
       _nodeWatcher(options, _health, _events, _shutdown, _progress),

@@ -18,6 +18,7 @@ class Findings {
         std::optional<double> value;
         std::chrono::system_clock::time_point time;  // of the measurement
         Clock::time_point measured;                  // the same
+        bool isStale = false;                        // a later measurement has failed
     };
 
     // What became of an order to reboot the peer.
@@ -46,12 +47,29 @@ class Findings {
         return _peerName;
     }
 
+    // The version of this node's DRBD when it is not 8, the only one that tells whether it is connected.
+    void setUnsupportedDrbd(const std::string& version) {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        _unsupportedDrbd = version;
+    }
+    std::string unsupportedDrbd() const {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        return _unsupportedDrbd;
+    }
+
     // Whether the peer's report could be read: without it the names of its disks are unknown.
     void setPeerDisksKnown(bool areKnown) noexcept { _arePeerDisksKnown = areKnown; }
     bool arePeerDisksKnown() const noexcept { return _arePeerDisksKnown; }
 
+    void setLatency(double milliseconds) { set(_latency, milliseconds); }
+
+    // The last one, if any, is the last known from now on.
+    void setLatencyStale() {
+        const std::lock_guard<std::mutex> lock(_mutex);
+        _latency.isStale = true;
+    }
+
     // Nothing: it is unknown from now on.
-    void setLatency(std::optional<double> milliseconds) { set(_latency, milliseconds); }
     void setNonOkRate(std::optional<double> rate) { set(_nonOkRate, rate); }
 
     Figure latency() const { return get(_latency); }
@@ -73,6 +91,7 @@ class Findings {
     std::atomic<bool> _arePeerDisksKnown{false};
     mutable std::mutex _mutex;  // guards the rest
     std::string _peerName;
+    std::string _unsupportedDrbd;
     Figure _latency;
     Figure _nonOkRate;
 };

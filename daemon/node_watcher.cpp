@@ -7,11 +7,26 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <fstream>
 #include <string>
 
 #include "passes.h"
+#include "printable.h"
 
 namespace ternhad {
+
+namespace {
+
+// The version that /proc/drbd begins with, unless it is 8: others do not list their connections there.
+std::string unsupportedDrbd() {
+    std::ifstream file("/proc/drbd");
+    std::string word;
+    std::string version;
+    file >> word >> version;
+    return word == "version:" && version.rfind("8.", 0) != 0 ? printable(version) : std::string();
+}
+
+}  // namespace
 
 void NodeWatcher::runChecks() {
     Passes passes;
@@ -40,12 +55,29 @@ bool NodeWatcher::isThere(KernelFiles& files) {
 
 // What is not there gives the result that its check would give, but not a line in the log each time.
 void NodeWatcher::check() {
-    _health.set(Flag::drbdConnected, isThere(_drbd) && TERN::HA::Daemon::isDRBDConnect());
+    checkDrbd();
     _health.set(Flag::resync, isThere(_arrays) && TERN::HA::Daemon::isMDResync());
     checkDisks();
     _health.updatePeerRebooting();
     _health.setHostname(TERN::HA::Daemon::getLocalHostname());
     _progress.made(Progress::nodeWatcher);
+}
+
+void NodeWatcher::checkDrbd() {
+    const bool isDrbdThere = isThere(_drbd);
+    const bool isConnected = isDrbdThere && TERN::HA::Daemon::isDRBDConnect();
+    const std::string unsupported = isDrbdThere ? unsupportedDrbd() : "";
+    if (unsupported != _health.findings().unsupportedDrbd()) {
+        _health.findings().setUnsupportedDrbd(unsupported);
+        if (!unsupported.empty()) {
+            TERNHAD_LOG(_events, "DRBD " + unsupported + " is not supported, 8.4 is");
+        }
+    }
+    if (unsupported.empty()) {
+        _health.set(Flag::drbdConnected, isConnected);
+    } else {
+        _health.status().isDRBDConnect = isConnected;  // as the record has it; the flag stays unknown
+    }
 }
 
 void NodeWatcher::checkDisks() {
@@ -88,8 +120,8 @@ void NodeWatcher::measure(TERN::HA::Daemon::InterfaceChecker& interface) {
         _health.status().heartbeatLatency = latency;
         if (latency > 0) {
             _health.findings().setLatency(latency);
-        } else if (_health.isPeerAlive()) {  // that of a dead one stays the last known
-            _health.findings().setLatency(std::nullopt);
+        } else {
+            _health.findings().setLatencyStale();
         }
     }
 }

@@ -31,6 +31,7 @@ class NodeWatcher {
     };
 
     void check();
+    void checkDrbd();
     void checkDisks();
     bool isThere(KernelFiles& files);
     bool isInterfaceUp();

@@ -50,8 +50,8 @@ Json::Value Reporter::figure(const Findings::Figure& figure) const {
     Json::Value json(Json::objectValue);
     json["value"] = figure.value ? Json::Value(*figure.value) : Json::Value();
     json["time"] = figure.value ? Json::Value(secondsOf(figure.time)) : Json::Value();
-    json["stale"] =
-        figure.value && Clock::now() - figure.measured > 3 * _options.heartbeatInterval + MEASUREMENT;
+    const bool isOld = Clock::now() - figure.measured > 3 * _options.heartbeatInterval + MEASUREMENT;
+    json["stale"] = figure.value && (figure.isStale || isOld);
     return json;
 }
 

@@ -138,6 +138,20 @@ TEST_F(ReportingTest, MissingKernelFilesAreLoggedOnceAndFoundWhenTheyAppear) {
         test::eventually(10s, [] { return count(test::wholeLog(), "Found DRBD: /proc/drbd\n") == 1; }));
 }
 
+TEST_F(ReportingTest, ConnectionOfAnUnsupportedDrbdIsUnknown) {
+    test::writeFile("/proc/drbd", "version: 9.1.7 (api:2/proto:110-121)\n");
+    auto daemon = start();
+    const std::string message = "DRBD 9.1.7 is not supported, 8.4 is\n";
+    const auto isLogged = [&] { return count(test::wholeLog(), message) == 1; };
+    EXPECT_TRUE(test::eventually(10s, isLogged));
+    EXPECT_EQ(control("wait not-connected --timeout 1").exitCode, 1);
+    EXPECT_TRUE(report()["link"]["connected"]["value"].isNull());
+    EXPECT_FALSE(test::statusAt()["isDRBDConnect"].asBool());
+    test::writeFile("/proc/drbd", "version: 8.4.11 (api:1/proto:86-101)\n 0: cs:Connected\n");
+    EXPECT_EQ(control("wait connected --timeout 20").exitCode, 0);
+    EXPECT_TRUE(isLogged());
+}
+
 TEST_F(ReportingTest, FollowersSeeEachChangeAndWaitersTheirCondition) {
     test::writeFile("/sys/block/md0/md/sync_action", "idle\n");
     auto daemon = start();

@@ -52,6 +52,25 @@ TEST_F(WatchedDaemonTest, ReportsTheStateAsStatusLine) {
     EXPECT_TRUE(daemon.waitFor(10s).has_value());
 }
 
+TEST_F(WatchedDaemonTest, ReportsAnUnsupportedDrbdByItsVersion) {
+    test::writeFile("/proc/drbd", "version: 9.1.7 (api:2/proto:110-121)\n");
+    test::Process daemon = start(1h);
+    std::string status;
+    const std::string end = ", DRBD 9.1.7 is not supported";
+    const auto isTold = [&] {
+        const std::string told = manager.told();
+        status = told.rfind("STATUS=", 0) == 0 ? told : status;
+        return status.find(end) != std::string::npos;
+    };
+    EXPECT_TRUE(test::eventually(20s, isTold)) << status;
+    EXPECT_EQ(status.find("connected"), std::string::npos) << status;
+    const std::string journal = daemon.error();
+    EXPECT_NE(journal.find("DRBD 9.1.7 is not supported, 8.4 is\n"), std::string::npos) << journal;
+    EXPECT_EQ(journal.find("connected"), std::string::npos) << journal;
+    daemon.signal(SIGTERM);
+    EXPECT_TRUE(daemon.waitFor(10s).has_value());
+}
+
 TEST_F(WatchedDaemonTest, ReportsADeadPeersLastKnownStateAsStatusLine) {
     const auto isTold = [this](const std::string& begin, const std::string& end) {
         return test::eventually(20s, [&, told = manager.told()]() mutable {
