@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <regex>
 
@@ -79,9 +80,12 @@ TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhenSafe) {
     writeProgram("/usr/local/sbin/ternha-role.recipe", test::recipe("/usr/local/sbin/ternha-role"));
     writeProgram("/usr/local/sbin/ternha-role",
                  "#!/bin/sh\n/usr/local/sbin/ternha-role.recipe \"$@\"\necho \"$3 $?\" >>/tmp/role\n");
-    writeProgram("/usr/sbin/drbdadm", "#!/bin/sh\necho \"$*\" >>/tmp/drbdadm\n");
+    writeProgram(
+        "/usr/sbin/drbdadm",
+        "#!/bin/sh\necho \"$*\" >>/tmp/drbdadm\n[ $1 = secondary ] || [ ! -e /tmp/peer-is-primary ]\n");
     Cluster cluster;
     test::Machine& a = cluster.a;
+    a.write("/tmp/peer-is-primary", "");
     // The service network, whose only other member never replies.
     ASSERT_EQ(a.node.run({"ip", "link", "add", "eth0", "type", "veth", "peer", "name", "cable"}).exitCode, 0);
     for (const char* device : {"eth0", "cable"}) {
@@ -101,7 +105,10 @@ TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhenSafe) {
     test::Process keepalived = a.node.start({"keepalived", "--dont-fork", "--log-console", "--vrrp",
                                              "--pid=/run/k.pid", "--vrrp_pid=/run/v.pid"});
     EXPECT_TRUE(hasAddress(true)) << keepalived.output() << keepalived.error();
-    EXPECT_TRUE(cluster.eventuallyContains("/tmp/drbdadm", "primary r0\n"));
+    // As in a planned failover, until the peer is secondary.
+    EXPECT_TRUE(cluster.eventuallyContains("/tmp/drbdadm", "primary r0\nprimary r0\n"));
+    test::removeTree(a.node.path("/tmp/peer-is-primary"));
+    EXPECT_TRUE(cluster.eventuallyContains("/tmp/role", "MASTER 0\n"));
 
     a.write(SYNC_ACTION, "resync\n");
     EXPECT_TRUE(hasAddress(false));
@@ -114,19 +121,23 @@ TEST_F(RecipesTest, KeepalivedMovesTheAddressAndPromotesOnlyWhenSafe) {
     ASSERT_TRUE(test::eventually(20s, [&a] { return a.sees("isDRBDConnect", false); }));
     a.write(SYNC_ACTION, "idle\n");
     EXPECT_TRUE(hasAddress(true));
-    EXPECT_TRUE(cluster.eventuallyContains("/tmp/role", "MASTER 1\n"));
-    EXPECT_THAT(test::readFile(a.node.path("/tmp/drbdadm")), Not(::testing::EndsWith("primary r0\n")));
-
-    // Once it is dead, this node may promote.
+    const auto orders = [&a] { return test::lines(test::readFile(a.node.path("/tmp/drbdadm"))); };
+    const auto promotions = [&] {
+        const auto all = orders();
+        return std::count(all.begin(), all.end(), "primary r0");
+    };
+    const auto before = promotions();
+    EXPECT_TRUE(cluster.eventuallyContains("/run/ternha-role", "MASTER"));
     a.write(SYNC_ACTION, "resync\n");
     EXPECT_TRUE(hasAddress(false));
+    EXPECT_TRUE(cluster.eventuallyContains("/tmp/role", "MASTER 1\n"));  // it tries no longer
+    EXPECT_EQ(promotions(), before);
+
+    // Once it is dead, this node may promote.
     cluster.b.daemon->signal(SIGKILL);
     ASSERT_TRUE(test::eventually(20s, [&a] { return a.sees("isRemoteAlive", false); }));
     a.write(SYNC_ACTION, "idle\n");
-    EXPECT_TRUE(test::eventually(60s, [&a] {
-        const auto orders = test::lines(test::readFile(a.node.path("/tmp/drbdadm")));
-        return orders.back() == "primary r0";
-    }));
+    EXPECT_TRUE(test::eventually(60s, [&] { return orders().back() == "primary r0"; }));
     keepalived.signal(SIGTERM);
     EXPECT_TRUE(keepalived.waitFor(20s).has_value());
 }

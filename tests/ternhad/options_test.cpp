@@ -143,7 +143,8 @@ class WrongLineTest : public OptionsTest, public ::testing::WithParamInterface<W
 TEST_P(WrongLineTest, IsNamedWithItsFileAndNumber) {
     test::writeFile("/tmp/ternhad.conf", std::string("# Comment\nlocal-ip = 127.0.0.1\ninterface = lo\n\n") +
                                              GetParam().line + '\n');
-    const auto result = ternhad({"--config", "/tmp/ternhad.conf", "--remote-ip", "127.0.0.2"});
+    const auto result =
+        ternhad({"--config", "/tmp/ternhad.conf", "--remote-ip", "127.0.0.2", "--check-config"});
     EXPECT_EQ(result.exitCode, 2);
     EXPECT_EQ(result.error, std::string("ternhad: /tmp/ternhad.conf:5: ") + GetParam().message + '\n');
     EXPECT_FALSE(test::exists("/tmp/ha"));

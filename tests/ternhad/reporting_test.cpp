@@ -15,6 +15,7 @@ namespace {
 
 using namespace std::chrono_literals;
 using test::control;
+using ::testing::ContainsRegex;
 using ::testing::HasSubstr;
 using ::testing::Not;
 
@@ -86,6 +87,22 @@ TEST_F(ReportingTest, NeverMeasuredIsUnknownAndADeadPeersStateLastKnown) {
     EXPECT_THAT(status, HasSubstr(" ms (last known "));
     EXPECT_EQ(report()["peer"]["alive"]["changes"], 2);
     EXPECT_THAT(control("metrics").output, HasSubstr("ternha_transitions_total{flag=\"peer\"} 2\n"));
+}
+
+// As when this node's own interface goes down, before the peer is dead.
+TEST_F(ReportingTest, LatencyIsLastKnownAfterAFailedMeasurement) {
+    test::PlayedPeer peer;
+    auto daemon = start();
+    const auto latency = [] { return report()["link"]["latency"]; };
+    EXPECT_TRUE(test::eventually(20s, [&] { return latency()["value"].isDouble(); }));
+    EXPECT_FALSE(latency()["stale"].asBool());
+    test::replaceProgram("/bin/ping", "exit 2");
+    EXPECT_TRUE(test::eventually(20s, [&] { return latency()["stale"].asBool(); }));
+    EXPECT_TRUE(report()["peer"]["alive"]["value"].asBool());
+    EXPECT_THAT(control("status").output, ContainsRegex("  latency  .* ms \\(last known [0-9]+ s ago\\)\n"));
+    EXPECT_THAT(control("check").output, HasSubstr(" | latency=U;"));
+    test::restoreProgram("/bin/ping");
+    EXPECT_TRUE(test::eventually(20s, [&] { return !latency()["stale"].asBool(); }));
 }
 
 TEST_F(ReportingTest, BeforeTheFirstReplyThePeerIsUnknownNotDead) {

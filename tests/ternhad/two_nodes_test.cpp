@@ -164,20 +164,6 @@ TEST_F(TwoNodesTest, MeasureTheLinkWhileThePeerIsAlive) {
     }));
 }
 
-TEST_F(TwoNodesTest, LatencyIsLastKnownWhenTheOwnInterfaceGoesDown) {
-    const auto shows = [this](const std::string& pattern) {
-        return test::eventually(20s, [&] {
-            const std::string status = a.node.run({TERNHACTL, "status"}).output;
-            return ::testing::Matches(::testing::ContainsRegex(pattern))(status);
-        });
-    };
-    EXPECT_TRUE(shows("  latency           [0-9.]+ ms\n"));
-    test::setLink(a.node, false);
-    EXPECT_TRUE(shows("  latency           [0-9.]+ ms \\(last known [0-9]+ s ago\\)\n"));
-    EXPECT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", false); }));
-    EXPECT_TRUE(shows("  latency           [0-9.]+ ms \\(last known [0-9]+ s ago\\)\n"));
-}
-
 TEST_F(TwoNodesTest, RebootReachesThePeersKernelWithItsLogsOnDisk) {
     bool isDone = false;
     std::thread order([&] {
