@@ -13,7 +13,7 @@ for package in "$1"/*_"$2".deb; do
 done
 
 # Only files of the system that the units name must exist.
-cp -L /bin/kill "$root/bin/"
+cp -L /bin/{kill,sh} "$root/bin/"
 cp /lib/systemd/system/{basic,sysinit,network,network-pre,local-fs,local-fs-pre,shutdown,umount,paths,sockets,slices,timers,swap}.target \
     "$root/lib/systemd/system/"
 complaints=$(systemd-analyze verify --root="$root" --man=no --recursive-errors=no \

@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 
 #include <ostream>
+#include <regex>
 
 #include "support/files.h"
 #include "support/programs.h"
@@ -232,6 +233,23 @@ TEST_F(OptionsTest, CheckConfigChecksWithoutStarting) {
     EXPECT_THAT(ternhad({"--config", "/tmp/ternhad.conf", "--check-config"}).error,
                 HasSubstr("there is no network interface eth9 (yet): its packet rate is unknown\n"));
     EXPECT_FALSE(test::exists("/tmp/ha"));
+}
+
+// The daemon itself, which starts next, says the rest.
+TEST_F(OptionsTest, ServiceLogsTheValuesInEffectBeforeTheStartAndNothingElse) {
+    const std::string unit = test::readFile(SERVICE_UNIT);
+    const std::string key = "\nExecStartPre=-";
+    const std::size_t begin = unit.find(key) + key.size();
+    std::string command = unit.substr(begin, unit.find('\n', begin) - begin);
+    command = std::regex_replace(command, std::regex("@CMAKE_INSTALL_FULL_SBINDIR@/ternhad"), TERNHAD);
+    command = std::regex_replace(command, std::regex("@TERNHA_CONFIG_FILE@"), "/tmp/ternhad.conf");
+    for (const std::string interface : {"eth9", "this is no interface"}) {
+        test::writeFile("/tmp/ternhad.conf",
+                        "local-ip = 10.0.0.1\nremote-ip = 10.0.0.2\ninterface = " + interface + '\n');
+        const auto result = test::run({"/bin/sh", "-c", command});
+        EXPECT_EQ(result.error, "");
+        EXPECT_EQ(result.output.find("interface = eth9\n") != std::string::npos, interface == "eth9");
+    }
 }
 
 TEST_F(OptionsTest, BroadcastAddressOfAnInterfaceIsRefused) {
