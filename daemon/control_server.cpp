@@ -115,8 +115,11 @@ void ControlServer::restoreFile() {
     }
     const bool hadFile = _listener.hasHadFile();
     if (_listener.listen()) {
-        TERNHAD_LOG(_events, "The socket " + _listener.path() +
-                                 (hadFile ? " had vanished, it is there again" : " is there now"));
+        if (hadFile) {
+            TERNHAD_LOG(_events, "The socket " + _listener.path() + " had vanished, it is there again");
+        } else {
+            TERNHAD_LOG(_events, "The socket " + _listener.path() + " is there now");
+        }
         _isFileLost = false;
     } else if (!_isFileLost) {
         _events.troubleBegan(RESTORING, errno);
