@@ -233,16 +233,16 @@ void ControlServer::runOrders() {
 }
 
 void ControlServer::carryOutOrder() {
-    TERNHAD_LOG(_events, std::string("Reboot of the peer ordered, which ") +
-                             (_health.isPeerAlive()   ? "is alive"
-                              : _health.isPeerKnown() ? "is dead"
-                                                      : "has not replied yet"));
+    std::string state = _health.isPeerKnown() ? "is dead" : "has not replied yet";
+    if (_health.isPeerAlive()) {
+        state = "is alive";
+    }
+    TERNHAD_LOG(_events, "Reboot of the peer ordered, which " + state);
     _orders.serve(_orderer);
     if (_shutdown.isRequested()) {
         return;
     }
-    TERNHAD_LOG(_events,
-                std::string("Reboot of the peer: ") + describe(_health.findings().orderOutcome()));
+    TERNHAD_LOG(_events, std::string("Reboot of the peer: ") + describe(_health.findings().orderOutcome()));
 }
 
 }  // namespace ternhad

@@ -57,6 +57,36 @@ TEST_F(FailingCallsTest, LackOfDescriptorsMeansNeitherDeadPeerNorDiskErrors) {
     expectEndInTime();
 }
 
+TEST_F(FailingCallsTest, ConnectionsThatCannotBeAcceptedAreLoggedOnce) {
+    start();
+    test::writeFile("/tmp/no-connections", "");
+    const test::Descriptor client = test::connectedClient();
+    const auto count = [](const std::string& line) {
+        const std::string log = test::wholeLog();
+        int lines = 0;
+        for (auto at = log.find(line); at != std::string::npos; at = log.find(line, at + 1)) {
+            ++lines;
+        }
+        return lines;
+    };
+    const std::string lack = "Cannot accept control clients: Cannot allocate memory\n";
+    EXPECT_TRUE(test::eventually(20s, [&] { return count(lack) == 1; }));
+    EXPECT_FALSE(test::eventually(6s, [&] { return count(lack) == 2; }));
+    test::removeTree("/tmp/no-connections");
+    EXPECT_TRUE(test::eventually(20s, [&] { return count("Can again accept control clients\n") == 1; }));
+    EXPECT_TRUE(isPeerAlive());
+    expectEndInTime();
+}
+
+TEST_F(FailingCallsTest, WithoutThreadsItDoesNotStart) {
+    test::writeFile("/tmp/no-threads", "");
+    startAlone();
+    const auto status = daemon->waitFor(20s);
+    ASSERT_TRUE(status.has_value());
+    EXPECT_EQ(WEXITSTATUS(*status), 1);
+    EXPECT_TRUE(says("ternhad: cannot start its threads: Resource temporarily unavailable\n"));
+}
+
 TEST_F(FailingCallsTest, UnsentProbesAreLoggedOnceAndKeepThePeerAlive) {
     start({"--dead-after", "0.6"});
     test::writeFile("/tmp/no-buffers", "");

@@ -295,9 +295,9 @@ TEST_F(OptionsTest, HelpAndVersionSucceed) {
     const auto help = ternhad({"--help"});
     EXPECT_EQ(help.exitCode, 0);
     for (const char* option :
-         {"--local-ip", "--remote-ip", "--interface", "--socket", "--check-interval", "--dead-after",
-          "--heartbeat-interval", "--log-interval", "--snapshot-interval", "--rotate-size", "--notify",
-          "--status-socket", "--status-group", "--check-config", "--config", "--version"}) {
+         {"--local-ip ADDRESS", "--remote-ip ADDRESS", "--interface", "--socket", "--check-interval",
+          "--dead-after", "--heartbeat-interval", "--log-interval", "--snapshot-interval", "--rotate-size",
+          "--notify", "--status-socket", "--status-group", "--check-config", "--config", "--version"}) {
         EXPECT_THAT(help.output, HasSubstr(option));
     }
     const auto version = ternhad({"--version"});

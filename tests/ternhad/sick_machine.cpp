@@ -1,4 +1,5 @@
 #include <dlfcn.h>
+#include <pthread.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -26,6 +27,26 @@ extern "C" ssize_t sendto(int fd, const void* data, size_t size, int flags, cons
     using Function = ssize_t (*)(int, const void*, size_t, int, const sockaddr*, socklen_t);
     static const auto next = reinterpret_cast<Function>(dlsym(RTLD_NEXT, "sendto"));
     return next(fd, data, size, flags, address, length);
+}
+
+extern "C" int accept4(int fd, sockaddr* address, socklen_t* length, int flags) {
+    if (exists("/tmp/no-connections")) {
+        errno = ENOMEM;
+        return -1;
+    }
+    using Function = int (*)(int, sockaddr*, socklen_t*, int);
+    static const auto next = reinterpret_cast<Function>(dlsym(RTLD_NEXT, "accept4"));
+    return next(fd, address, length, flags);
+}
+
+extern "C" int pthread_create(pthread_t* thread, const pthread_attr_t* attributes, void* (*start)(void*),
+                              void* argument) noexcept {
+    if (exists("/tmp/no-threads")) {
+        return EAGAIN;
+    }
+    using Function = int (*)(pthread_t*, const pthread_attr_t*, void* (*)(void*), void*);
+    static const auto next = reinterpret_cast<Function>(dlsym(RTLD_NEXT, "pthread_create"));
+    return next(thread, attributes, start, argument);
 }
 
 // A look at what has come, without taking it, sees its first byte only: the rest comes right after.
