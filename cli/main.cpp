@@ -36,52 +36,48 @@ void addCommands(CLI::App& app, Settings& settings, Command& command) {
         sub->callback([&command, function] { command = function; });
         return sub;
     };
-    CLI::App* const statusApp =
-        add("status", "Show what the daemon knows of both nodes and the link", status);
+    CLI::App* const statusApp = add("status", "Show the state of both nodes and the link", status);
     statusApp
         ->add_option_function<std::string>(
             "--json",
             [&settings](const std::string& form) {
                 settings.json = form == "1" ? Settings::Json::Version1 : Settings::Json::Record;
             },
-            "Print one line of JSON: the daemon's record as it is, or the report of version 1")
+            "Print one line of JSON: the status record, or version 1 of the report")
         ->expected(0, 1)
         ->default_str("record")
         ->check(CLI::IsMember({"record", "1"}))
         ->type_name("record|1");
     statusApp
-        ->add_option("--watch", settings.watchInterval,
-                     "Show it again every SECONDS, 0.1 to 86400 (every 2 when none are given)")
+        ->add_option("--watch", settings.watchInterval, "Refresh every SECONDS, 0.1 to 86400 (default 2)")
         ->expected(0, 1)
         ->default_str("2")
         ->check(between(0.1, 86400))
         ->type_name("SECONDS");
-    CLI::App* const waitApp =
-        add("wait", "Wait until a condition holds; exit with 1 when it does not in time", wait);
+    CLI::App* const waitApp = add("wait", "Wait until a condition holds; exit with 1 on time-out", wait);
     std::vector<std::string> conditions;
     for (const FlagName& name : flagNames()) {
         conditions.insert(conditions.end(), {name.set, name.clear});
     }
-    waitApp->add_option("CONDITION", settings.condition, "What is to hold")
+    waitApp->add_option("CONDITION", settings.condition, "Condition to wait for")
         ->required()
         ->check(CLI::IsMember(conditions))
         ->type_name("");
-    waitApp->add_option("--timeout", settings.waitLimit, "Seconds to wait (default: for ever)")
+    waitApp->add_option("--timeout", settings.waitLimit, "Seconds to wait (default: no limit)")
         ->check(between(0, 1e9))
         ->type_name("SECONDS");
-    add("events", "Print each change of a flag as it comes", events)
+    add("events", "Print each state transition as it happens", events)
         ->add_flag_callback(
-            "--json", [&settings] { settings.json = Settings::Json::Version1; }, "Print a line of JSON each");
-    add("rebooting", "Tell whether the peer is being rebooted: yes (exit code 0) or no (1)", rebooting);
-    add("reboot-peer", "Order the peer's reboot and follow it down", rebootPeer)
+            "--json", [&settings] { settings.json = Settings::Json::Version1; }, "Print each as a JSON line");
+    add("rebooting", "Print whether the peer is being rebooted: yes (exit code 0) or no (1)", rebooting);
+    add("reboot-peer", "Reboot the peer and wait until it is down", rebootPeer)
         ->add_flag("--yes", settings.isConfirmed, "Do not ask for confirmation");
-    add("disks", "List the disks under error handling by the names that users see", disks);
-    add(CHECK, "Print one line and exit as a monitoring plugin: 0 OK, 1 warning, 2 critical, 3 unknown",
+    add("disks", "List the disks under error handling by their human-readable names", disks);
+    add(CHECK, "Monitoring plugin: print one line and exit with 0 OK, 1 warning, 2 critical or 3 unknown",
         check)
-        ->add_flag("--self", settings.isSelfOnly,
-                   "Whether this node could serve alone: neither peer nor link");
-    add("metrics", "Print the figures in Prometheus' text format", printMetrics)
-        ->add_option("--output", settings.output, "Replace FILE by them in one step instead")
+        ->add_flag("--self", settings.isSelfOnly, "Check this node only: ignore peer and link");
+    add("metrics", "Print metrics in the text format of Prometheus", printMetrics)
+        ->add_option("--output", settings.output, "Replace FILE atomically instead of printing")
         ->check([](const std::string& file) { return file.empty() ? "The name of FILE is empty" : ""; })
         ->type_name("FILE");
 }
@@ -134,7 +130,7 @@ ExitCode run(const Command& command, const Settings& settings, bool isPlugin) {
 ExitCode run(int argc, char** argv, bool& isPlugin) {
     Settings settings;
     Command command;
-    CLI::App app("Asks the high-availability daemon of this node, or gives it an order.", "ternhactl");
+    CLI::App app("Query and control the high-availability daemon of this node.", "ternhactl");
     app.set_version_flag("--version", std::string("ternhactl ") + TERNHA_VERSION);
     app.require_subcommand(0, 1);
     app.fallthrough();
@@ -142,7 +138,7 @@ ExitCode run(int argc, char** argv, bool& isPlugin) {
                    "The daemon's control socket (default " + settings.socket + ")")
         ->type_name("PATH");
     app.add_option("--timeout", settings.timeout,
-                   "Seconds to wait for an answer (default " + std::to_string(settings.timeout) + ")")
+                   "Seconds to wait for a reply (default " + std::to_string(settings.timeout) + ")")
         ->check(between(1, 3600))
         ->type_name("SECONDS");
     addCommands(app, settings, command);

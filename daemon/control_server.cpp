@@ -212,7 +212,7 @@ void ControlServer::follow(int fd) {
 void ControlServer::order(int fd) {
     int nobody = -1;
     if (_access == Access::reading) {
-        refuse(fd, "this socket takes no orders");
+        refuse(fd, "this socket is read-only");
     } else if (_orderer.compare_exchange_strong(nobody, fd)) {
         _ordered.set();
         return;

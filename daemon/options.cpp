@@ -122,7 +122,7 @@ void addInterval(CLI::App& app, const std::string& name, Seconds& value, double 
                }
                value = Seconds(seconds);
            },
-           description + ", seconds " + range + " (default " + CLI::detail::to_string(value.count()) + ")")
+           description + ", " + range + " (default " + CLI::detail::to_string(value.count()) + ")")
         ->type_name("SECONDS");
 }
 
@@ -144,7 +144,7 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
         "and rotates the logs.",
         "ternhad");
     app.set_version_flag("--version", std::string("ternhad ") + TERNHA_VERSION);
-    app.set_config("--config", "", "Read options from this file, a line NAME = VALUE each");
+    app.set_config("--config", "", "Read options from FILE, one NAME = VALUE per line")->type_name("FILE");
     app.allow_config_extras(CLI::config_extras_mode::error);
 
     app.add_option("--local-ip", options.localIp, "This node's address on the replication link")
@@ -163,33 +163,33 @@ std::optional<int> parseOptions(int argc, const char* const* argv, Options& opti
         ->check(checkSocketPath)
         ->type_name("PATH");
     addInterval(app, "--check-interval", options.checkInterval, 0.05, DAY,
-                "Between two liveness probes, and between two rounds of local and peer checks");
+                "Seconds between two liveness probes and two rounds of local and peer checks");
     addInterval(app, "--dead-after", options.deadAfter, 0.2, 60,
-                "Without proof of life after which the peer is dead");
+                "Seconds without proof that the peer is alive, after which it is declared dead");
     addInterval(app, "--heartbeat-interval", options.heartbeatInterval, 0.1, DAY,
-                "Between two measurements of the link's latency and the interface's packet rate");
+                "Seconds between two measurements of the link's latency and the interface's packet rate");
     addInterval(app, "--log-interval", options.logInterval, 0.1, DAY,
-                "Between two moves of the logs to disk");
+                "Seconds between two moves of the logs to disk");
     addInterval(app, "--snapshot-interval", options.snapshotInterval, 0.1, DAY,
-                "Between two recordings of status, processes, file systems and memory");
+                "Seconds between two snapshots of status, processes, file systems and memory");
     app.add_option(
            "--rotate-size", options.rotateSize,
-           "Size at which a log is rotated, bytes (default " + std::to_string(options.rotateSize) + ")")
+           "Size in bytes at which a log is rotated (default " + std::to_string(options.rotateSize) + ")")
         ->check(CLI::Range(std::int64_t{4096}, std::int64_t{1} << 40))
         ->type_name("BYTES");
 
-    app.add_option("--notify", options.notify, "Run this program at each change of a state")
+    app.add_option("--notify", options.notify, "Run this program at each state transition")
         ->check(checkProgram)
         ->type_name("PROGRAM");
     CLI::Option* const statusSocket =
-        app.add_option("--status-socket", options.statusSocket, "A second socket, which takes no orders")
+        app.add_option("--status-socket", options.statusSocket, "A second, read-only socket")
             ->check(checkSocketPath)
             ->type_name("PATH");
     app.add_option("--status-group", options.statusGroup, "The group that may use the status socket")
         ->check(checkGroup)
         ->needs(statusSocket)
         ->type_name("GROUP");
-    app.add_flag("--check-config", options.isCheckOnly, "Print the values in effect, and warnings, and end")
+    app.add_flag("--check-config", options.isCheckOnly, "Print the values in effect and warnings, and exit")
         ->configurable(false);
     const auto file = std::make_shared<ConfigFile>(app);
     app.config_formatter(file);

@@ -15,7 +15,7 @@ struct Options {
     std::string interface;  // the network interface of that link
     std::string socket = "/run/ternha/control.sock";
     Seconds checkInterval = Seconds(1);        // probes while replies come; local and peer checks
-    Seconds deadAfter = Seconds(3);            // without proof of life the peer is dead
+    Seconds deadAfter = Seconds(3);            // dead after this time without proof that it is alive
     Seconds heartbeatInterval = Seconds(10);   // latency and the interface's rate
     Seconds logInterval = Seconds(10);         // buffered lines to disk
     Seconds snapshotInterval = Seconds(3600);  // recording of status, processes, file systems and memory

@@ -34,9 +34,9 @@ file(WRITE ${CMAKE_CURRENT_BINARY_DIR}/conffiles "${TERNHA_CONFIG_FILE}\n")
 
 set(CPACK_COMPONENT_LIBRARY_DESCRIPTION
     [[support library of a two-node high-availability daemon
-It gives the daemon of a storage node the means to know whether its peer is
-alive, whether either node resynchronises a RAID array or handles disk errors,
-and how healthy the replication link is, and to make the peer reboot.]])
+The daemon of a storage node uses it to detect whether its peer is alive,
+whether an md resync or disk error handling is in progress on either node, and
+how healthy the replication link is, and to fence the peer by a reboot.]])
 # The library runs programs of these packages.
 set(CPACK_DEBIAN_LIBRARY_PACKAGE_DEPENDS
     "libterncore6 (>= ${PROJECT_VERSION}), iputils-ping, net-tools, procps, xz-utils")
@@ -52,17 +52,18 @@ set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_DEPENDS "${library_package} (= ${version}),
 set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_SHLIBDEPS OFF)
 
 set(CPACK_COMPONENT_PLATFORM_DESCRIPTION
-    [[stand-in for the storage appliance's platform library
-It gives libternhadaemon on an ordinary Linux what the appliance's own library
-of this name does: running programs, reading configuration keys, naming disks.]])
+    [[portable replacement for the storage appliance's platform library
+It implements for libternhadaemon, on any Linux, the functions of the
+appliance's own library of this name: running programs, reading configuration
+keys, naming disks.]])
 set(CPACK_DEBIAN_PLATFORM_PACKAGE_CONTROL_EXTRA ${CMAKE_CURRENT_BINARY_DIR}/triggers
                                                 ${CMAKE_CURRENT_BINARY_DIR}/terncore/shlibs)
 
 set(CPACK_COMPONENT_DAEMON_DESCRIPTION
     [[high-availability daemon of a two-node storage cluster
-The daemon watches its peer over the replication link, replies to the peer's
-requests and serves a control socket; ternhactl is its control tool. A
-generator of packet filter rules keeps everybody but the peer from its port.]])
+The daemon monitors its peer over the replication link, replies to the peer's
+requests and serves a control socket; ternhactl is its control tool.
+ternha-firewall generates nftables rules that restrict its port to the peer.]])
 set(CPACK_DEBIAN_DAEMON_PACKAGE_SECTION admin)
 set(CPACK_DEBIAN_DAEMON_PACKAGE_DEPENDS "${library_package} (>= ${PROJECT_VERSION})")
 set(CPACK_DEBIAN_DAEMON_PACKAGE_RECOMMENDS nftables)

@@ -3,8 +3,8 @@
 #include <stdbool.h>  // NOLINT(modernize-deprecated-headers): for C, too
 #include <stdio.h>    // NOLINT(modernize-deprecated-headers)
 
-// The functions used of the appliance's core platform library, libterncore.so.6. The stub beside
-// this file implements them on other machines.
+// The functions used of the appliance's core platform library, libterncore.so.6. terncore.cpp
+// implements them for other machines.
 //
 // Every function may be called from any thread. No function throws.
 //

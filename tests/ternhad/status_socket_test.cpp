@@ -44,7 +44,7 @@ TEST_F(StatusSocketTest, ServesItsGroupAndRefusesReboots) {
     EXPECT_EQ(order.exitCode, 3);
     EXPECT_THAT(
         order.output,
-        HasSubstr("ternhactl: ternhad on /run/ternha/status.sock refused: this socket takes no orders\n"));
+        HasSubstr("ternhactl: ternhad on /run/ternha/status.sock refused: this socket is read-only\n"));
     EXPECT_THAT(runAs(1, "status").output, HasSubstr("Permission denied"));
     EXPECT_THAT(runAs(2, socket + " status").output, HasSubstr("Permission denied"));
     EXPECT_THAT(test::wholeLog(), Not(HasSubstr("Reboot of the peer ordered")));
