@@ -19,7 +19,7 @@ from node import Channel
 
 ROOT = Path(__file__).resolve().parents[1]
 CACHE = ROOT / "build/lab"
-BUILD = ROOT / "build/arm"  # of the tests, if they have been built
+BUILD = ROOT / "build/arm"  # of the arm tests, reused if it exists
 TARGETS = ["ternhad", "ternhactl", "ternha-lab-tool"]
 
 
@@ -41,8 +41,8 @@ def main() -> int:
 
 def parse_options():
     parser = argparse.ArgumentParser(prog="script/lab", description="Two emulated 32-bit ARM nodes at work.")
-    parser.add_argument("--keep", action="store_true", help="leave both nodes up afterwards, until Ctrl-C")
-    parser.add_argument("--on", metavar="NODE", help="run a command on a kept node, by the path that --keep names")
+    parser.add_argument("--keep", action="store_true", help="keep both nodes running until Ctrl-C")
+    parser.add_argument("--on", metavar="NODE", help="run a command on a kept node; --keep prints its path")
     parser.add_argument("command", nargs=argparse.REMAINDER, help="the command for --on")
     options = parser.parse_args()
     if bool(options.on) != bool(options.command):
@@ -57,7 +57,7 @@ def interrupt(number, _frame):
 def run_lab(keep: bool) -> int:
     CACHE.mkdir(parents=True, exist_ok=True)
     with open(CACHE / "lock", "w") as lock:
-        fcntl.flock(lock, fcntl.LOCK_EX)  # runs side by side share what they are made from
+        fcntl.flock(lock, fcntl.LOCK_EX)  # concurrent runs share the build and the images
         build_programs()
         guest_packages = packages.unpacked(CACHE)
         archive = image.system(guest_packages, CACHE) + image.programs(BUILD)
@@ -95,7 +95,7 @@ def report(failure: Exception, consoles: Consoles):
     sys.stdout.flush()
     if isinstance(failure, CheckFailed):
         print(f"FAILED: {failure.what}", file=sys.stderr)
-        print(f"  expected: {failure.expected}\n  seen:     {failure.seen}", file=sys.stderr)
+        print(f"  expected: {failure.expected}\n  actual:   {failure.seen}", file=sys.stderr)
         consoles.note(f"FAILED: {failure.what}")
     else:
         print(f"FAILED: {failure}", file=sys.stderr)
@@ -105,7 +105,7 @@ def report(failure: Exception, consoles: Consoles):
 
 def leave_up(lab: Lab):
     """Wait for Ctrl-C with the command channels free."""
-    print("Both nodes stay up until Ctrl-C. Look into them from another terminal, as in:")
+    print("Both nodes run until Ctrl-C. To run commands on them from another terminal:")
     for node in lab.nodes:
         node.channel.close()
         print(f"  script/lab --on {lab.directory}/{node} ternhactl status", flush=True)

@@ -6,8 +6,8 @@ from typing import Any, Callable
 from consoles import Consoles
 from failure import CheckFailed
 
-POLL = 0.1  # seconds between two looks
-LONGEST = 3000  # characters of what was expected or seen that a failed run shows
+POLL = 0.1  # seconds between two polls
+LONGEST = 3000  # characters of the expected and the actual state that a failed run prints
 
 
 class Checks:
@@ -37,11 +37,12 @@ class Checks:
         self.that(what, expected == seen, expected, seen)
 
     def within(self, limit: float, what: str, look: Callable[[], Any], expected: Any, since: float | None = None):
-        """Poll `look` until it returns what is expected, in a poll that begins at most `limit` seconds after `since`
-        (default: now); the duration of the poll itself does not count.
+        """Poll `look` until it returns what is expected.
 
-        `expected` is a value, the relevant members of the record of each node, or a predicate whose docstring
-        describes it."""
+        That poll must begin at most `limit` seconds after `since` (default: now); its own duration
+        does not count. `expected` is a value, the relevant members of the record of each node, or a
+        predicate whose docstring describes it.
+        """
         start = time.monotonic() if since is None else since
         while True:
             begin_look = time.monotonic()

@@ -6,7 +6,7 @@ import time
 from collections import deque
 from pathlib import Path
 
-TAIL = 25  # lines of each console that a failed run shows
+TAIL = 25  # lines of each console that a failed run prints
 KEPT_FILES = 10
 
 

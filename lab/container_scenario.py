@@ -11,7 +11,8 @@ from service_scenes import RETURN_LIMIT, hung_thread, kill, reload, stop, unknow
 
 PORT = 7499
 ALIVE = {"isRemoteAlive": True}
-ABSENT = ("/proc/drbd", "/sys/block/md*", "/sys/class/ata_port/ata*")  # in a container, from the kernel's files
+# Containers have none of these.
+ABSENT = ("/proc/drbd", "/sys/block/md*", "/sys/class/ata_port/ata*")
 PRIVATE_PROC = "BindPaths=/run/proc:/proc"
 FIREWALL = "nft list chain inet ternha input"
 
@@ -42,7 +43,7 @@ def install(pair: Containers, checks: Checks):
     pair.run("! pidof ternhad && ! systemctl is-active --quiet ternha-firewall")
     checks.that("without addresses the daemon does not start", pair.a.try_run("systemctl start ternhad")[0] != 0,
                 "a failure", "success")
-    checks.equal("and says why", 1, pair.a.run("journalctl --unit=ternhad | grep -c 'local-ip'").count("\n"))
+    checks.equal("and logs the reason", 1, pair.a.run("journalctl --unit=ternhad | grep -c 'local-ip'").count("\n"))
     pair.a.run("systemctl reset-failed ternhad")
 
 
@@ -68,7 +69,7 @@ def sandbox(pair: Containers, checks: Checks):
                   is_measured)
 
     def is_recorded(text):
-        """processes with ternhad and the first one, the root among the file systems, the memory's size"""
+        """ternhad and init among the processes, / among the file systems, the size of the memory"""
         parts = (r"^ *1 .*(systemd|init)", r"^ *\d+ .*ternhad --config", r"^overlay .*% /$", r"^MemTotal: +\d+ kB$")
         return all(re.search(part, text, re.MULTILINE) for part in parts)
 
@@ -108,8 +109,10 @@ def packets(node: Node, verdict: str) -> int:
 
 
 def private_proc(node: Node, command: str):
-    """Makes the directory that PRIVATE_PROC gives the service for /proc: the kernel's files under their names, and
-    what the command adds."""
+    """Create the directory that PRIVATE_PROC binds over the service's /proc.
+
+    It has links to the kernel's files that the service needs, and what `command` creates.
+    """
     node.run(
         "mkdir -p /run/kernel-proc && mount --bind /proc /run/kernel-proc && rm -rf /run/proc && mkdir /run/proc"
         " && cd /run/proc && for file in self meminfo mounts net stat sys uptime; do"
@@ -149,7 +152,7 @@ def remove(pair: Containers, checks: Checks):
     checks.scene("apt removes and purges the packages of node-b")
     packages = " ".join(service.PACKAGES)
     pair.b.run(f"apt-get remove --quiet --yes {packages}", 120)
-    checks.equal("neither daemon nor programs are left", "gone\n",
+    checks.equal("neither the daemon nor its programs are left", "gone\n",
                  pair.b.run("pidof ternhad || which ternhad || echo gone"))
     checks.equal("the firewall's rules are gone", 1, pair.b.try_run(FIREWALL)[0])
     pair.b.run(f"test -f {service.FILE} && test -s /var/log/ha/ha.daemon.log")

@@ -92,7 +92,8 @@ class Containers(NodePair):
             "setpriv", "--pdeathsig=KILL", "sh", "-c", 'echo $$ >"$0/cgroup.procs" && exec "$@"', str(group),
             "systemd-nspawn", "--quiet", "--register=no", "--keep-unit", "--console=read-only",
             f"--directory={self._root}", "--volatile=overlay", f"--machine={node}", "--notify-ready=yes",
-            f"--network-namespace-path=/run/netns/{node}", "--capability=CAP_NET_ADMIN", f"--bind-ro={self._packages}:/packages", "--setenv=TERM=dumb", "--boot",
+            f"--network-namespace-path=/run/netns/{node}", "--capability=CAP_NET_ADMIN",
+            f"--bind-ro={self._packages}:/packages", "--setenv=TERM=dumb", "--boot",
             "systemd.journald.forward_to_console=1", "systemd.mask=console-getty.service",
         ]
         # Its own process group: Ctrl-C must reach only this process.
@@ -149,7 +150,7 @@ def wait_until_ready(name: str, readiness: socket.socket) -> int:
 
 
 def hide_trigger(node: Node):
-    """Mount a plain file over the trigger, which would reboot this machine (and is read-only here)."""
+    """Mount a plain file over the read-only trigger, which would reboot this machine."""
     node.run(
         "[ ! -e /proc/sysrq-trigger ] || { touch /run/no-trigger && mount --bind /run/no-trigger /proc/sysrq-trigger"
         " && grep -q 'tmpfs /proc/sysrq-trigger tmpfs' /proc/mounts; }"

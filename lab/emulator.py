@@ -8,11 +8,11 @@ from pathlib import Path
 
 from failure import LabError
 
-PROMPT = 10  # seconds within which an emulator answers
+PROMPT = 10  # seconds within which an emulator replies
 
 
 class Emulator:
-    """A running emulator, controlled by the QEMU Machine Protocol. It is killed with this process."""
+    """A running emulator, controlled by the QEMU Machine Protocol; dies with this process."""
 
     def __init__(
         self,
@@ -23,8 +23,12 @@ class Emulator:
         link: socket.socket,
         channel: Path,
     ):
-        """Starts the machine called `name`. `disks` are images by serial number, `link` is the datagram socket
-        that its network interface is joined to, `channel` the path at which its command channel will listen."""
+        """Start the machine called `name`.
+
+        disks: images by serial number.
+        link: datagram socket to which the network interface is connected.
+        channel: path of the Unix socket on which its command channel will listen.
+        """
         self.name = name
         self.console, console = socket.socketpair()
         self._control, control = socket.socketpair()
@@ -81,7 +85,7 @@ class Emulator:
 
     def events(self, name: str) -> list[dict]:
         """Return the events of this name so far, each with its data and time."""
-        self.execute("query-status")  # what came before the answer has been read
+        self.execute("query-status")  # events before the reply have been read
         return [event for event in self._events if event["event"] == name]
 
     def set_link(self, up: bool):
@@ -110,7 +114,7 @@ class Emulator:
             if data == b"":
                 raise LabError(f"emulator {self.name} has ended: {self._last_words()}")
             if data is None or time.monotonic() > deadline:
-                raise LabError(f"emulator {self.name} does not answer")
+                raise LabError(f"emulator {self.name} does not reply")
             self._input += data
         line, _, self._input = self._input.partition(b"\n")
         return json.loads(line)

@@ -76,7 +76,7 @@ class Lab(NodePair):
 
 
 def _link() -> list[socket.socket]:
-    """The ends of a virtual cable: connected UDP sockets on the loopback interface, on free ports."""
+    """Return both ends of a virtual cable: connected UDP sockets on loopback, on free ports."""
     ends = [socket.socket(socket.AF_INET, socket.SOCK_DGRAM) for _ in range(2)]
     for end in ends:
         end.bind(("127.0.0.1", 0))

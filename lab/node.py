@@ -34,13 +34,13 @@ class Channel:
         return self._boot_ids.popleft()
 
     def start(self, script: str) -> int:
-        self._last_id = time.monotonic_ns()  # differs from those that others have used on this channel
+        self._last_id = time.monotonic_ns()  # unique on this channel
         line = f"{self._last_id} {base64.b64encode(script.encode()).decode()}\n"
         self._socket.settimeout(COMMAND_LIMIT)
         try:
             self._socket.sendall(line.encode())
         except OSError as error:
-            raise LabError(f"{self._name} takes no command: {error}") from None
+            raise LabError(f"{self._name} accepts no command: {error}") from None
         return self._last_id
 
     def finish(self, script_id: int, limit: float = COMMAND_LIMIT) -> tuple[int, str]:

@@ -34,7 +34,7 @@ def main() -> int:
                 container_scenario.run(pair, checks)
     except CheckFailed as failure:
         failed = True
-        print(f"FAILED: {failure.what}\n  expected: {failure.expected}\n  seen:     {failure.seen}", flush=True)
+        print(f"FAILED: {failure.what}\n  expected: {failure.expected}\n  actual:   {failure.seen}", flush=True)
     except LabError as error:
         failed = True
         print(f"FAILED: {error}", flush=True)

@@ -10,13 +10,13 @@ from checks import Checks
 from lab import Lab
 from node import Node, parse_drbd_state, parse_status
 
-DEATH_LIMIT = 5  # seconds until a silent peer is declared dead
-CUT_LIMIT = 8  # until both ends of a cut link have seen it
-RESYNC_LIMIT = 3  # until both nodes know of a resync
-RETURN_LIMIT = 20  # until everything is well again
-SOME_ROUNDS = 2  # seconds; the daemons look twice a second
-IDLE = 20  # seconds, of which the use of the processor is taken
-TICKS = 100  # of the processor's time, in a second
+DEAD_LIMIT = 5  # seconds until a silent peer is declared dead
+CUT_LIMIT = 8  # until both nodes declare the peer dead after a link cut
+RESYNC_LIMIT = 3  # until both nodes report a resync
+RETURN_LIMIT = 20  # until both nodes are in normal operation again
+SOME_ROUNDS = 2  # seconds; the daemons check twice a second
+IDLE = 20  # seconds over which processor use is measured
+TICKS = 100  # clock ticks of processor time in a second
 
 ALIVE = {"isRemoteAlive": True}
 DEAD = {"isRemoteAlive": False}
@@ -125,7 +125,7 @@ def cut_link(lab: Lab, checks: Checks):
     begin = time.monotonic()
     lab.set_link(True)
     checks.within(
-        RETURN_LIMIT, "both report alive and connected after the join", lab.statuses, [WELL] * 2, begin
+        RETURN_LIMIT, "both report alive and connected after the link is up", lab.statuses, [WELL] * 2, begin
     )
 
 
@@ -140,7 +140,7 @@ def md_actions(lab: Lab, checks: Checks):
     begin = resync_begin(lab.b)
     checks.within(
         RESYNC_LIMIT,
-        "resync: known to itself, and to the peer",
+        "resync: reported by the node and its peer",
         lab.statuses,
         [{"isMDResync": False, "isRemoteMDResync": True}, {"isMDResync": True, "isRemoteMDResync": False}],
         begin,
@@ -150,7 +150,7 @@ def md_actions(lab: Lab, checks: Checks):
     check_snapshot(lab.b, checks, "isMDResync")
     lab.b.run(FAST_RESYNC)
     checks.within(RETURN_LIMIT, "md has finished the resync", lambda: lab.b.run(SYNC_ACTION).strip(), "idle")
-    checks.within(DEATH_LIMIT, "cleared on both at the end", lab.statuses, none)
+    checks.within(DEAD_LIMIT, "cleared on both at the end", lab.statuses, none)
 
     lab.b.run(f"{SLOW_RESYNC}; echo check >/sys/block/md0/md/sync_action")
     check_uncounted(lab, checks, "check")
@@ -187,7 +187,7 @@ def check_uncounted(lab: Lab, checks: Checks, action: str):
 
 
 def check_snapshot(node: Node, checks: Checks, flag: str):
-    """Whether a snapshot begins with a record in which the flag is set."""
+    """Check for a snapshot whose status record has the flag set."""
     parts = [
         rf'^\{{.*"{flag}":true.*\}}$',
         r"^ *\d+ .* ternhad --config",
@@ -196,7 +196,7 @@ def check_snapshot(node: Node, checks: Checks, flag: str):
     ]
 
     def is_complete(record):
-        """a record with the flag, then ternhad among the processes, /var/log/ha among the file systems, memory"""
+        """status record with the flag, ternhad, /var/log/ha among file systems, memory figures"""
         position = 0
         for part in parts:
             found = re.compile(part, re.MULTILINE).search(record, position)
@@ -206,7 +206,7 @@ def check_snapshot(node: Node, checks: Checks, flag: str):
         return True
 
     checks.within(
-        DEATH_LIMIT,
+        DEAD_LIMIT,
         f"{node} has recorded {flag}, processes, file systems and memory",
         lambda: node.run("cat /var/log/ha/ha.daemon.record /tmp/ha/ha.daemon.record 2>/dev/null || true"),
         is_complete,
@@ -222,7 +222,7 @@ def split_brain(lab: Lab, checks: Checks):
     lab.set_link(True)
 
     def is_refused(states):
-        """StandAlone on one node or both, and on neither a state in which they are linked"""
+        """StandAlone on one or both nodes, and neither is connected"""
         return "StandAlone" in states and set(states) <= {"StandAlone", "WFConnection"}
 
     checks.within(RETURN_LIMIT, "DRBD refuses to connect: StandAlone", lambda: drbd_states(lab), is_refused)
@@ -247,7 +247,7 @@ def kill_daemon(lab: Lab, checks: Checks):
     lab.b.hold_daemon()
     begin = time.monotonic()
     lab.b.run("kill -KILL $(cat /run/lab/pid)")
-    checks.within(DEATH_LIMIT, "node-a reports dead", lab.a.status, DEAD | {"isDRBDConnect": True}, begin)
+    checks.within(DEAD_LIMIT, "node-a reports dead", lab.a.status, DEAD | {"isDRBDConnect": True}, begin)
     checks.equal("the supervisor saw it killed", "137", lab.b.supervised()[-1][-1])
     lab.b.release_daemon()
     checks.within(RETURN_LIMIT, "both report alive after its restart", lab.statuses, [WELL] * 2)
@@ -257,7 +257,7 @@ def freeze_node(lab: Lab, checks: Checks):
     checks.scene("node-b is frozen: its emulator is stopped")
     begin = time.monotonic()
     lab.b.emulator.freeze()
-    checks.within(DEATH_LIMIT, "node-a reports dead", lab.a.status, DEAD, begin)
+    checks.within(DEAD_LIMIT, "node-a reports dead", lab.a.status, DEAD, begin)
     lab.b.emulator.thaw()
     checks.within(RETURN_LIMIT, "both report alive and connected when it continues", lab.statuses, [WELL] * 2)
 
@@ -272,7 +272,7 @@ def step_clock(lab: Lab, checks: Checks):
     for direction, seconds in (("forward", "+ 3600"), ("back", "- 3600")):
         lab.b.run(f"date -s @$(($(date +%s) {seconds})) >/dev/null")
         checks.holds(
-            DEATH_LIMIT, f"{direction}: both still report alive and connected", lab.statuses, [WELL] * 2
+            DEAD_LIMIT, f"{direction}: both still report alive and connected", lab.statuses, [WELL] * 2
         )
     checks.equal("neither has declared the other dead", before, changes())
 
@@ -282,14 +282,14 @@ def unknown_request(lab: Lab, checks: Checks):
     pid = lab.b.run("cat /run/lab/pid").strip()
     lab.a.run(f"ternha-lab-tool send {lab.b.address} no_such_request")
     checks.within(
-        DEATH_LIMIT,
-        "the daemon has ended by SIGABRT and the supervisor has started another",
+        DEAD_LIMIT,
+        "SIGABRT ended the daemon and the supervisor restarted it",
         lambda: without_pids(lab.b.supervised()[-2:]),
         [["end", "134"], ["start"]],
     )
     ended, started = lab.b.supervised()[-2:]
     is_other = ended[1] == pid != started[1]
-    checks.that("the daemon was replaced by another", is_other, f"the end of {pid}", [ended, started])
+    checks.that("the process is another one", is_other, f"the end of {pid}", [ended, started])
     checks.within(RETURN_LIMIT, "both report alive", lab.statuses, [WELL] * 2)
 
 
@@ -312,7 +312,7 @@ def rotate_log(lab: Lab, checks: Checks):
     unpacked = node.run(f"/bin/xz --decompress --stdout {archive}")
     packed = base64.b64decode(node.run(f"base64 {archive}"))
     checks.equal(
-        "it is in xz's format: unpacked elsewhere it is the same",
+        "it is in xz format: another implementation unpacks the same text",
         unpacked,
         lzma.decompress(packed, lzma.FORMAT_XZ).decode(),
     )
@@ -366,7 +366,7 @@ def measure(lab: Lab, checks: Checks):
     lab.run("sed -i /interval/d /etc/ternha/ternhad.conf && kill -TERM $(cat /run/lab/pid)")
     checks.within(
         RETURN_LIMIT,
-        "both have ended in order, and been started again with the default intervals",
+        "both stopped cleanly and were restarted with the default intervals",
         lambda: [without_pids(node.supervised()[-2:]) for node in lab.nodes],
         [[["end", "0"], ["start"]]] * 2,
     )
@@ -413,7 +413,7 @@ def drbd_disks(lab: Lab) -> list[str]:
 
 
 def connected_during_state(lab: Lab) -> list[tuple[str, bool]]:
-    """Return for each node the DRBD state before and after the query, and whether it reported connected."""
+    """Return for each node the DRBD states around a query, and whether it reported connected."""
     looks = []
     for output in lab.run("grep cs: /proc/drbd; ternhactl status --json; grep cs: /proc/drbd"):
         before, record, after = output.splitlines()

@@ -12,7 +12,8 @@ PACKAGES = ["libterncore6", "libternhadaemon6", "ternhad"]
 def configure(node: Node, peer: Node, interface: str):
     """Edit the configuration as an administrator does."""
     values = {"local-ip": node.address, "remote-ip": peer.address, "interface": interface}
-    node.run("sed -i " + " ".join(f"-e 's/^#{key} = .*/{key} = {value}/'" for key, value in values.items()) + f" {FILE}")
+    edits = " ".join(f"-e 's/^#{key} = .*/{key} = {value}/'" for key, value in values.items())
+    node.run(f"sed -i {edits} {FILE}")
 
 
 def properties(node: Node, *names: str) -> list[str]:

@@ -5,7 +5,7 @@ import time
 import service
 from checks import Checks
 
-RETURN_LIMIT = 30  # seconds until everything is well again
+RETURN_LIMIT = 30  # seconds until both nodes are in normal operation again
 STOP_LIMIT = 10
 ABORTED = "code=killed, status=6/ABRT"
 
@@ -27,12 +27,12 @@ def unknown_request(lab, checks: Checks, well: dict):
 
 
 def hung_thread(lab, checks: Checks, well: dict, setting: str):
-    """`setting` replaces /proc/drbd by a FIFO for the service: open() blocks until a writer comes."""
+    """`setting` replaces the service's /proc/drbd by a FIFO, so that open() blocks."""
     checks.scene("A thread of node-b's daemon hangs")
     times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
     service.override(lab.b, "WatchdogSec=10", setting)
     lab.b.run("systemctl restart ternhad")
-    service.override(lab.b)  # for the next one
+    service.override(lab.b)  # for the restart
     check_restarted(lab, checks, [*ends, ABORTED], well)
     watchdog = lab.b.run("journalctl --unit=ternhad --output=cat | grep -c 'Watchdog timeout'").strip()
     checks.equal("by the watchdog", "1", watchdog)
@@ -57,12 +57,12 @@ def stop(lab, checks: Checks, well: dict):
     lab.b.run("systemctl stop ternhad")
     took = time.monotonic() - begin
     checks.that(f"it has stopped within its time ({took:.1f} s)", took < STOP_LIMIT, f"less than {STOP_LIMIT} s", took)
-    checks.equal("in order", ["inactive", "success"], service.properties(lab.b, "ActiveState", "Result"))
+    checks.equal("cleanly", ["inactive", "success"], service.properties(lab.b, "ActiveState", "Result"))
     on_disk = lab.b.run("cat /var/log/ha/ha.daemon.log").splitlines()
     checks.equal("its log is on the disk", before, on_disk[: len(before)])
     checks.equal("and nowhere else", "", lab.b.run("cat /tmp/ha/ha.daemon.log 2>/dev/null || true"))
     lab.b.run("systemctl start ternhad")
-    checks.within(RETURN_LIMIT, "started again: both are well", lab.statuses, [well] * 2)
+    checks.within(RETURN_LIMIT, "after the start both are in normal operation", lab.statuses, [well] * 2)
 
 
 def upgrade(lab, checks: Checks, well: dict, packages: str):
@@ -74,9 +74,9 @@ def upgrade(lab, checks: Checks, well: dict, packages: str):
         node.run(f"apt-get install --quiet --yes {packages}/*.deb", 300)
         checks.that(f"{node} has another version", installed_version(node) != version, f"not {version}", version)
         checks.equal("its edited configuration is kept", configuration, node.run(f"cat {service.FILE}"))
-        checks.equal("the daemon was started once again", starts + 1, service.starts(node))
-        checks.within(RETURN_LIMIT, "both are well again", lab.statuses, [well] * 2)
-    checks.equal("neither node has said dead", times_dead, [service.times_dead(node) for node in lab.nodes])
+        checks.equal("the daemon was restarted once", starts + 1, service.starts(node))
+        checks.within(RETURN_LIMIT, "both are in normal operation again", lab.statuses, [well] * 2)
+    checks.equal("neither node has declared its peer dead", times_dead, [service.times_dead(node) for node in lab.nodes])
 
 
 def installed_version(node) -> str:
@@ -92,8 +92,8 @@ def check_restarted(lab, checks: Checks, ends: list[str], well: dict):
     """Check that the daemon of node-b failed in the last of these ways and was restarted."""
     checks.within(
         RETURN_LIMIT,
-        f"it ends ({ends[-1].rpartition('/')[2]}) and another is started",
+        f"it ends ({ends[-1].rpartition('/')[2]}) and is restarted",
         lambda: (service.ends(lab.b), service.state(lab.b)),
         (ends, "active"),
     )
-    checks.within(RETURN_LIMIT, "both are well again", lab.statuses, [well] * 2)
+    checks.within(RETURN_LIMIT, "both are in normal operation again", lab.statuses, [well] * 2)

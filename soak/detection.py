@@ -1,4 +1,4 @@
-"""How long each failure of the peer takes to be detected: ternhad, keepalived and corosync on the same nodes."""
+"""Measure the detection time of a failed peer by ternhad, keepalived and corosync side by side."""
 
 import random
 import signal
@@ -8,7 +8,8 @@ import time
 from nodes import Daemon, eventually
 from rivals import Corosync, Keepalived
 
-# Name: ternhad's options, keepalived's interval, corosync's token (0: its default).
+# Name: options of ternhad, advertisement interval of keepalived in seconds, token time-out of
+# corosync in milliseconds (0: its default).
 SETTINGS = {
     "default": ([], 1, 0),
     "fast": (["--dead-after", "0.5", "--check-interval", "0.1"], 0.1, 500),
@@ -17,7 +18,7 @@ LIMIT = 60  # seconds
 
 
 class Watchers:
-    """The programs of both nodes with one setting. Those of node a watch node b."""
+    """The programs of both nodes with one setting; each monitors the other node."""
 
     def __init__(self, cluster, setting, rivals=True):
         options, interval, token = SETTINGS[setting]
@@ -37,22 +38,25 @@ class Watchers:
                     watcher.start()
 
     def wait_until_alive(self, limit=LIMIT):
-        """Returns the programs on node a that see their peer, among which is ternhad."""
+        """Return the programs on node a that report their peer alive; fail if ternhad does not."""
         eventually(limit, lambda: all(watcher.sees_peer() for watcher in self.on_a.values()), 0.1)
         seeing = [name for name, watcher in self.on_a.items() if watcher.sees_peer()]
         if "ternhad" not in seeing:
-            raise RuntimeError("ternhad does not see its peer")
+            raise RuntimeError("ternhad does not report its peer alive")
         return seeing
 
     def revive(self):
-        """Starts all programs again when one of them does not see its peer any more."""
+        """Restart all programs if one of those on node a considers its peer dead."""
         if len(self.wait_until_alive()) < len(self.on_a):
             self.end()
             self.start()
             self.wait_until_alive()
 
     def detect(self, names, since, limit=LIMIT):
-        """Seconds from `since` until each of the programs on node a has seen its peer's failure; None: never."""
+        """Return when each program on node a declared its peer dead.
+
+        In seconds since `since`; None: not within `limit` seconds.
+        """
         times = dict.fromkeys(names)
         while None in times.values() and time.monotonic() - since < limit:
             for name in times:
@@ -107,7 +111,7 @@ def table_head(name, columns):
 
 
 def measure(cluster, times, settings, rivals):
-    """Prints the table, each row when it is known."""
+    """Print the table, each row as soon as it is measured."""
     print(f"Seconds until detected, {times} times each: minimum, median, maximum", flush=True)
     for setting in settings:
         watchers = Watchers(cluster, setting, rivals)

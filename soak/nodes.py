@@ -1,4 +1,4 @@
-"""Two nodes of one machine, and a third host: namespaces of their own, joined by a bridge."""
+"""Two nodes and a third host on one machine, in namespaces joined by a bridge."""
 
 import ctypes
 import os
@@ -24,7 +24,7 @@ def run(*argv):
 
 
 def eventually(limit, predicate, step=0.01):
-    """Whether `predicate` holds within `limit` seconds."""
+    """Return whether `predicate` holds within `limit` seconds."""
     end = time.monotonic() + limit
     while not predicate():
         if time.monotonic() >= end:
@@ -34,13 +34,16 @@ def eventually(limit, predicate, step=0.01):
 
 
 class Node:
-    """Network, processes, host name, /tmp, /run, /var/log and /dev/shm of its own. `build` has the programs."""
+    """A node with its own network, hostname, /tmp, /run, /var and /dev/shm.
+
+    With `build`, the directory of the programs, it can run ternhad.
+    """
 
     def __init__(self, name, build=None):
         self.name = name
         self.address = ADDRESSES.get(name)
         self.processes = {}
-        self.prefix = []  # of what is started, such as "env"
+        self.prefix = []  # of each command that is started, such as "env"
         setup = "echo ready; exec sleep infinity"
         if build:
             files = [build / "daemon/ternhad", build / "stepped_clock.so", *(build / "src").glob("libternhadaemon.so.?"),
@@ -69,7 +72,7 @@ class Node:
         run(*self.command(*argv))
 
     def start(self, name, *argv, **options):
-        """A process of the node, to be known as `name`."""
+        """Start a process on the node, to be addressed as `name`."""
         process = subprocess.Popen(self.command(*self.prefix, *argv), stdout=subprocess.DEVNULL, stderr=subprocess.PIPE,
                                    preexec_fn=die_with_parent, start_new_session=True, **options)
         self.processes[name] = process
@@ -98,7 +101,7 @@ class Node:
 
 
 class Cluster:
-    """Nodes a and b, host c, and the bridge between them in a namespace of its own."""
+    """Nodes a and b, host c, and the bridge between them in its own namespace."""
 
     def __init__(self, build):
         self.switch = Node("switch")
@@ -128,7 +131,10 @@ class Cluster:
 
 
 class Daemon:
-    """A node's ternhad, with `options`. Its journal tells of changes, whatever becomes of descriptors and disks."""
+    """ternhad on a node.
+
+    The state comes from its standard error, which needs neither descriptors nor disks.
+    """
 
     def __init__(self, node, peer, options):
         self.node, self.peer, self.options = node, peer, options
@@ -147,13 +153,13 @@ class Daemon:
             self.journal += (self.node.processes["ternhad"].stderr.read() or b"").decode()
 
     def sees_peer(self):
-        """True, False, or None when that is unknown."""
+        """Return whether the peer is alive, or None while that is unknown."""
         self._read()
         states = re.findall(r"^ternhad: (started|peer-alive|peer-dead)\b", self.journal, re.MULTILINE)
         return {"peer-alive": True, "peer-dead": False}.get(states[-1]) if states else None
 
-    def deaths(self):
-        """How often it has declared its peer dead."""
+    def times_dead(self):
+        """Return how often it has declared its peer dead."""
         self._read()
         return self.journal.count("ternhad: peer-dead")
 

@@ -1,4 +1,4 @@
-"""Puts node a under pressure, and counts the false positives of both nodes and the delay of true ones."""
+"""Put node a under pressure; count false positives and measure the detection of a real failure."""
 
 import argparse
 import os
@@ -41,7 +41,7 @@ while True:
 
 
 class Control:
-    """A control group of node a, with the given controller and limits."""
+    """A control group for processes of node a, with a limit of one controller."""
 
     def __init__(self, controller, limits):
         name = f"ternha-pressure-{os.getpid()}"  # two of these may run, one for each setting
@@ -61,7 +61,7 @@ class Control:
             try:
                 parent.write_text(pid)
             except OSError:
-                pass  # it has ended
+                pass  # the process has ended
         eventually(10, lambda: not (self.path / "cgroup.procs").read_text())
         self.path.rmdir()
 
@@ -84,7 +84,7 @@ def real_time(watchers):
 
 
 def hog_in(watchers, group, script):
-    """Runs `script` in a control group with node a's programs."""
+    """Run `script` in a control group together with node a's programs."""
     node = watchers.cluster.a
     try:
         for name in watchers.on_a:
@@ -101,12 +101,12 @@ def hog_in(watchers, group, script):
 
 
 def fork_storm(watchers):
-    """fork storm at a limit of processes"""
+    """fork storm at the limit of processes"""
     return hog_in(watchers, Control("pids", [(["pids.max"], 80)]), FORKS)
 
 
 def descriptors(watchers):
-    """descriptors used up"""
+    """no free descriptors"""
     pids = [watchers.cluster.a.pid(name) for name in watchers.on_a]
     before = [resource.prlimit(pid, resource.RLIMIT_NOFILE) for pid in pids]
     try:
@@ -117,18 +117,18 @@ def descriptors(watchers):
         yield
     finally:
         for pid, limits in zip(pids, before):
-            with suppress(ProcessLookupError):  # it did not bear that
+            with suppress(ProcessLookupError):  # the process did not survive
                 resource.prlimit(pid, resource.RLIMIT_NOFILE, limits)
 
 
 def memory(watchers):
-    """memory cgroup thrashed"""
+    """thrashing memory cgroup"""
     limit = (["memory.limit_in_bytes", "memory.max"], 80 << 20)
     return hog_in(watchers, Control("memory", [limit]), THRASH)
 
 
 def clock_steps(watchers):
-    """wall clock of node a's programs an hour forward and back, each second"""
+    """wall clock of node a's programs stepped by an hour every second, forward and back"""
     node = watchers.cluster.a
     node.prefix = ["env", f"LD_PRELOAD={PROGRAMS}/stepped_clock.so"]
     restart(watchers)
@@ -145,14 +145,14 @@ def clock_steps(watchers):
 
 
 def restart(watchers):
-    """Restarts node a's programs."""
+    """Restart node a's programs."""
     for watcher in watchers.on_a.values():
         watcher.end()
     watchers.start("a")
 
 
-def on_a_disk_of_its_own(watchers, directory, sicken, heal):
-    """Restarts node a's programs with `directory` on a small disk, and makes that sick."""
+def on_own_disk(watchers, directory, fail, repair):
+    """Restart node a's programs with `directory` on a small disk and make that disk fail."""
     node = watchers.cluster.a
     for watcher in watchers.on_a.values():
         watcher.end()
@@ -165,11 +165,12 @@ def on_a_disk_of_its_own(watchers, directory, sicken, heal):
     node.run("chmod", "700", directory)
     watchers.start("a")
     watchers.wait_until_alive()
-    node.run(*sicken)
+    node.run(*fail)
     try:
         yield
     finally:
-        node.run(*heal)  # a frozen disk would outlive its namespace, with all that waits for it
+        # A frozen disk would outlive its namespace, and so would processes that block on it.
+        node.run(*repair)
         for watcher in watchers.on_a.values():
             watcher.end()
         eventually(10, lambda: subprocess.run(node.command("umount", directory), check=False,
@@ -179,7 +180,7 @@ def on_a_disk_of_its_own(watchers, directory, sicken, heal):
 
 def frozen(directory):
     def condition(watchers):
-        return on_a_disk_of_its_own(watchers, directory, ["fsfreeze", "-f", directory],
+        return on_own_disk(watchers, directory, ["fsfreeze", "-f", directory],
                                     ["fsfreeze", "-u", directory])
 
     return condition
@@ -188,7 +189,7 @@ def frozen(directory):
 def full(directory):
     def condition(watchers):
         fill = ["sh", "-c", f"dd if=/dev/zero of={directory}/filler bs=64k 2>/dev/null || true"]
-        return on_a_disk_of_its_own(watchers, directory, fill, ["rm", "-f", f"{directory}/filler"])
+        return on_own_disk(watchers, directory, fill, ["rm", "-f", f"{directory}/filler"])
 
     return condition
 
@@ -200,7 +201,8 @@ def flood(sender):
         try:
             yield
         finally:
-            node.kill([name for name in ("flood",) if name in node.processes])  # it may have gone with its node
+            # It may have ended with its node.
+            node.kill([name for name in ("flood",) if name in node.processes])
 
     return condition
 
@@ -241,19 +243,21 @@ RESTARTED = ("frozen", "full", "clock")  # conditions that restart node a's prog
 
 
 def press(watchers, condition, seconds):
-    """Returns a cell for each program: its false positives on both nodes, and the seconds until it saw node b's end.
-    And whether ternhad was right."""
+    """Return a cell for each program, and whether ternhad made no mistake.
+
+    A cell has the false positives on both nodes and the detection time of node b's failure.
+    """
     watchers.revive()
     # Node b is right when it declares a stopped node a dead.
     observers = [watchers.on_a] if condition.startswith("stopped") else [watchers.on_a, watchers.on_b]
-    deaths = lambda: {name: sum(observer[name].deaths() for observer in observers) for name in watchers.on_a}
+    times_dead = lambda: {name: sum(side[name].times_dead() for side in observers) for name in watchers.on_a}
     with closing(CONDITIONS[condition](watchers)) as steps:
-        before = deaths()
+        before = times_dead()
         next(steps)
         if any(word in condition for word in RESTARTED):
-            before = deaths()
+            before = times_dead()
         time.sleep(seconds)
-        wrong = {name: count - before[name] for name, count in deaths().items()}
+        wrong = {name: count - before[name] for name, count in times_dead().items()}
         seeing = watchers.wait_until_alive(20)
         failure = vanished(watchers)
         begin = time.monotonic()
@@ -262,7 +266,7 @@ def press(watchers, condition, seconds):
     for node in (watchers.cluster.a, watchers.cluster.c):
         node.kill([name for name in node.processes if name not in watchers.on_a])
     next(failure, None)
-    if None in delays.values():  # what has seen nothing may be broken for good
+    if None in delays.values():  # a program that detected nothing may not recover
         watchers.end()
         watchers.start()
     cells = [f"{count}, {cell(name, delays)}" for name, count in wrong.items()]
@@ -271,24 +275,24 @@ def press(watchers, condition, seconds):
 
 def cell(name, delays):
     if name not in delays:
-        return "blind"  # did not see its peer before either
+        return "blind"  # it considered its peer dead before the failure
     return "never" if delays[name] is None else format(delays[name], ".2f")
 
 
 def main():
     parser = argparse.ArgumentParser(prog="script/pressure", description=__doc__)
     parser.add_argument("--build", type=Path, required=True, help=argparse.SUPPRESS)
-    parser.add_argument("--short", action="store_true", help="a minute: ternhad alone, fails on a false positive")
+    parser.add_argument("--short", action="store_true", help="a minute, ternhad alone; fail on a false positive")
     duration = parser.add_mutually_exclusive_group()
-    duration.add_argument("--seconds", type=float, default=300, help="that each pressure lasts (300)")
-    duration.add_argument("--minutes", type=float, help="the same")
-    parser.add_argument("--condition", action="append", choices=CONDITIONS, help="instead of all")
-    parser.add_argument("--setting", action="append", choices=["default", "fast"], help="instead of both")
-    parser.add_argument("--detection", type=int, metavar="TIMES", help="measure detection without pressure instead")
+    duration.add_argument("--seconds", type=float, default=300, help="duration of each condition (300)")
+    duration.add_argument("--minutes", type=float, help="the same in minutes")
+    parser.add_argument("--condition", action="append", choices=CONDITIONS, help="only these conditions")
+    parser.add_argument("--setting", action="append", choices=["default", "fast"], help="only these settings")
+    parser.add_argument("--detection", type=int, metavar="TIMES", help="measure detection without pressure")
     parser.add_argument("--alone", action="store_true", help="without keepalived and corosync")
     options = parser.parse_args()
     require_root()
-    # Measures on time whatever the pressure; what it starts has the usual priority.
+    # Measure punctually under any pressure; children have normal priority.
     os.sched_setscheduler(0, os.SCHED_RR | os.SCHED_RESET_ON_FORK, os.sched_param(99))
     settings = options.setting or (["fast"] if options.short else ["default", "fast"])
     rivals = not (options.short or options.alone)
@@ -297,7 +301,7 @@ def main():
         if options.detection:
             return measure(cluster, options.detection, settings, rivals)
         seconds = 5 if options.short else options.minutes * 60 if options.minutes else options.seconds
-        print(f"False positives in {seconds:g} s, and seconds until a true failure is seen", flush=True)
+        print(f"False positives in {seconds:g} s, and seconds until a real failure is detected", flush=True)
         is_right = True
         for setting in settings:
             watchers = Watchers(cluster, setting, rivals)

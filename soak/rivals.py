@@ -1,4 +1,4 @@
-"""keepalived and corosync on the nodes of a cluster, and when they see the peer's failure."""
+"""keepalived and corosync on a node, and what they report about the peer."""
 
 import os
 import re
@@ -51,7 +51,7 @@ logging {{
 
 
 class Keepalived:
-    """VRRP with the given seconds between advertisements; the peer is dead when this node becomes master."""
+    """VRRP with an advertisement every `interval` seconds; as master it considers the peer dead."""
 
     def __init__(self, node, interval, priority):
         self.node, self.interval, self.priority = node, interval, priority
@@ -59,16 +59,16 @@ class Keepalived:
         self.states = ""
 
     def start(self):
-        number = 1 if self.interval >= 1 else 2
+        number, version = (1, 2) if self.interval >= 1 else (2, 3)
         instance = INSTANCE.format(name="V", id=number, priority=self.priority, interval=self.interval)
-        self.node.path("/run/keepalived.conf").write_text(VRRP.format(name=self.node.name, version=2 if self.interval >= 1 else 3,
-                                                                       instances=instance))
+        configuration = VRRP.format(name=self.node.name, version=version, instances=instance)
+        self.node.path("/run/keepalived.conf").write_text(configuration)
         fifo = self.node.path("/run/keepalived.fifo")
         if not fifo.exists():
             os.mkfifo(fifo)
         if self.fifo is None:
             self.fifo = os.open(fifo, os.O_RDWR | os.O_NONBLOCK)
-        for name in ("keepalived.pid", "vrrp.pid"):  # of a process that was killed and may not have gone yet
+        for name in ("keepalived.pid", "vrrp.pid"):  # of a killed process that may still exist
             self.node.path(f"/run/{name}").unlink(missing_ok=True)
         self.node.start("keepalived", "keepalived", "--dont-fork", "--vrrp", "-f", "/run/keepalived.conf", "-p",
                         "/run/keepalived.pid", "-r", "/run/vrrp.pid")
@@ -84,7 +84,7 @@ class Keepalived:
         states = re.findall(r'"V" (MASTER|BACKUP|FAULT)', self.states)
         return bool(states) and states[-1] == "BACKUP"
 
-    def deaths(self):
+    def times_dead(self):
         self._read()
         return len(re.findall(r'"V" MASTER', self.states))
 
@@ -99,7 +99,7 @@ class Keepalived:
 
 
 class Corosync:
-    """Totem with the given token time-out in milliseconds (0: its default)."""
+    """Totem with a token time-out of `token` milliseconds (0: its default)."""
 
     def __init__(self, node, token=0):
         self.node, self.token = node, token
@@ -118,7 +118,7 @@ class Corosync:
         members = self._members()
         return bool(members) and members[-1] == "2"
 
-    def deaths(self):
+    def times_dead(self):
         members = self._members()
         return sum(1 for one, two in zip(members, members[1:]) if one == "2" and two == "1")
 
