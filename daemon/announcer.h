@@ -7,8 +7,9 @@
 
 namespace ternhad {
 
-// Tells the journal of each change, by a line on standard error with a level, and the service manager what
-// state the node is in. For one thread, which may be stuck for as long as the manager is.
+// Logs each state transition to the journal, as a line with a priority on standard error, and
+// updates the service manager's status line. For one thread, which may block for as long as the
+// journal or the manager does.
 class Announcer {
  public:
     Announcer(Health& health, const Shutdown& shutdown)
@@ -17,7 +18,7 @@ class Announcer {
           _reader(_transitions),
           _shutdown(shutdown) {}
 
-    // Body of the thread.
+    // Thread body.
     void run();
 
  private:
@@ -29,7 +30,7 @@ class Announcer {
     Transitions& _transitions;
     Transitions::Reader _reader;
     const Shutdown& _shutdown;
-    std::string _status;  // as the manager knows it
+    std::string _status;  // last status line sent to the manager
     std::string _unsupportedDrbd;
 };
 

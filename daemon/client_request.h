@@ -2,15 +2,16 @@
 
 namespace ternhad {
 
-// The first character of the action that the request asks for, as the library reads it; 0 when there is none.
-// The request has come to `fd` and stays there to be served.
+// Return the first character of the requested action, parsed as the library does; 0 if there is
+// none. Peeks at the request on `fd` and leaves it to be served.
 char actionOf(int fd);
 
-// Reads the request. One that is left unread would reset the connection, and with it a reply.
+// Read and discard the request. Closing a connection with unread data would reset it, and the reply
+// would be lost.
 void discardRequest(int fd);
 
-// Replies why the request is refused. The reply is not JSON: a client that only looks for one takes it for a
-// failure.
+// Send the reason for refusing a request. It is not JSON, so that clients that only parse the reply
+// report a failure.
 void refuse(int fd, const char* reason);
 
 }  // namespace ternhad

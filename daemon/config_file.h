@@ -7,17 +7,17 @@
 
 namespace ternhad {
 
-// The format of the configuration file, a line NAME = VALUE each. Knows in which line each name stands, so
-// that messages about wrong values can tell.
+// Parser of the configuration file, one NAME = VALUE per line. Remembers the line of each name for
+// error messages.
 class ConfigFile : public CLI::ConfigINI {
  public:
     explicit ConfigFile(const CLI::App& app) : _app(app) {}
 
     std::vector<CLI::ConfigItem> from_config(std::istream& input) const override;
 
-    // "FILE:LINE: NAME = VALUE: reason" when `error` is about something in the file, "FILE: reason" when it
-    // is about the file or what it lacks; otherwise empty. `arguments`: of the command line, whose options
-    // win.
+    // Return "FILE:LINE: NAME = VALUE: reason" for an error in the file, "FILE: reason" if the file
+    // cannot be read or lacks a setting, and the empty string for an error on the command line.
+    // `arguments`: the command line, which takes precedence over the file.
     std::string located(const CLI::ParseError& error, const std::vector<std::string>& arguments) const;
 
  private:

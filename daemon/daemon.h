@@ -22,17 +22,19 @@
 
 namespace ternhad {
 
-// The running daemon: its parts and their threads, and what its manager and signals want of it.
+// The running daemon: owns its components and their threads; handles signals and the service
+// manager's watchdog.
 class Daemon {
  public:
-    // Takes over `lock`. `options` outlives the daemon.
+    // Takes ownership of `lock`. `options` must outlive the daemon.
     Daemon(const Options& options, InstanceLock& lock);
 
-    // Runs until SIGTERM or SIGINT and ends within 2 seconds, with the logs moved to disk. Returns the exit
-    // code: 0, or 1 after a message on standard error when a socket or thread could not be had.
+    // Run until SIGTERM or SIGINT, then stop within 2 seconds, with the logs moved to disk. Returns
+    // the exit code: 0, or 1 after a message on standard error if a socket or thread could not be
+    // created.
     //
-    // The calling thread takes SIGTERM, SIGINT, SIGHUP and SIGCHLD, which must not be handled elsewhere;
-    // SIGUSR1 interrupts the threads.
+    // The calling thread handles SIGTERM, SIGINT, SIGHUP and SIGCHLD, which must not be handled
+    // elsewhere; SIGUSR1 interrupts the threads.
     int run();
 
  private:
@@ -57,14 +59,14 @@ class Daemon {
     Reporter _reporter;
     EventStreams _streams;
     ControlServer _controlServer;
-    std::optional<EventStreams> _statusStreams;  // for monitoring without root
+    std::optional<EventStreams> _statusStreams;  // for the status socket, if configured
     std::optional<ControlServer> _statusServer;
     Announcer _announcer;
     Notifier _notifier;
     PeerWatcher _peerWatcher;
     NodeWatcher _nodeWatcher;
     Threads _threads;
-    Threads _eventThread;  // ends last: the others record
+    Threads _eventThread;  // stops last: the others record events
 
     std::optional<std::chrono::microseconds> _watchdog;
     Clock::time_point _nextWatchdog;

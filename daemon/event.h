@@ -8,16 +8,16 @@ namespace ternhad {
 
 using Clock = std::chrono::steady_clock;
 
-// A flag that a thread can wait for, alone or together with sockets. Thread-safe; set() neither blocks nor
-// allocates.
+// A flag that a thread can wait for, alone or together with sockets. Thread-safe; set() neither
+// blocks nor allocates.
 class Event {
  public:
-    // Throws std::system_error when no descriptor is to be had, and std::logic_error after seal().
+    // Throws std::system_error if no descriptor is available, and std::logic_error after seal().
     Event();
     ~Event();
 
-    // Forbids further events. A thread that gets a descriptor table of its own calls this first: there, the
-    // number of a later event would be another file or socket.
+    // Forbid the creation of further events. To be called before a thread isolates its descriptor
+    // table: there, the descriptor number of a later event would refer to another file.
     static void seal() noexcept;
 
     Event(const Event&) = delete;
@@ -25,7 +25,7 @@ class Event {
 
     void set() noexcept;
 
-    // Clears the flag and returns whether it was set.
+    // Clear the flag; return whether it was set.
     bool take() noexcept;
 
     // Readable while the flag is set.
@@ -35,21 +35,22 @@ class Event {
     int _fd;
 };
 
-// The daemon's end, announced to all its threads.
+// Stop request to all threads of the daemon.
 class Shutdown {
  public:
     void request(int exitCode) noexcept;
 
-    // True from the request on: discard the result of a check that it may have interrupted.
+    // True once the stop is requested: discard the result of a check that it may have interrupted.
     bool isRequested() const noexcept { return _isRequested; }
     int exitCode() const noexcept { return _exitCode; }
 
     const Event& event() const noexcept { return _event; }
 
-    // Sleeps until `time`, or until one of `others` is set. False when the daemon ends.
+    // Sleep until `time`, or until one of `others` is set. Returns false once the stop is
+    // requested.
     bool sleepUntil(Clock::time_point time, std::initializer_list<const Event*> others = {}) const noexcept;
 
-    // Sleeps until `event` is set, a day at most. False when the daemon ends.
+    // Sleep until `event` is set, for a day at most. Returns false once the stop is requested.
     bool waitFor(const Event& event) const noexcept;
 
  private:
@@ -58,10 +59,11 @@ class Shutdown {
     std::atomic<int> _exitCode{0};
 };
 
-// When the round after the one planned for `round` begins. Rounds that could not be kept are left out.
+// Return the start of the round after the one scheduled for `round`; rounds already missed are
+// skipped.
 Clock::time_point nextRound(Clock::time_point round, std::chrono::duration<double> interval) noexcept;
 
-// The time from now until `time` for ppoll; 0 when it has passed.
+// Return the time from now until `time` for ppoll; 0 if it has passed.
 timespec timeUntil(Clock::time_point time) noexcept;
 
 }  // namespace ternhad

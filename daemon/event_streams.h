@@ -10,8 +10,8 @@
 
 namespace ternhad {
 
-// Sends each change to the clients that asked for the events, up to 16. For one thread, which waits for none
-// of them: a client that does not read loses its connection.
+// Sends each state transition to the clients that requested events, up to 16. For one thread, which
+// never blocks on a client: a client that does not read is disconnected.
 class EventStreams {
  public:
     EventStreams(Transitions& transitions, const Reporter& reporter, const Shutdown& shutdown)
@@ -21,10 +21,11 @@ class EventStreams {
     EventStreams(const EventStreams&) = delete;
     EventStreams& operator=(const EventStreams&) = delete;
 
-    // Takes over a connection. False when there are too many. Any thread.
+    // Take ownership of a connection. Returns false if there are too many. Callable from any
+    // thread.
     bool add(int fd);
 
-    // Body of the thread.
+    // Thread body.
     void run();
 
  private:
@@ -39,7 +40,7 @@ class EventStreams {
     const Shutdown& _shutdown;
     Event _added;
     std::mutex _mutex;       // guards the next two
-    std::vector<int> _new;   // connections that were not greeted yet
+    std::vector<int> _new;   // connections that have not received the report yet
     std::size_t _count = 0;  // of all connections
     std::vector<int> _clients;
 };

@@ -13,12 +13,12 @@
 
 namespace ternhad {
 
-// Something that happened.
+// An entry of the queue.
 struct Happening {
     enum class Kind {
-        change,    // `flag` has become `value`
-        trouble,   // `text` cannot be done for lack of this node's own means, `error` being the reason
-        recovery,  // ... and can be done again
+        change,    // `flag` has changed to `value`
+        trouble,   // `what` fails for lack of a local resource, with errno `error`
+        recovery,  // `what` succeeds again
         message,   // a line for the daemon log
     };
 
@@ -28,29 +28,30 @@ struct Happening {
     int error = 0;
     const char* file = "";
     int line = 0;
-    const char* what = "";  // of a trouble; with static storage duration
+    const char* what = "";  // of a trouble or recovery; has static storage duration
     std::string text;       // of a message
     std::chrono::system_clock::time_point time;
 };
 
-// The trace of what happens: every change of state passes through here, after the state has changed.
-// Recording only puts a note into a queue of fixed size; one thread writes the notes down and may be stuck in
-// that for as long as a disk is. Thread-safe.
+// Queue of everything that is logged: each state transition is recorded here after it has been
+// stored. Recording only adds an entry to a queue of fixed size; one thread writes the entries to
+// the log and may block for as long as a disk does. Thread-safe.
 class Events {
  public:
     Events() = default;
     Events(const Events&) = delete;
     Events& operator=(const Events&) = delete;
 
-    // Neither block nor allocate. What finds the queue full is lost; how much was lost is logged.
+    // Neither block nor allocate. Entries that find the queue full are lost; their number is
+    // logged.
     void changed(Flag flag, bool value) noexcept;
     void troubleBegan(const char* what, int error) noexcept;
     void troubleEnded(const char* what) noexcept;
 
-    // Use TERNHAD_LOG: it passes the place of its call.
+    // Call it through TERNHAD_LOG, which passes its call site.
     void log(const char* file, int line, std::string text) noexcept;
 
-    // Writes down what is recorded, until end() is called and the queue is empty. Body of one thread.
+    // Write entries to the log until end() is called and the queue is empty. Thread body.
     void run();
     void end() noexcept;
 
@@ -61,7 +62,7 @@ class Events {
     bool pop(Happening& happening, std::size_t& lost);
     void write(const Happening& happening);
 
-    std::mutex _mutex;  // guards the queue; nothing is waited for under it
+    std::mutex _mutex;  // guards the queue; never held while blocking
     std::condition_variable _wakeUp;
     std::array<Happening, CAPACITY> _queue;
     std::size_t _first = 0;
@@ -69,8 +70,8 @@ class Events {
     std::size_t _lost = 0;
     bool _isEnding = false;
 
-    // Its own operation logs a change of the peer's life before it stores it. The daemon's record is changed
-    // at once; this one, which nobody else reads, gives the line.
+    // Status::setRemoteAlive logs a transition before it stores it. The daemon stores it first, in
+    // its own record; this one, which nothing else reads, produces the log line.
     TERN::HA::Daemon::Status _logged;
 };
 

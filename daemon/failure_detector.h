@@ -6,12 +6,12 @@
 
 namespace ternhad {
 
-// Decides whether the peer is alive, from probes and replies alone: times go in, decisions come out. Not
-// thread-safe; allocates in its constructor only.
+// Decides whether the peer is alive from the times of probes and replies alone. Not thread-safe;
+// allocates only in its constructor.
 //
-// The peer is dead when it has not been proven alive for `deadAfter`. A reply proves that it was alive when
-// the probe that it answers was sent. Time in which this process did not run, or could not send for reasons
-// of its own, does not count. Before the first reply the peer is neither alive nor, until the time is up,
+// The peer is dead after `deadAfter` without proof that it is alive. A reply proves that it was
+// alive when its probe was sent. Time in which this process did not run, or could not send for
+// local reasons, does not count. Before the first reply the peer is unknown for that time, then
 // dead.
 class FailureDetector {
  public:
@@ -19,34 +19,35 @@ class FailureDetector {
     using Time = Clock::time_point;
     using Duration = Clock::duration;
 
-    // checkInterval: between two probes while replies come, at most a third of deadAfter.
+    // checkInterval: between two probes while replies arrive, at most a third of deadAfter.
     FailureDetector(Duration checkInterval, Duration deadAfter, Time now);
 
-    // Call first at each wake-up. The time by which it comes later than wakeUpTime() promised is time in
-    // which this process did not run.
+    // To be called first at each wake-up. A delay after wakeUpTime() counts as time in which this
+    // process did not run.
     void wakeUp(Time now) noexcept;
 
-    // When to call wakeUp() next at the latest.
+    // Return the latest time for the next call of wakeUp().
     Time wakeUpTime() const noexcept;
 
-    // Probes that may await their replies at the same time: numbers below this identify them.
+    // Maximum number of probes in flight; they are numbered from 0.
     std::size_t capacity() const noexcept { return _probes.size(); }
     bool isAwaited(std::size_t probe) const noexcept { return _probes[probe].isAwaited; }
 
     bool isProbeDue() const noexcept { return _now >= probeTime(); }
 
-    // The number of the next probe. A reply to an earlier probe of that number counts no more.
+    // Return the number of the next probe. A reply to the previous probe of that number no longer
+    // counts.
     std::size_t nextProbe() const noexcept { return _next; }
 
-    // The probe nextProbe() has left this node now.
+    // Probe nextProbe() has been sent.
     void probeSent() noexcept;
 
-    // A probe was due and could not leave for lack of this node's own means.
+    // A probe was due and could not be sent for lack of a local resource.
     void probeNotSent() noexcept;
 
     void replyReceived(std::size_t probe) noexcept;
 
-    // The decision as of the last wakeUp() and the replies since.
+    // State as of the last wakeUp() and the replies since.
     bool isPeerAlive() const noexcept { return _isProven && !isPeerDead(); }
     bool isPeerDead() const noexcept { return _now - _lastProof >= _deadAfter; }
 
@@ -61,15 +62,15 @@ class FailureDetector {
 
     Duration _checkInterval;
     Duration _deadAfter;
-    Duration _fastInterval;  // between two probes once one misses its reply
-    Duration _missedAfter;   // without a reply for so long a probe is missed
+    Duration _fastInterval;  // between two probes while one is missed
+    Duration _missedAfter;   // a probe without a reply for this time is missed
     std::vector<Probe> _probes;
     std::size_t _next = 0;
     Time _now;
     Time _lastAttempt;
-    Time _lastProof;  // of life; the beginning, before the first one
+    Time _lastProof;  // that the peer is alive; initially the start
     bool _isProven = false;
-    bool _isBlocked = false;  // the last attempt to send failed
+    bool _isBlocked = false;  // the last probe could not be sent
 };
 
 }  // namespace ternhad

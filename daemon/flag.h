@@ -6,11 +6,11 @@
 
 namespace ternhad {
 
-// What can change about the two nodes.
+// State of the two nodes whose transitions are events.
 enum class Flag { peerAlive, peerRebooting, peerResync, peerDiskErrors, drbdConnected, resync, diskErrors };
 constexpr std::size_t FLAGS = 7;
 
-// What a flag is called in events: itself, and what holds when it is set or clear.
+// Names of a flag in events: its own, and those of its two conditions.
 struct FlagName {
     const char* name;
     const char* set;
@@ -31,7 +31,7 @@ inline const FlagName& nameOf(Flag flag) {
     return NAMES.at(static_cast<std::size_t>(flag));
 }
 
-// Whether only the peer's replies tell of it.
+// Whether the flag is known only from the peer's replies.
 inline bool isReportedByPeer(Flag flag) {
     return flag == Flag::peerResync || flag == Flag::peerDiskErrors;
 }

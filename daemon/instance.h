@@ -4,7 +4,7 @@
 
 namespace ternhad {
 
-// The lock that one daemon of this machine holds, in /run/ternha/ternhad.lock.
+// Lock of the running daemon, /run/ternha/ternhad.lock: one per machine.
 class InstanceLock {
  public:
     InstanceLock() = default;
@@ -15,12 +15,13 @@ class InstanceLock {
 
     enum class Result { taken, isRunning, failed };
 
-    // Takes the lock; does not wait. `isRunning`: owner() has it. `failed`: errno tells why.
+    // Take the lock without blocking. `isRunning`: owner() holds it. `failed`: errno has the
+    // reason.
     Result take();
 
     pid_t owner() const { return _owner; }
 
-    // Leaves the lock to a thread whose descriptor table is its own.
+    // Leave the lock to a thread that has its own descriptor table.
     void handOver();
 
  private:

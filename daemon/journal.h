@@ -4,11 +4,11 @@
 
 namespace ternhad {
 
-// As syslog(3) numbers them.
+// Priorities of syslog(3).
 enum class Level { warning = 4, notice = 5 };
 
-// Writes a line to standard error, for the service's journal; with the level in front where that is what
-// standard error is. Blocks while the reader does not read.
+// Write a line to standard error, prefixed with the priority if that is the journal. Blocks while
+// the reader does not read.
 void writeJournal(Level level, const std::string& text);
 
 }  // namespace ternhad

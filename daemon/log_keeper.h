@@ -14,10 +14,11 @@
 
 namespace ternhad {
 
-// The daemon's end of the log keeper: the process that moves, rotates and records, so that a disk or program
-// that hangs hangs there. One request is under way at a time. A keeper that dies is started again, one that
-// hangs is left behind and replaced. Blocks in finish() only. Call from the thread that made it: the keeper
-// dies with that thread.
+// The daemon's side of the log keeper, the process that moves and rotates the logs and takes
+// snapshots, so that a hung disk or program hangs only that process. One request is in progress at
+// a time. A keeper that exits is restarted; one that hangs is killed, abandoned and replaced. Only
+// finish() blocks. To be called from the thread that created it: the keeper is killed when that
+// thread ends.
 class LogKeeper {
  public:
     LogKeeper(const Options& options, Health& health, Events& events);
@@ -26,18 +27,19 @@ class LogKeeper {
     LogKeeper(const LogKeeper&) = delete;
     LogKeeper& operator=(const LogKeeper&) = delete;
 
-    // Makes the process. The first time before there are threads and sockets. False with errno.
+    // Start the process; the first time before any thread or socket exists. Returns false with
+    // errno.
     bool start();
 
     void wantSnapshot() { _isSnapshotWanted = true; }
     void wantRotation() { _isRotationWanted = true; }
 
-    // Poll this, and call work() when it is readable, after SIGCHLD, and at workTime().
+    // Poll this descriptor and call work() when it is readable, after SIGCHLD, and at workTime().
     int fd() const { return _replies; }
     void work();
     Clock::time_point workTime() const;
 
-    // Has the logs moved a last time and ends the process, both by `deadline`.
+    // Let the keeper move the logs a last time and exit, both by `deadline`.
     void finish(Clock::time_point deadline);
 
  private:
@@ -56,7 +58,7 @@ class LogKeeper {
     std::string _program;
 
     pid_t _process = -1;
-    std::vector<pid_t> _leftBehind;  // killed, and not gone yet
+    std::vector<pid_t> _leftBehind;  // killed, but still in the kernel
     int _requests = -1;
     int _replies = -1;
     std::optional<Clock::time_point> _busySince;
@@ -67,20 +69,19 @@ class LogKeeper {
     bool _isRotationWanted = false;
 };
 
-// The requests, one packet each, to the keeper's standard input. The keeper writes a byte to its standard
-// output when it has done one.
+// Requests, one packet each, on the keeper's standard input. The keeper writes a byte to its
+// standard output for each completed one.
 enum class LogRequest : char {
-    move = 'm',      // the buffered lines to disk; rotate what has grown
+    move = 'm',      // move buffered lines to disk; rotate a log that reached its limit
     rotate = 'r',    // the same, and rotate both logs
     snapshot = 's',  // followed by the status as JSON: record it, processes, file systems and memory
     finish = 'q',    // move and exit
 };
 
-// The argument by which this program becomes the keeper; the next one is the size of a log at which it is
-// rotated.
+// Argument that makes this program the keeper, followed by the log size that triggers rotation.
 constexpr char LOG_KEEPER[] = "--log-keeper";
 
-// The keeper. Returns the exit code.
+// Main function of the keeper. Returns the exit code.
 int keepLogs(std::int64_t rotateSize);
 
 }  // namespace ternhad

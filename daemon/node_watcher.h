@@ -10,20 +10,20 @@
 
 namespace ternhad {
 
-// Watches this node: DRBD, md arrays, disks and the replication link. For two threads, since a measurement of
-// the link takes up to 10 seconds.
+// Monitors this node: DRBD, md arrays, disks and the replication link. For two threads, because
+// measuring the link takes up to 10 seconds.
 class NodeWatcher {
  public:
     NodeWatcher(const Options& options, Health& health, Events& events, const Shutdown& shutdown,
                 Progress& progress)
         : _options(options), _health(health), _events(events), _shutdown(shutdown), _progress(progress) {}
 
-    // The bodies of the threads.
+    // Thread bodies.
     void runChecks();
     void runMeasurements();
 
  private:
-    // What the kernel shows of something that this node may not have.
+    // Kernel files of a feature that this node may lack.
     struct KernelFiles {
         const char* pattern;
         const char* what;

@@ -12,8 +12,8 @@
 
 namespace ternhad {
 
-// Runs the program of the option `notify` at each change, one at a time and each for up to 30 seconds. For
-// one thread; nothing else waits for it.
+// Runs the `notify` program at each state transition, one at a time, for up to 30 seconds each. For
+// one thread; nothing waits for it.
 class Notifier {
  public:
     Notifier(const Options& options, Health& health, Events& events, const Shutdown& shutdown)
@@ -23,7 +23,7 @@ class Notifier {
           _events(events),
           _shutdown(shutdown) {}
 
-    // Body of the thread.
+    // Thread body.
     void run();
 
  private:

@@ -7,7 +7,7 @@
 
 namespace ternhad {
 
-// Runs a step of the daemon. False when the step fails for lack of memory or another resource.
+// Run a step of the daemon. Returns false if it fails for lack of memory or another resource.
 template <typename Step>
 bool attempt(const Step& step) noexcept {
     try {
@@ -19,8 +19,8 @@ bool attempt(const Step& step) noexcept {
     }
 }
 
-// The passes of one thread. A failed one costs only its own results; when all fail for 10 seconds, what the
-// thread maintains is stale: abort rather than report it.
+// Passes of one thread. A failed pass loses only its own results. When all fail for 10 seconds, the
+// state that the thread maintains is stale: abort rather than report it.
 class Passes {
  public:
     template <typename Pass>

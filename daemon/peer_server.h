@@ -13,21 +13,21 @@
 
 namespace ternhad {
 
-// Replies to the peer's requests. Its one thread waits for nothing but requests: it opens no file but the
-// kernel's reboot trigger, and logs through Events.
+// Replies to the peer's requests. Its thread blocks only on its socket: it opens no file except the
+// reboot trigger, and logs through Events.
 class PeerServer {
  public:
     PeerServer(Health& health, Events& events, Reboot& reboot, const Shutdown& shutdown, Progress& progress)
         : _health(health), _events(events), _reboot(reboot), _shutdown(shutdown), _progress(progress) {}
 
-    // Body of the thread. Binds localIP(""), port HA_PEER_PORT.
+    // Thread body. Binds localIP(""), port HA_PEER_PORT.
     void run() noexcept;
 
-    // Waits for the thread to have its port. Returns 0, or the error number when it has none; the thread ends
-    // then. Call once.
+    // Wait until the thread has bound its port. Returns 0, or errno on failure; the thread then
+    // ends. To be called once.
     int waitForStart() { return _started.get_future().get(); }
 
-    // After that: the thread has a descriptor table of its own.
+    // Whether the thread has its own descriptor table; valid after waitForStart().
     bool isIsolated() const noexcept { return _isIsolated; }
 
  private:
@@ -46,7 +46,7 @@ class PeerServer {
     Progress& _progress;
     std::promise<int> _started;
     bool _isIsolated = false;
-    sockaddr_in _orderer = {};  // of a reboot
+    sockaddr_in _orderer = {};  // who requested the reboot
     bool _isInTrouble = false;
 };
 

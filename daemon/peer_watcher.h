@@ -7,13 +7,13 @@
 
 namespace ternhad {
 
-// Asks a peer that is alive for its disks, its resync and, once, its host name. For one thread.
+// Requests disks, resync and, once, the hostname of a peer that is alive. For one thread.
 class PeerWatcher {
  public:
     PeerWatcher(const Options& options, Health& health, Events& events, const Shutdown& shutdown)
         : _options(options), _health(health), _events(events), _shutdown(shutdown) {}
 
-    // Body of the thread.
+    // Thread body.
     void run();
 
  private:

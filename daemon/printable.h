@@ -4,7 +4,8 @@
 
 namespace ternhad {
 
-// `text` for a log or a terminal: without its line end, and with '?' for other control characters.
+// Return `text` for a log or a terminal: without its newline, other control characters replaced by
+// '?'.
 inline std::string printable(std::string text) {
     while (!text.empty() && (text.back() == '\n' || text.back() == '\r')) {
         text.pop_back();

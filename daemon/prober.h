@@ -14,8 +14,8 @@
 
 namespace ternhad {
 
-// Sends the liveness probes and stores whether the peer is alive. Its one thread waits for nothing but its
-// own sockets: it opens no file, starts no program or thread, and logs through Events.
+// Sends the liveness probes and stores whether the peer is alive. Its thread blocks only on its own
+// sockets: it opens no file, starts no program or thread, and logs through Events.
 class Prober {
  public:
     Prober(const Options& options, Health& health, Events& events, const Shutdown& shutdown,
@@ -26,11 +26,11 @@ class Prober {
     Prober(const Prober&) = delete;
     Prober& operator=(const Prober&) = delete;
 
-    // Body of the thread.
+    // Thread body.
     void run() noexcept;
 
-    // Waits for the thread to have its sockets. Returns 0, or the error number when it has none; the thread
-    // ends then. Call once.
+    // Wait until the thread has opened its sockets. Returns 0, or errno on failure; the thread then
+    // ends. To be called once.
     int waitForStart() { return _started.get_future().get(); }
 
  private:

@@ -6,14 +6,14 @@
 
 namespace ternhad {
 
-// Passes of the threads that the watchdog watches.
+// Progress of the threads that the watchdog covers.
 class Progress {
  public:
     enum Thread { prober, peerServer, controlServer, nodeWatcher, COUNT };
 
     void made(Thread thread) noexcept { _isMade.at(thread) = true; }
 
-    // True once each thread has made progress since this was true last.
+    // Return true if each thread has made progress since this last returned true.
     bool isComplete() noexcept {
         for (const auto& isMade : _isMade) {
             if (!isMade) {

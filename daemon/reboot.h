@@ -6,26 +6,26 @@
 
 namespace ternhad {
 
-// Carries out the peer's order to reboot this node: moves the logs, flushes the file systems and has the
-// kernel restart. The last is done after 5 seconds even when the first two hang: the peer takes over then.
+// Reboots this node at the peer's request: moves the logs, flushes the file systems and writes the
+// reboot trigger; the last step follows after 5 seconds even if the others hang, because the peer
+// takes over then.
 class Reboot {
  public:
     Reboot(Events& events, const Shutdown& shutdown) : _events(events), _shutdown(shutdown) {}
 
-    // Body of the thread that moves and flushes.
+    // Body of the thread that moves the logs and flushes.
     void flush();
 
-    // The rest is for the thread that serves the peer, and waits for nothing.
+    // The following functions are for the thread that serves the peer; they do not block.
 
     void order() noexcept;
     bool isOrdered() const noexcept { return _isOrdered; }
 
-    // While a reboot is ordered: call complete() at this time, or when the event is set.
+    // While a reboot is requested: call complete() at this time, or when the event is set.
     Clock::time_point deadline() const noexcept { return _deadline; }
     const Event& flushed() const noexcept { return _flushed; }
 
-    // Has the kernel restart when it is time. False when it is and the kernel cannot be told; the order is
-    // given up then.
+    // Write the trigger if it is time. Returns false if that fails; the request is then dropped.
     bool complete() noexcept;
 
  private:
@@ -37,15 +37,16 @@ class Reboot {
     Clock::time_point _deadline;
 };
 
-// The peer checks whose library versions would read or write files in the thread that serves the peer.
+// Replacements for the two peer checks whose library versions access files in the thread that
+// serves the peer.
 
-// Hands the order to a Reboot.
+// Passes the request to a Reboot.
 class RebootCheck : public TERN::HA::Daemon::RebootRemote {
  public:
     std::string handle(TERN::HA::Daemon::Status& status) override;
 };
 
-// Replies with the name that is known.
+// Replies with the name that the checks thread has read.
 class HostnameCheck : public TERN::HA::Daemon::GetRemoteHostname {
  public:
     std::string handle(TERN::HA::Daemon::Status& status) override;
@@ -53,8 +54,8 @@ class HostnameCheck : public TERN::HA::Daemon::GetRemoteHostname {
 
 class Health;
 
-// Puts these checks into the registry in place of the library's. Call before there are threads; both objects
-// must outlive the peer server.
+// Replace the library's checks in the registry by these. To be called before threads are started;
+// both objects must outlive the peer server.
 void replacePeerChecks(Reboot& reboot, const Health& health);
 
 }  // namespace ternhad

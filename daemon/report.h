@@ -10,14 +10,14 @@
 
 namespace ternhad {
 
-// Makes the report, version 1, for clients of the control socket.
+// Builds version 1 of the report for clients of the control socket.
 class Reporter {
  public:
     Reporter(const Options& options, Health& health) : _options(options), _health(health) {}
 
     Json::Value report() const;
 
-    // A line for each change, and its JSON; the same of changes that were lost before one.
+    // Return the JSON of an event, and of events that were lost before one.
     static Json::Value event(const Transition& transition);
     static Json::Value lostEvents(std::uint64_t count);
 

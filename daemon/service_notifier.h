@@ -4,25 +4,23 @@
 #include <optional>
 #include <string>
 
-// Tells the service manager that started the daemon what state it is in. Without one, or in a build without
-// libsystemd, nothing happens. Each function may be called from any thread, and does not block but for a
-// datagram to a local socket.
+// Notifications to the service manager (systemd). Without one, or in a build without libsystemd,
+// they do nothing. Callable from any thread; they block only for a datagram to a local socket.
 namespace ternhad {
 
-// The peer and the control tool are served from now on.
+// Report readiness: peer and clients are served.
 void notifyReady();
 
-// The daemon is ending on purpose.
+// Report the stop of the daemon.
 void notifyStopping();
 
-// One line for people: what `systemctl status` shows.
+// Set the status line that `systemctl status` shows.
 void notifyStatus(const std::string& status);
 
-// How often at least notifyAlive() is expected; nothing when nobody watches. Half of it is a good period.
+// Return the watchdog's interval, or nothing without a watchdog. Call notifyAlive() at half of it.
 std::optional<std::chrono::microseconds> watchdogInterval();
 
-// The daemon's threads make progress. A daemon that leaves this out for longer than the interval is ended
-// with SIGABRT and started again.
+// Reset the watchdog, which otherwise ends the daemon with SIGABRT and restarts it.
 void notifyAlive();
 
 }  // namespace ternhad

@@ -9,17 +9,18 @@
 
 namespace ternhad {
 
-// The daemon's threads. They end when Shutdown is requested; what one is stuck in cannot keep the others.
+// The daemon's threads. They end when Shutdown is requested; one that hangs does not keep the
+// others.
 class Threads {
  public:
-    // Sets up SIGUSR1, which interrupts the calls that a thread waits in.
+    // Set up SIGUSR1, which interrupts blocking system calls.
     Threads();
 
-    // `name`: at most 15 characters, for ps and top.
+    // name: at most 15 characters, for ps and top.
     void start(const char* name, std::function<void()> body);
 
-    // Interrupts all threads, ends the programs that they wait for, and joins them. False when some have not
-    // ended by `deadline`: the process can only exit then.
+    // Interrupt all threads, terminate the programs that they wait for, and join them. Returns
+    // false if some have not ended by `deadline`: the process can only exit then.
     bool join(Clock::time_point deadline);
 
  private:
@@ -30,14 +31,14 @@ class Threads {
     std::vector<Worker> _workers;
 };
 
-// Gives the calling thread a descriptor table of its own. What is open stays open in it under the same
-// number; what is opened from now on is this thread's alone. A thread that hangs in the kernel keeps a killed
-// process's table, and so its sockets and locks: not those of a table that no hanging thread uses. False
-// where this is not permitted.
+// Give the calling thread its own descriptor table. Open descriptors keep their numbers; new ones
+// belong to this thread alone. A thread that hangs in the kernel keeps the descriptor table of a
+// killed process alive, and with it sockets and locks; tables of other threads are released.
+// Returns false if this is not permitted.
 bool isolateDescriptors() noexcept;
 
-// Puts the calling thread before all that are not real-time threads, as far as this is permitted. Probes come
-// before replies, of which anybody on the link may request any number.
+// Give the calling thread real-time priority, if permitted. Probes precede replies, of which anyone
+// on the link can request any number.
 enum class Priority { probes, replies };
 void raisePriority(Priority priority) noexcept;
 

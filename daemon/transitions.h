@@ -13,7 +13,8 @@
 
 namespace ternhad {
 
-// A change of a flag. It changes from unknown by its first check, and by the first after it was stale.
+// A state transition: a change of a flag. The first check, and the first after the flag was stale,
+// change it from unknown.
 struct Transition {
     Flag flag = Flag::peerAlive;
     std::optional<bool> old;
@@ -21,8 +22,8 @@ struct Transition {
     std::chrono::system_clock::time_point time;
 };
 
-// What the flags are, since when, and how often they have changed; the latest changes for those who follow
-// them. Thread-safe.
+// Values of the flags, since when, and how often they changed; the latest transitions for their
+// readers. Thread-safe.
 class Transitions {
  public:
     using Time = std::chrono::system_clock::time_point;
@@ -30,7 +31,7 @@ class Transitions {
     struct State {
         std::optional<bool> value;  // none before the first check
         Time since;
-        Time checked;               // when a check has found this value last
+        Time checked;               // when a check last confirmed this value
         std::uint64_t changes = 0;  // after the first check
         bool isStale = false;       // the value is the last known one
     };
@@ -41,13 +42,13 @@ class Transitions {
     Transitions(const Transitions&) = delete;
     Transitions& operator=(const Transitions&) = delete;
 
-    // Records what a check of `flag` found. Neither blocks nor allocates. What the peer reports is stale from
-    // its death until it reports again.
+    // Record the result of a check of `flag`. Neither blocks nor allocates. Flags reported by the
+    // peer are stale from the moment it is dead until it reports them again.
     void found(Flag flag, bool value) noexcept;
 
     State state(Flag flag) const noexcept;
 
-    // Follows the changes from its construction on. Belongs to one thread.
+    // Receives the transitions from its construction on. For one thread.
     class Reader {
      public:
         explicit Reader(Transitions& transitions);
@@ -56,11 +57,11 @@ class Transitions {
         Reader(const Reader&) = delete;
         Reader& operator=(const Reader&) = delete;
 
-        // Set when there may be more.
+        // Set when next() may return a transition.
         Event& event() noexcept { return _event; }
 
-        // The next change; nothing when there is none. A reader that is too slow loses the oldest ones:
-        // `lost` becomes their number.
+        // Return the next transition, or nothing. A reader that is too slow loses the oldest ones;
+        // `lost` is set to their number.
         std::optional<Transition> next(std::uint64_t& lost) noexcept;
 
      private:
@@ -84,7 +85,7 @@ class Transitions {
     bool isStale(Flag flag, const Entry& entry, Clock::time_point now) const noexcept;
     Entry& entryOf(Flag flag) noexcept { return _entries[static_cast<std::size_t>(flag)]; }
 
-    mutable std::mutex _mutex;  // nothing is waited for under it
+    mutable std::mutex _mutex;  // never held while blocking
     std::array<Entry, FLAGS> _entries;
     std::array<Transition, CAPACITY> _latest;
     std::uint64_t _count = 0;

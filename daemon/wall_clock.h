@@ -5,7 +5,8 @@
 
 namespace ternhad {
 
-// The wall clock, asked of the kernel: the standard library's own fails after 2038 on 32-bit machines.
+// Return the wall clock, read from the kernel: that of the standard library fails after 2038 on
+// 32-bit machines.
 inline std::chrono::system_clock::time_point wallClock() noexcept {
     timespec now = {};
     (void)clock_gettime(CLOCK_REALTIME, &now);  // cannot fail
