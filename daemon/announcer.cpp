@@ -12,7 +12,7 @@ namespace ternhad {
 
 namespace {
 
-constexpr auto REFRESH = std::chrono::seconds(5);  // what becomes stale is no change
+constexpr auto REFRESH = std::chrono::seconds(5);  // values become stale without a transition
 
 std::string timeText(std::chrono::system_clock::time_point time) {
     const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
@@ -63,7 +63,7 @@ void Announcer::announceDrbd() {
     _unsupportedDrbd = std::move(version);
 }
 
-// The peer's state, whatever is wrong beside it, and what was when it was last known.
+// Return the state of the peer and all problems, or the last known ones.
 std::string Announcer::summary() const {
     const Transitions::State peer = _transitions.state(Flag::peerAlive);
     std::string text = "peer unknown";

@@ -11,7 +11,7 @@ namespace ternhad {
 
 namespace {
 
-constexpr std::size_t REQUEST_SIZE = 2096;  // as much as the library reads
+constexpr std::size_t REQUEST_SIZE = 2096;  // the library reads as much
 
 }  // namespace
 

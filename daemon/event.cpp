@@ -42,7 +42,7 @@ void Event::seal() noexcept {
 
 void Event::set() noexcept {
     const std::uint64_t one = 1;
-    // Fails only when the flag is set 2^64 - 2 times over.
+    // Fails only at a count of 2^64 - 2.
     [[maybe_unused]] const ssize_t written = write(_fd, &one, sizeof one);
 }
 

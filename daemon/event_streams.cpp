@@ -85,7 +85,7 @@ void EventStreams::greetNewClients() {
     _clients.insert(_clients.end(), added.begin(), added.end());
 }
 
-// Closes the connection of a client that does not read, and marks it so.
+// Send `line`; close the connection of a client that does not read.
 void EventStreams::sendTo(int& fd, const std::string& line) {
     if (fd >= 0 && send(fd, line.data(), line.size(), MSG_NOSIGNAL | MSG_DONTWAIT) !=
                        static_cast<ssize_t>(line.size())) {
@@ -102,7 +102,7 @@ void EventStreams::wait() {
     poll(waits.data(), waits.size(), -1);
 }
 
-// Whatever a client sends now ends its connection, as its leaving does.
+// Anything that a client sends ends its connection, as a disconnect does.
 void EventStreams::dropClosedClients() {
     for (int& fd : _clients) {
         pollfd state = {fd, POLLIN, 0};

@@ -9,14 +9,15 @@ FailureDetector::FailureDetector(Duration checkInterval, Duration deadAfter, Tim
       _deadAfter(deadAfter),
       _fastInterval(deadAfter / 20),
       _missedAfter(deadAfter / 10),
-      // Those that go out before the first is missed, then the fast ones until the time is up, and a few.
+      // Probes sent before the first one is missed, then those at the fast interval until
+      // `deadAfter`, and some to spare.
       _probes(static_cast<std::size_t>(_missedAfter / checkInterval + deadAfter / _fastInterval + 4)),
       _now(now),
       _lastAttempt(now - checkInterval),
       _lastProof(now) {}
 
 void FailureDetector::wakeUp(Time now) noexcept {
-    // A little lateness is the ordinary delay of a busy machine.
+    // Ignore small delays, which are normal on a busy machine.
     const Time latest = wakeUpTime() + _fastInterval;
     const Duration elapsed = now - _now;
     if (_isBlocked) {
@@ -38,7 +39,7 @@ void FailureDetector::discount(Duration time) noexcept {
 }
 
 FailureDetector::Time FailureDetector::wakeUpTime() const noexcept {
-    // While blocked, no time counts that could be up.
+    // While blocked, no time counts.
     return _isBlocked || isPeerDead() ? probeTime() : std::min(probeTime(), _lastProof + _deadAfter);
 }
 
@@ -47,7 +48,7 @@ FailureDetector::Time FailureDetector::probeTime() const noexcept {
         return _lastAttempt + _fastInterval;
     }
     const Time regular = _lastAttempt + _checkInterval;
-    Time missed = Time::max();  // when the earliest probe was missed, or will be
+    Time missed = Time::max();  // when the earliest probe is missed
     for (const Probe& probe : _probes) {
         if (probe.isAwaited) {
             missed = std::min(missed, probe.sent + _missedAfter);
@@ -79,7 +80,7 @@ void FailureDetector::replyReceived(std::size_t probe) noexcept {
     _lastProof = _isProven ? std::max(_lastProof, proof) : proof;
     _isProven = true;
     for (Probe& other : _probes) {
-        other.isAwaited = other.isAwaited && other.sent > proof;  // earlier ones can prove nothing any more
+        other.isAwaited = other.isAwaited && other.sent > proof;  // earlier probes prove nothing new
     }
 }
 

@@ -21,7 +21,8 @@ void Health::setPeerAlive(bool isAlive) noexcept {
     _events.changed(Flag::peerAlive, isAlive);
 }
 
-// Not when it is found alive: one that went down is, until `dead-after` has passed.
+// Cleared by a reply, not by the alive bit: that stays set for `dead-after` after the peer went
+// down.
 void Health::peerReplied() noexcept {
     _findings.peerReplied();
     if ((_status.getRemoteNodeState() & NodeRebooting) != 0) {
@@ -36,7 +37,7 @@ void Health::set(Flag flag, bool value) noexcept {
         return;
     }
     if (value && flag != Flag::drbdConnected) {
-        _snapshotWanted.set();  // a bad time for a failover begins
+        _snapshotWanted.set();  // a failover is unsafe from now on
     }
     _events.changed(flag, value);
 }

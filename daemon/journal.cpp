@@ -9,7 +9,7 @@ namespace ternhad {
 
 namespace {
 
-// systemd names what it connected standard error to as DEVICE:INODE.
+// systemd sets JOURNAL_STREAM to the DEVICE:INODE of standard error.
 bool isJournal() {
     const char* const stream = std::getenv("JOURNAL_STREAM");
     struct stat info = {};
@@ -23,7 +23,7 @@ void writeJournal(Level level, const std::string& text) {
     const std::string prefix =
         isJournal() ? '<' + std::to_string(static_cast<int>(level)) + '>' : "ternhad: ";
     const std::string line = prefix + text + '\n';
-    // In one piece; without a reader there is nobody to tell.
+    // Write in one piece; ignore errors, which have nowhere to go.
     [[maybe_unused]] const ssize_t written = write(STDERR_FILENO, line.data(), line.size());
 }
 

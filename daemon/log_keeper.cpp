@@ -20,9 +20,9 @@ namespace {
 
 constexpr auto RESTART_DELAY = std::chrono::seconds(1);
 constexpr auto HANGS_AFTER = std::chrono::seconds(60);
-constexpr std::int64_t SLOWEST_XZ = 100000;  // bytes in a second; added for a large log
+constexpr std::int64_t SLOWEST_XZ = 100000;  // bytes per second; extends the time limit for a large log
 constexpr std::size_t MOST_LEFT_BEHIND = 4;
-constexpr auto GRACE = std::chrono::milliseconds(500);  // at the end, for what is under way
+constexpr auto GRACE = std::chrono::milliseconds(500);  // at the stop, for the request in progress
 constexpr char STARTING[] = "start the log keeper";
 
 Clock::duration toDuration(Seconds seconds) {
@@ -35,7 +35,7 @@ std::string statusText(TERN::HA::Daemon::Status& status) {
     return Json::writeString(builder, status.toJson());
 }
 
-// What the child is started with: none of this process's signal handling, and nothing open but the pipes and
+// Spawn attributes of the child: default signal handling, no descriptors except the pipes and
 // standard error.
 class Spawn {
  public:
@@ -50,7 +50,7 @@ class Spawn {
         posix_spawnattr_init(&_attributes);
         posix_spawnattr_setsigmask(&_attributes, &none);
         posix_spawnattr_setsigdefault(&_attributes, &all);
-        posix_spawnattr_setpgroup(&_attributes, 0);  // with the programs that it runs
+        posix_spawnattr_setpgroup(&_attributes, 0);  // together with its programs
         posix_spawnattr_setflags(&_attributes,
                                  POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETPGROUP);
     }
@@ -63,7 +63,7 @@ class Spawn {
     Spawn(const Spawn&) = delete;
     Spawn& operator=(const Spawn&) = delete;
 
-    // The process, or -1 with errno.
+    // Return the process, or -1 with errno.
     pid_t run(const std::string& program, const std::string& rotateSize) const {
         const std::array<const char*, 4> argv = {"ternhad", LOG_KEEPER, rotateSize.c_str(), nullptr};
         pid_t process = -1;
@@ -210,7 +210,7 @@ void LogKeeper::sendNext() {
 void LogKeeper::finish(Clock::time_point deadline) {
     takeReply();
     if (_process >= 0 && _busySince && !isDoneBy(std::min(deadline, Clock::now() + GRACE))) {
-        leaveBehind(SIGTERM);  // xz removes what it has half done
+        leaveBehind(SIGTERM);  // xz removes its incomplete output
     }
     if ((_process >= 0 || start()) && send(std::string(1, static_cast<char>(LogRequest::finish)))) {
         isDoneBy(deadline);
@@ -230,7 +230,7 @@ bool LogKeeper::isDoneBy(Clock::time_point deadline) {
         if (ppoll(&wait, 1, &rest, nullptr) > 0) {
             takeReply();
             if ((wait.revents & POLLIN) == 0) {
-                return false;  // it has died
+                return false;  // it has exited
             }
         }
     }

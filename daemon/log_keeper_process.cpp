@@ -24,13 +24,13 @@ using TERN::HA::Daemon::recordLog;
 namespace {
 
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-// The memory of a sanitizer counts, too, and is more than any limit.
+// A sanitizer's memory counts, too, and exceeds any limit.
 constexpr rlim_t SNAPSHOT_MEMORY = RLIM_INFINITY;
 #else
 constexpr rlim_t SNAPSHOT_MEMORY = 64UL << 20;  // bytes
 #endif
 
-// Moves a log to disk and archives it when it has grown.
+// Move a log to disk; rotate it if it has reached its limit.
 class Mover {
  public:
     Mover(DaemonLog& log, std::int64_t rotateSize) : _log(log), _rotateSize(rotateSize) {}
@@ -39,7 +39,8 @@ class Mover {
         _log.writeLogToDisk();
         if (rotateNow || _log.size() >= _nextRotation) {
             _log.rotate();
-            // A log that could not be compressed is still there: every further attempt costs an archive.
+            // If the compression failed, the log stays large, and each further attempt drops an
+            // archive.
             _nextRotation = _log.size() + _rotateSize;
         }
     }
@@ -57,7 +58,7 @@ void limitMemory(rlim_t bytes) {
     setrlimit(RLIMIT_DATA, &limit);
 }
 
-// What does not fit the memory is left out.
+// Skip a snapshot that does not fit into the memory limit.
 void recordSnapshot(const std::string& status) {
     limitMemory(SNAPSHOT_MEMORY);
     attempt([&status] { recordLog->set("\n" + status); });
@@ -87,7 +88,7 @@ int keepLogs(std::int64_t rotateSize) {
             continue;
         }
         if (size <= 0) {
-            return 0;  // the daemon closed its end
+            return 0;  // the daemon closed the pipe
         }
         const auto kind = static_cast<LogRequest>(request[0]);
         if (kind == LogRequest::snapshot) {

@@ -37,7 +37,7 @@ void NodeWatcher::runChecks() {
     } while (_shutdown.sleepUntil(next));
 }
 
-// Logs once when the files are missing, and once when they have appeared.
+// Log once when the files are missing, and once when they appear.
 bool NodeWatcher::isThere(KernelFiles& files) {
     glob_t found = {};
     const bool areThere = glob(files.pattern, GLOB_NOSORT, nullptr, &found) == 0;
@@ -53,7 +53,7 @@ bool NodeWatcher::isThere(KernelFiles& files) {
     return areThere;
 }
 
-// What is not there gives the result that its check would give, but not a line in the log each time.
+// Skip a check whose files are missing: same result, but no log line in each round.
 void NodeWatcher::check() {
     checkDrbd();
     _health.set(Flag::resync, isThere(_arrays) && TERN::HA::Daemon::isMDResync());
@@ -97,7 +97,7 @@ void NodeWatcher::runMeasurements() {
     } while (_shutdown.sleepUntil(next));
 }
 
-// ifconfig lists no other.
+// ifconfig -s lists only interfaces that are up.
 bool NodeWatcher::isInterfaceUp() {
     const int fd = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
     ifreq request = {};
@@ -109,12 +109,12 @@ bool NodeWatcher::isInterfaceUp() {
 
 void NodeWatcher::measure(TERN::HA::Daemon::InterfaceChecker& interface) {
     float rate = 0;
-    // Outside of 0 to 1 the counters were reset, or the interface went down meanwhile.
+    // Outside of 0 to 1, the counters were reset or the interface went down.
     const bool isMeasured = isInterfaceUp() && interface.networkNonOkRate(rate) && rate >= 0 && rate <= 1;
     _health.findings().setNonOkRate(isMeasured ? std::optional<double>(rate) : std::nullopt);
     _health.status().heartbeatPacketFailRate = isMeasured ? rate : 0;
 
-    // A ping without a reply takes 10 seconds and shows nothing new.
+    // Do not ping a dead peer: it takes 10 seconds and yields nothing.
     const float latency = _health.isPeerAlive() ? TERN::HA::Daemon::heartbeatLatency() : 0;
     if (!_shutdown.isRequested()) {
         _health.status().heartbeatLatency = latency;

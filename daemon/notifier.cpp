@@ -19,7 +19,8 @@ namespace {
 constexpr auto LIMIT = std::chrono::seconds(30);
 constexpr auto STEP = std::chrono::milliseconds(50);
 
-// The daemon's environment, without its manager's means, and the change.
+// Return the daemon's environment without the variables of the service manager, and with those of
+// the transition.
 std::vector<std::string> environmentOf(const Transition& transition, const std::string& peer) {
     std::vector<std::string> environment;
     for (char** variable = environ; *variable != nullptr; ++variable) {
@@ -36,7 +37,7 @@ std::vector<std::string> environmentOf(const Transition& transition, const std::
     return environment;
 }
 
-// Null-terminated, for as long as `texts` live.
+// Return a null-terminated vector of pointers into `texts`.
 std::vector<char*> pointersTo(std::vector<std::string>& texts) {
     std::vector<char*> pointers;
     for (std::string& text : texts) {
@@ -81,7 +82,7 @@ void Notifier::notify(const Transition& transition) {
     }
     int status = 0;
     const bool hasEnded = waitFor(process, status);
-    kill(-process, SIGKILL);  // what it has left behind ends with it
+    kill(-process, SIGKILL);  // including its background processes
     if (hasEnded) {
         TERNHAD_LOG(_events, "Ran " + what + ": " + resultOf(status));
         return;
@@ -123,7 +124,7 @@ pid_t Notifier::start(const Transition& transition) {
     return error == 0 ? process : -1;
 }
 
-// False when it still runs after the limit, or when the daemon ends.
+// Return false if it still runs after the time limit, or if the daemon stops.
 bool Notifier::waitFor(pid_t process, int& status) const {
     const auto end = Clock::now() + LIMIT;
     do {

@@ -19,12 +19,12 @@ namespace ternhad {
 namespace {
 
 constexpr auto LONGEST_WAIT = std::chrono::seconds(30);
-constexpr int MOST_REQUESTS = 64;  // requests served before the clock is looked at
+constexpr int MOST_REQUESTS = 64;  // requests served before deadlines are checked
 constexpr char REPLYING[] = "reply to the peer";
 
 struct CheckDeleter {
     void operator()(EnvCheck* check) const {
-// Checks have neither members nor destructors, so that this is sound without a virtual one.
+// Checks have neither data members nor destructors, so the missing virtual destructor is harmless.
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wdelete-non-virtual-dtor"
         delete check;
@@ -44,7 +44,7 @@ class PeerServer::Socket final : public HASocketCommServer {
 
     int fd() const { return sockFd; }
 
-    // Who sent the last request, and whom the next reply goes to.
+    // Sender of the last request, to whom the next reply goes.
     sockaddr_in sender() const { return peerAddr; }
     void setSender(const sockaddr_in& address) { peerAddr = address; }
 };
@@ -86,12 +86,12 @@ void PeerServer::serve(Socket& socket) noexcept {
 void PeerServer::serveOne(Socket& socket, const std::string& request) {
     const auto entry = CheckerFactory::opMap->find(request);
     if (entry == CheckerFactory::opMap->end()) {
-        std::abort();  // a peer that speaks otherwise must not be taken for a working one
+        std::abort();  // a peer that speaks another protocol must not be taken for a working one
     }
     const std::unique_ptr<EnvCheck, CheckDeleter> check(entry->second());
     const std::string text = check->handle(_health.status());
     if (request == RebootCheck().getType()) {
-        _orderer = socket.sender();  // gets a reply only when the order cannot be carried out
+        _orderer = socket.sender();  // gets a reply only if the reboot fails
     } else {
         reply(socket, text);
     }
@@ -114,7 +114,7 @@ void PeerServer::reportTrouble(int error) noexcept {
 }
 
 void PeerServer::wait(const Socket& socket) const noexcept {
-    // A flush that ends after its order was given up wakes nobody.
+    // A flush that ends after the request was dropped wakes no thread.
     const int flushed = _reboot.isOrdered() ? _reboot.flushed().fd() : -1;
     std::array<pollfd, 3> waits = {
         {{socket.fd(), POLLIN, 0}, {_shutdown.event().fd(), POLLIN, 0}, {flushed, POLLIN, 0}}};

@@ -17,8 +17,8 @@ using TERN::HA::Daemon::IsRemoteMDResync;
 
 namespace {
 
-// The text of the peer's reply to a check; nothing without one. The check's own result does not tell: one
-// that found no socket, or that a stop of this process interrupted, looks like one with a poor reply.
+// Return the text of the peer's reply to a check, or nothing without one. The result of the check
+// does not distinguish a missing socket or an interruption by the stop from a negative reply.
 template <typename Check>
 std::optional<std::string> replyTo() {
     class Request : public Check {
@@ -45,12 +45,12 @@ void PeerWatcher::run() {
     Passes passes;
     auto next = Clock::now();
     do {
-        // It may be another machine that appears.
+        // It may be another machine now.
         if (_health.peerAppeared().take()) {
             _isHostnameKnown = false;
         }
         passes.run([this] {
-            if (_health.isPeerAlive()) {  // a dead one would only be waited for
+            if (_health.isPeerAlive()) {  // requests to a dead peer only time out
                 requestDisks();
                 requestResync();
                 requestHostname();
@@ -68,13 +68,13 @@ void PeerWatcher::requestDisks() {
     if (_shutdown.isRequested() || (!isRead && !isReportCut())) {
         return;
     }
-    // There are errors, on disks that are not known. Those of the report before may have recovered.
+    // Disk errors on unknown disks: those of the previous report may have recovered.
     _health.status().setErrHandlingDiskRemote(isRead ? disks : Json::Value(Json::arrayValue));
     _health.findings().setPeerDisksKnown(isRead);
     _health.set(Flag::peerDiskErrors, isHandling || !isRead);
 }
 
-// A report that cannot be read was cut, because it has more disks than a datagram holds.
+// Return true if the report was truncated: it lists more disks than a datagram holds.
 bool PeerWatcher::isReportCut() const {
     if (!_health.isPeerAlive()) {
         return false;
@@ -85,7 +85,7 @@ bool PeerWatcher::isReportCut() const {
 
 void PeerWatcher::requestResync() {
     const bool isResync = IsRemoteMDResync()();
-    // "No resync" is also what the check makes of no reply, which confirms nothing.
+    // The check returns "no resync" without a reply, too, which confirms nothing.
     if (_shutdown.isRequested() || (!isResync && replyTo<IsRemoteMDResync>() != "not_resync")) {
         return;
     }

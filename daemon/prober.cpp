@@ -20,11 +20,11 @@ using TERN::HA::Daemon::IsRemoteAlive;
 namespace {
 
 constexpr unsigned int NO_TIMEOUT = 0;
-constexpr int MOST_REPLIES = 64;  // datagrams read from one socket before the others have their turn
+constexpr int MOST_REPLIES = 64;  // datagrams read from one socket before the next one
 constexpr char SENDING[] = "send liveness probes";
 
-// True when a probe did not leave this node because this node lacks something. Everything else that keeps one
-// from arriving, such as an unreachable network, looks the same as a dead peer.
+// Return true if a probe was not sent for lack of a local resource. Other errors, such as an
+// unreachable network, look the same as a dead peer.
 bool isOwnTrouble(int error) {
     switch (error) {
         case EAGAIN:
@@ -38,16 +38,16 @@ bool isOwnTrouble(int error) {
     }
 }
 
-// After a failed receive: true unless the queue is empty. An error, such as a refusal, is reported in place
-// of a datagram.
+// After a failed receive: return true unless the queue is empty. Errors such as "port unreachable"
+// are returned in place of a datagram.
 bool isMoreExpected() {
     return errno != EAGAIN && errno != EBADF;
 }
 
 }  // namespace
 
-// The socket of one probe after another, each from a port of its own: a reply belongs to its probe by port,
-// and one that comes later than the next probe reaches nobody.
+// Socket of one probe at a time, each from a new port: the port matches a reply to its probe, and a
+// reply later than the next probe is dropped.
 class Prober::Socket final : public HASocketCommClient {
  public:
     explicit Socket(const std::string& address) : HASocketCommClient(address, NO_TIMEOUT) {
@@ -58,7 +58,8 @@ class Prober::Socket final : public HASocketCommClient {
 
     int fd() const { return sockFd; }
 
-    // Takes a new port, connected so that only the peer's datagrams and errors arrive. False with errno.
+    // Bind a new port, connected so that only the peer's datagrams and errors arrive. Returns false
+    // with errno on failure.
     bool renew() const {
         sockaddr none = {};
         none.sa_family = AF_UNSPEC;
@@ -108,7 +109,7 @@ void Prober::run() noexcept {
     _started.set_value(0);
     raisePriority(Priority::probes);
     while (!_shutdown.isRequested()) {
-        // First the time, then the replies: what has come by that time is seen before anything is decided.
+        // Read the time before the replies: all replies up to that time count in the decision.
         detector.wakeUp(Clock::now());
         receive(detector);
         if (detector.isPeerAlive() || detector.isPeerDead()) {
@@ -120,7 +121,7 @@ void Prober::run() noexcept {
         _progress.made(Progress::prober);
         wait(detector);
     }
-    _sockets.clear();  // in this thread's descriptor table
+    _sockets.clear();  // they are open in this thread's descriptor table
 }
 
 void Prober::probe(FailureDetector& detector) noexcept {
@@ -141,7 +142,7 @@ void Prober::probe(FailureDetector& detector) noexcept {
     }
 }
 
-// Returns 0 or the error number.
+// Return 0 or errno.
 int Prober::send(std::size_t number) noexcept {
     Socket& socket = *_sockets[number];
     if (!socket.renew()) {
@@ -165,7 +166,7 @@ void Prober::receive(FailureDetector& detector) noexcept {
                 }
             }
         } catch (const std::exception&) {
-            continue;  // no memory for a reply that is longer than the expected one
+            continue;  // out of memory for a reply longer than the expected one
         }
     }
 }

@@ -16,7 +16,7 @@ namespace {
 
 constexpr auto DEADLINE = std::chrono::seconds(5);
 
-// A check has no data members.
+// Static, because checks have no data members.
 Reboot* theReboot = nullptr;
 const Health* theHealth = nullptr;
 
@@ -31,7 +31,7 @@ void Reboot::flush() {
             TERN::HA::Daemon::daemonLog->writeLogToDisk();
             TERN::HA::Daemon::recordLog->writeLogToDisk();
         });
-        sync();  // the kernel restarts without flushing or unmounting anything
+        sync();  // the trigger reboots without flushing or unmounting
         _flushed.set();
     }
 }

@@ -12,8 +12,8 @@ namespace ternhad {
 
 namespace {
 
-// The manager's address stays in the environment: each state is told anew. A message that cannot be sent is
-// lost, and the manager acts on its own time limits.
+// Keep NOTIFY_SOCKET in the environment for the next notification. A failed notification is lost;
+// the manager falls back to its own time limits.
 constexpr int KEEP_ENVIRONMENT = 0;
 
 }  // namespace

@@ -20,8 +20,8 @@ constexpr auto JOIN_STEP = std::chrono::milliseconds(20);
 
 void ignoreSignal(int) {}
 
-// Interrupts what the other threads wait in, and ends the programs that they wait for: ping alone may take 10
-// seconds. The calling thread's own child is not theirs.
+// Interrupt the blocking calls of the other threads and terminate the programs that they wait for:
+// ping alone may take 10 seconds. Except the calling thread's own child.
 void interruptThreads() {
     std::error_code error;
     for (const auto& task : std::filesystem::directory_iterator("/proc/self/task", error)) {
@@ -49,7 +49,7 @@ Threads::Threads() {
 void Threads::start(const char* name, std::function<void()> body) {
     std::promise<void> promise;
     std::future<void> end = promise.get_future();
-    // An exception that is left over ends the process: a daemon that lacks a thread would only seem to work.
+    // An uncaught exception ends the process: a daemon that lacks a thread would only seem to work.
     std::thread thread([body = std::move(body), done = std::move(promise)]() mutable noexcept {
         body();
         done.set_value();
@@ -59,7 +59,8 @@ void Threads::start(const char* name, std::function<void()> body) {
 }
 
 bool Threads::join(Clock::time_point deadline) {
-    // A thread may be about to wait when a signal reaches it: repeat until it has ended.
+    // A signal that arrives just before the call blocks is lost: repeat it until the thread has
+    // ended.
     for (Worker& worker : _workers) {
         while (worker.end.wait_for(JOIN_STEP) != std::future_status::ready) {
             if (Clock::now() > deadline) {
@@ -75,7 +76,7 @@ bool Threads::join(Clock::time_point deadline) {
 
 bool isolateDescriptors() noexcept {
 #ifdef __SANITIZE_THREAD__
-    return false;  // the thread sanitizer knows one table of descriptors, and would see races between two
+    return false;  // the thread sanitizer assumes a single descriptor table
 #else
     Event::seal();
     return unshare(CLONE_FILES) == 0;

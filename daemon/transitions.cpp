@@ -7,7 +7,7 @@
 
 namespace ternhad {
 
-// Whether the peer is alive is never stale: the failure detector takes care that it is not.
+// peerAlive is never stale: the failure detector always knows.
 bool Transitions::isStale(Flag flag, const Entry& entry, Clock::time_point now) const noexcept {
     return entry.state.value && flag != Flag::peerAlive &&
            (!entry.isConfirmed || now - entry.lastCheck > _staleAfter);
@@ -19,7 +19,7 @@ void Transitions::found(Flag flag, bool value) noexcept {
     State& state = entry.state;
     const auto now = Clock::now();
     if (isReportedByPeer(flag) && entryOf(Flag::peerAlive).state.value != true) {
-        return;  // it comes too late
+        return;  // late reply of a peer that is dead by now
     }
     const bool wasStale = isStale(flag, entry, now);
     state.checked = wallClock();

@@ -85,7 +85,7 @@ class HASocketCommServer : public HASocketComm {
 };
 
 /// Client end: sends requests to the node at `ip`. The kernel picks the source port at the first
-/// Send. Recv takes any datagram that reaches this port for the reply, whoever sent it.
+/// Send. Recv accepts any datagram that reaches this port as the reply, from any sender.
 class HASocketCommClient : public HASocketComm {
  public:
     /// Open a client with a receive time-out of `timeoutSec` seconds (0: none).

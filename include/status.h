@@ -39,8 +39,8 @@ constexpr NodeState operator|(NodeState a, NodeState b) {
 /// allocate; when memory runs out they throw and leave the record unchanged.
 class Status {
  public:
-    /// Construct a record in which every flag is false but isDRBDConnect, every figure 0, both
-    /// lists and the node state empty.
+    /// Construct a record in which isDRBDConnect is true, every other flag false, every number 0,
+    /// and both lists and the node state are empty.
     Status();
 
     Status(const Status&) = delete;
