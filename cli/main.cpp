@@ -54,7 +54,7 @@ void addCommands(CLI::App& app, Settings& settings, Command& command) {
         ->default_str("2")
         ->check(between(0.1, 86400))
         ->type_name("SECONDS");
-    CLI::App* const waitApp = add("wait", "Wait until a condition holds; exit with 1 on time-out", wait);
+    CLI::App* const waitApp = add("wait", "Wait until a condition holds; exit with 1 on timeout", wait);
     std::vector<std::string> conditions;
     for (const FlagName& name : flagNames()) {
         conditions.insert(conditions.end(), {name.set, name.clear});

@@ -101,7 +101,7 @@ class RebootRemote : public EnvCheck {
     static CheckerRegister<RebootRemote> reg;  ///< registers the check when the library is loaded
 };
 
-/// "remote_hostname": the peer's own host name.
+/// "remote_hostname": the peer's own hostname.
 class GetRemoteHostname : public EnvCheck {
  public:
     using EnvCheck::operator();
@@ -227,7 +227,7 @@ void recordDF();
 /// Record /proc/meminfo. Logs "Failed to get meminfo" when it cannot be opened.
 void recordMemoryInfo();
 
-/// Return this node's own host name, before the HA package replaced it by the shared name: the
+/// Return this node's own hostname, before the HA package replaced it by the shared name: the
 /// bytes of /tmp/.ha.hostname.original, at most 4096 and a trailing newline included. Returns the
 /// empty string while that file is missing or empty, or is not a regular file of root or this
 /// process's user; a symbolic link is not followed. A non-empty name is cached for the life of the

@@ -50,13 +50,13 @@ class HASocketComm {
     ///
     /// @param out  receives the text up to the first zero byte; at most 63 bytes of the datagram
     ///             are read, the rest is discarded. Unchanged on failure.
-    /// @return the number of bytes received, 0 for an empty datagram, -1 on time-out, interruption
-    ///         by a signal or any other failure. Blocks up to the receive time-out; without one,
+    /// @return the number of bytes received, 0 for an empty datagram, -1 on timeout, interruption
+    ///         by a signal or any other failure. Blocks up to the receive timeout; without one,
     ///         until a datagram arrives.
     virtual int Recv(std::string& out) = 0;
 
  protected:
-    /// A time-out. Not a timeval, whose size depends on the including program's choice of time_t.
+    /// A timeout. Not a timeval, whose size depends on the including program's choice of time_t.
     struct TimeValue {
         std::uint32_t seconds;      ///< whole seconds
         std::int32_t microseconds;  ///< remainder, 0 to 999999
@@ -64,18 +64,18 @@ class HASocketComm {
 
     int sockFd;             ///< the socket; -1 when it could not be opened
     sockaddr_in peerAddr;   ///< destination of Send
-    TimeValue recvTimeout;  ///< receive time-out of the socket; 0: none
+    TimeValue recvTimeout;  ///< receive timeout of the socket; 0: none
     bool hasError;          ///< see HasError()
 };
 
 /// Server end: bound to this node's address, replies to the sender of the last request.
 class HASocketCommServer : public HASocketComm {
  public:
-    /// Bind the socket to `ip`, port HA_PEER_PORT, without a receive time-out. HasError() is true
+    /// Bind the socket to `ip`, port HA_PEER_PORT, without a receive timeout. HasError() is true
     /// when the address cannot be bound.
     explicit HASocketCommServer(const std::string& ip);
 
-    /// The same, with a receive time-out of `timeoutSec` seconds (0: none).
+    /// The same, with a receive timeout of `timeoutSec` seconds (0: none).
     HASocketCommServer(const std::string& ip, unsigned int timeoutSec);
 
     int Recv(std::string& out) override;
@@ -88,7 +88,7 @@ class HASocketCommServer : public HASocketComm {
 /// Send. Recv accepts any datagram that reaches this port as the reply, from any sender.
 class HASocketCommClient : public HASocketComm {
  public:
-    /// Open a client with a receive time-out of `timeoutSec` seconds (0: none).
+    /// Open a client with a receive timeout of `timeoutSec` seconds (0: none).
     HASocketCommClient(const std::string& ip, unsigned int timeoutSec);
 
     int Recv(std::string& out) override;

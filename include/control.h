@@ -50,7 +50,7 @@ class MonitordSocket : public DaemonLocalSocket {
     bool getServerData(Json::Value& out);
 
     /// Client: request a reboot of the peer. Returns true once the daemon has sent its reply, false
-    /// when none arrived. Construct the object with a time-out above 33 seconds.
+    /// when none arrived. Construct the object with a timeout above 33 seconds.
     bool rebootRemote();
 
     /// Client: return true when the daemon replied that the peer is being rebooted, false

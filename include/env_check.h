@@ -49,7 +49,7 @@ class EnvCheck {
     ///
     /// @param reply  receives the reply, 0 to 63 bytes; unchanged on failure
     /// @return true when a datagram arrived within 3 seconds, an empty one included; false on
-    ///         time-out and on any error. Logs "Failed to start socket client" when no socket could
+    ///         timeout and on any error. Logs "Failed to start socket client" when no socket could
     ///         be opened or set up, and nothing for other failures.
     ///
     /// One attempt, no retransmission. Blocks for up to 3 seconds, less when a signal interrupts

@@ -31,7 +31,7 @@ class DaemonLocalSocket {
     /// Open the socket.
     ///
     /// @param path     of the socket file; cut to its first 107 characters
-    /// @param timeout  receive time-out of a client, in seconds; 0 or above 2147483647: none
+    /// @param timeout  receive timeout of a client, in seconds; 0 or above 2147483647: none
     ///
     /// hasError() is true when no socket could be opened.
     DaemonLocalSocket(std::string path, unsigned int timeout);
@@ -58,7 +58,7 @@ class DaemonLocalSocket {
     /// Client: connect, send `request` and receive `reply`.
     ///
     /// Returns true when the reply was a JSON text; otherwise false, with `reply` unchanged. Blocks
-    /// up to the time-out for the reply, and without limit while the server's backlog is full.
+    /// up to the timeout for the reply, and without limit while the server's backlog is full.
     bool clientSend(const Json::Value& request, Json::Value& reply);
 
     /// Server: carry out `request` and store the reply, null when called, in `reply`. Return true
@@ -70,7 +70,7 @@ class DaemonLocalSocket {
     /// close `fd`.
     bool _serverListen(int fd);
 
-    /// Set the receive time-out and connect: the first half of clientSend.
+    /// Set the receive timeout and connect: the first half of clientSend.
     bool _clientConnect();
 
  private:

@@ -11,7 +11,7 @@
 /// Human-readable names.
 namespace TERN::HA::Daemon::Util {
 
-/// Return the host name of the HA pair: the value of "ha_hostname" in the package's configuration
+/// Return the hostname of the HA pair: the value of "ha_hostname" in the package's configuration
 /// file, at most 63 characters. Returns the empty string and logs "Failed to get ha hostname" when
 /// the file or the key is missing. Blocks for the reading of a small file. Thread-safe.
 std::string getHAHostname();

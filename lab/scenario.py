@@ -59,7 +59,7 @@ def find_each_other(lab: Lab, checks: Checks):
     checks.within(RETURN_LIMIT, "both report alive and connected", lab.statuses, [WELL] * 2)
     checks.within(
         RETURN_LIMIT,
-        "both have logged the other's host name",
+        "both have logged the other's hostname",
         lambda: [
             lab.a.has_logged(" Remote hostname is node-b"),
             lab.b.has_logged(" Remote hostname is node-a"),

@@ -8,7 +8,7 @@ import time
 from nodes import Daemon, eventually
 from rivals import Corosync, Keepalived
 
-# Name: options of ternhad, advertisement interval of keepalived in seconds, token time-out of
+# Name: options of ternhad, advertisement interval of keepalived in seconds, token timeout of
 # corosync in milliseconds (0: its default).
 SETTINGS = {
     "default": ([], 1, 0),

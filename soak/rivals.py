@@ -99,7 +99,7 @@ class Keepalived:
 
 
 class Corosync:
-    """Totem with a token time-out of `token` milliseconds (0: its default)."""
+    """Totem with a token timeout of `token` milliseconds (0: its default)."""
 
     def __init__(self, node, token=0):
         self.node, self.token = node, token

@@ -71,7 +71,7 @@ bool IsRemoteAlive::operator()() {
     return _sendToRemote(reply) && reply == ALIVE;
 }
 
-// ---- Host name of the peer ----
+// ---- Hostname of the peer ----
 
 std::string GetRemoteHostname::getType() {
     return "remote_hostname";

@@ -41,7 +41,7 @@ class FailingCall {
     bool hasFailed() const;
 };
 
-/// Return the last arguments of this process: backlog of listen() and receive time-out; -1 when
+/// Return the last arguments of this process: backlog of listen() and receive timeout; -1 when
 /// unset.
 int backlog();
 std::chrono::seconds receiveTimeout();

@@ -72,7 +72,7 @@ class Gate {
 
     Gate() { EXPECT_EQ(mkfifo("/tmp/gate", 0600), 0); }
 
-    /// Wait until the script reaches the gate; false on time-out.
+    /// Wait until the script reaches the gate; false on timeout.
     static bool open() {
         return test::eventually(PATIENCE, [] {
             const int fd = ::open("/tmp/gate", O_WRONLY | O_NONBLOCK | O_CLOEXEC);

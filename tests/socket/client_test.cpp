@@ -107,7 +107,7 @@ class NoTimeoutTest : public ClientSocketTest, public ::testing::WithParamInterf
 
 TEST_P(NoTimeoutTest, SetsNoSocketOption) {
     test::HandlerSocket client({}, "/tmp/nowhere", GetParam());
-    const test::FailingCall failing("setsockopt", EDOM);  // no time-out is set at all
+    const test::FailingCall failing("setsockopt", EDOM);  // no timeout is set at all
     EXPECT_FALSE(client.clientSend(request, reply));
     EXPECT_THAT(systemLog(), ElementsAre(HasSubstr(" Failed to connect socket /tmp/nowhere: "),
                                          HasSubstr(" Failed to connect socket server: ")));

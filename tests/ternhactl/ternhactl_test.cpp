@@ -240,7 +240,7 @@ TEST_F(TernhactlTest, FullBacklogEndsInATimeout) {
     ASSERT_TRUE(test::eventually(20s, isFull));
     const test::Stopwatch stopwatch;
     EXPECT_EQ(shell("ternhactl --timeout 5 status").exitCode, 3);
-    EXPECT_LT(stopwatch.elapsed(), 9s);  // one time-out, not one for each step
+    EXPECT_LT(stopwatch.elapsed(), 9s);  // one timeout, not one for each step
 }
 
 TEST_F(TernhactlTest, HalfAReplyEndsInATimeout) {
