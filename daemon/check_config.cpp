@@ -12,7 +12,7 @@ namespace ternhad {
 
 namespace {
 
-// Whether the interface has the address.
+// Return whether the interface has the address.
 bool hasAddress(const std::string& interface, const std::string& address) {
     in_addr wanted = {};
     inet_pton(AF_INET, address.c_str(), &wanted);
@@ -25,7 +25,7 @@ bool hasAddress(const std::string& interface, const std::string& address) {
         if (entry->ifa_addr != nullptr && entry->ifa_addr->sa_family == AF_INET &&
             interface == entry->ifa_name) {
             sockaddr_in found = {};
-            std::memcpy(&found, entry->ifa_addr, sizeof found);  // which may not be aligned for it
+            std::memcpy(&found, entry->ifa_addr, sizeof found);  // `ifa_addr` may be unaligned
             isFound = isFound || found.sin_addr.s_addr == wanted.s_addr;
         }
     }

@@ -7,7 +7,7 @@
 
 namespace ternhad {
 
-// The values in effect, in the format of the configuration file.
+// Return the values in effect in the format of the configuration file.
 std::string configurationText(const Options& options);
 
 // What is allowed but hardly meant, or not so yet.

@@ -16,11 +16,11 @@
 
 namespace ternhad {
 
-// Serves the clients of the control socket side by side, up to 16 at a time. An order to reboot the peer,
-// which takes up to 33 seconds, blocks only its own client; a second one meanwhile is refused.
+// Serves up to 16 clients of the control socket concurrently. A reboot request, which takes up to
+// 33 seconds, blocks only its own client; a second one meanwhile is refused.
 class ControlServer {
  public:
-    enum class Access { all, reading };  // reading: no orders
+    enum class Access { all, reading };  // reading: no reboot requests
 
     // `directoryMode`: see Listener.
     ControlServer(const std::string& path, mode_t directoryMode, Access access, Health& health,
@@ -30,26 +30,27 @@ class ControlServer {
     ControlServer(const ControlServer&) = delete;
     ControlServer& operator=(const ControlServer&) = delete;
 
-    // The socket. Have it listen before the threads run.
+    // The socket; must listen before the threads start.
     Listener& listener() { return _listener; }
 
-    // Body of the thread that serves clients. Tells `progress` of each pass, if given.
+    // Body of the thread that serves clients. Reports each pass to `progress` unless it is null.
     void run(Progress* progress);
 
-    // Body of the thread that carries out orders.
+    // Body of the thread that carries out reboot requests.
     void runOrders();
 
  private:
     class Endpoint : public TERN::HA::Daemon::MonitordSocket {
      public:
-        // With `orders` it takes orders to reboot the peer, and clears there the mark of one that disobeyed.
+        // Accepts reboot requests if `orders` is not null, and clears NodeRebooting in it when the
+        // peer was not rebooted.
         Endpoint(const std::string& path, const Reporter& reporter, Health* orders);
 
-        // As documented for the base, and the report. Refuses an order that it does not take, whatever was
-        // seen of the request before.
+        // Handles the requests of the base class and the report. Refuses a reboot request if
+        // `orders` is null, whatever was peeked of the request before.
         bool serverHandle(const Json::Value& request, Json::Value& reply) override;
 
-        // Serves the request that has come to `fd`.
+        // Serve the request on `fd`.
         void serve(int fd) { _serverListen(fd); }
 
      private:
@@ -59,7 +60,7 @@ class ControlServer {
         Health* _orders;
     };
 
-    // One that has not sent its request yet.
+    // A client that has not sent its request yet.
     struct Client {
         int fd;
         Clock::time_point deadline;
@@ -87,7 +88,7 @@ class ControlServer {
     bool _isFileLost = false;
 
     Event _ordered;
-    std::atomic<int> _orderer{-1};  // the client whose order is carried out
+    std::atomic<int> _orderer{-1};  // client whose reboot request is in progress
 };
 
 }  // namespace ternhad

@@ -26,15 +26,15 @@ namespace ternhad {
 
 namespace {
 
-// A flag is stale after three rounds of its check, and the time in which the peer's two replies are awaited.
+// A flag is stale after three rounds of its check plus the timeouts of two requests.
 constexpr auto LOST_REPLIES = std::chrono::seconds(6);
 
-// Of the 2 seconds that the end may take.
+// Shares of the 2 seconds that a stop may take.
 constexpr auto THREADS_LIMIT = std::chrono::milliseconds(1000);
 constexpr auto EVENTS_LIMIT = std::chrono::milliseconds(1200);
 constexpr auto LOGS_LIMIT = std::chrono::milliseconds(1800);
 
-// Blocks the signals, in this thread and all that it starts, and returns a descriptor to read them from.
+// Block the signals in this thread and all that it starts; return a descriptor to read them from.
 int openSignals() {
     sigset_t signals;
     sigemptyset(&signals);
@@ -70,8 +70,8 @@ Daemon::Daemon(const Options& options, InstanceLock& lock)
       _nodeWatcher(options, _health, _events, _shutdown, _progress),
       _watchdog(watchdogInterval()),
       _nextWatchdog(Clock::now()) {
-    // Here and not in startStatusServer(): the probes thread sets an event of the streams, and knows only
-    // descriptors that are older than itself.
+    // Create the events here, not in startStatusServer(): the probes thread sets them, and its
+    // descriptor table has only descriptors opened before it.
     if (!options.statusSocket.empty()) {
         _statusStreams.emplace(_health.transitions(), _reporter, _shutdown);
         _statusServer.emplace(options.statusSocket, STATUS_DIRECTORY_MODE, ControlServer::Access::reading,
@@ -95,8 +95,7 @@ int Daemon::run() {
         _shutdown.request(1);
         return stop();
     }
-    // What is in use stays in memory when others thrash it, as far as this is permitted. Not what is not in
-    // use: that would triple the daemon.
+    // Lock pages in memory as they are used, if permitted. Locking all would triple the memory use.
     mlockall(MCL_CURRENT | MCL_ONFAULT);
     TERNHAD_LOG(_events, "Started on " + _options.localIp + ", peer " + _options.remoteIp);
     notifyReady();
@@ -134,8 +133,8 @@ bool Daemon::startThreads() try {
     return false;
 }
 
-// The node does not depend on it: the server tries again until it has its socket. Its clients have places of
-// their own, so that they cannot take root's.
+// The daemon continues without this server, which retries until it has its socket. Its limits are
+// separate, so that its clients cannot exhaust those of root.
 void Daemon::startStatusServer() {
     if (!_statusServer) {
         return;
@@ -154,7 +153,7 @@ bool Daemon::startPeerThreads() {
         return complain("serve the peer on " + _options.localIp, error);
     }
     if (_peerServer.isIsolated()) {
-        _lock.handOver();  // that thread has it, too
+        _lock.handOver();  // that thread holds it, too
     }
     _threads.start("probes", [this] { _prober.run(); });
     if (const int error = _prober.waitForStart()) {
@@ -197,7 +196,8 @@ void Daemon::takeSignals(int signals) {
 }
 
 void Daemon::updateWatchdog() {
-    // A thread may miss a quarter of the interval, because it waits for up to 30 seconds, but not all of it.
+    // A thread may make no progress for a quarter of the interval, because it blocks for up to 30
+    // seconds, but not for all of it.
     if (_watchdog && Clock::now() >= _nextWatchdog) {
         _nextWatchdog = Clock::now() + *_watchdog / 4;
         if (_progress.isComplete()) {
@@ -217,7 +217,7 @@ int Daemon::stop() {
         _statusServer->listener().removeFile();
     }
     if (!haveEnded || !isWritten) {
-        _exit(_shutdown.exitCode());  // without what hangs
+        _exit(_shutdown.exitCode());  // without joining hung threads
     }
     return _shutdown.exitCode();
 }

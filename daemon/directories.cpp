@@ -37,7 +37,7 @@ bool makeDirectory(const std::string& path, mode_t mode = PRIVATE_DIR) {
     }
     struct stat info = {};
     if (lstat(path.c_str(), &info) == 0) {
-        return true;  // mkdir would wait for a frozen disk before it looks
+        return true;  // mkdir would block on a frozen disk even if it exists
     }
     if (mkdir(path.c_str(), mode) == 0) {
         chmod(path.c_str(), mode);  // whatever the umask is
@@ -47,8 +47,8 @@ bool makeDirectory(const std::string& path, mode_t mode = PRIVATE_DIR) {
     return true;
 }
 
-// Whether nobody else can have put anything into the directory. What others left in it before it became this
-// user's could lead astray whoever opens it.
+// Return whether no other user can write to the directory. Files that others left in it earlier
+// could redirect writes to it.
 bool isOurs(const char* path) {
     struct stat info = {};
     if (lstat(path, &info) != 0) {
@@ -72,7 +72,7 @@ bool hasOnlyOurFiles(const char* path) {
         const std::string name = path + ("/" + printable(entry.path().filename()));
         struct stat info = {};
         if (lstat(entry.path().c_str(), &info) != 0) {
-            continue;  // removed meanwhile
+            continue;  // removed in the meantime
         }
         if (!S_ISREG(info.st_mode) && !S_ISDIR(info.st_mode)) {
             return complain(name, "neither a file nor a directory");

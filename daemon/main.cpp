@@ -42,7 +42,7 @@ int run(const ternhad::Options& options) {
 }  // namespace
 
 int main(int argc, char** argv) try {
-    umask(S_IRWXG | S_IRWXO);  // logs and control socket are for this user alone
+    umask(S_IRWXG | S_IRWXO);  // logs and control socket are private to this user
     if (argc == 3 && std::string_view(argv[1]) == ternhad::LOG_KEEPER) {
         return ternhad::keepLogs(std::strtoll(argv[2], nullptr, 10));
     }

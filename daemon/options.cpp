@@ -30,9 +30,9 @@ namespace {
 constexpr int FAILURE = 1;
 constexpr int WRONG_USAGE = 2;
 constexpr double DAY = 86400;
-constexpr Seconds ROUNDING = std::chrono::nanoseconds(1);  // three times 0.2 is more than 0.6
+constexpr Seconds ROUNDING = std::chrono::nanoseconds(1);  // 3 * 0.2 is more than 0.6
 
-// As the library reads it: text that is no address to it, such as 010.0.0.1, would count as 0.0.0.0.
+// Parsed as the library does: an unparsable address such as 010.0.0.1 would count as 0.0.0.0.
 std::string checkAddress(const std::string& text) {
     in_addr address = {};
     if (inet_pton(AF_INET, text.c_str(), &address) != 1) {
@@ -47,12 +47,12 @@ std::string checkAddress(const std::string& text) {
 
 in_addr_t valueOf(const sockaddr* address) {
     sockaddr_in copy = {};
-    std::memcpy(&copy, address, sizeof copy);  // which may not be aligned for it
+    std::memcpy(&copy, address, sizeof copy);  // `address` may be unaligned
     return ntohl(copy.sin_addr.s_addr);
 }
 
-// True for the highest address of a network that this machine is in: the kernel sends what goes there to all.
-// Not by ifa_broadaddr, which is the other end's address where an interface has one.
+// Return true for the broadcast address of a network of this machine. Not by ifa_broadaddr, which
+// is the remote address of point-to-point interfaces.
 bool isBroadcast(const std::string& address) {
     in_addr wanted = {};
     inet_pton(AF_INET, address.c_str(), &wanted);
@@ -67,7 +67,7 @@ bool isBroadcast(const std::string& address) {
             continue;
         }
         const in_addr_t hosts = ~valueOf(entry->ifa_netmask);
-        // A network of one or two addresses has none for all of them.
+        // A network of one or two addresses has no broadcast address.
         if (hosts > 1 && ntohl(wanted.s_addr) == (valueOf(entry->ifa_addr) | hosts)) {
             return true;
         }
@@ -75,7 +75,7 @@ bool isBroadcast(const std::string& address) {
     return false;
 }
 
-// A path that is bound as it is: neither relative to wherever the process stands nor cut.
+// Accept only paths that are bound unchanged: absolute and not truncated.
 std::string checkSocketPath(const std::string& path) {
     if (path.empty() || path.front() != '/') {
         return "not an absolute path: " + path;
@@ -109,7 +109,7 @@ std::string checkGroup(const std::string& name) {
     return getgrnam(name.c_str()) != nullptr ? "" : "no such group: " + name;
 }
 
-// Not by CLI::Range, to which "nan" is in every range.
+// Not CLI::Range, which accepts "nan" in every range.
 void addInterval(CLI::App& app, const std::string& name, Seconds& value, double least, double most,
                  const std::string& description) {
     const std::string range = "from " + CLI::detail::to_string(least) + " to " + CLI::detail::to_string(most);

@@ -11,7 +11,7 @@ namespace ternhad {
 
 namespace {
 
-constexpr auto MEASUREMENT = std::chrono::seconds(10);  // a ping takes as long
+constexpr auto MEASUREMENT = std::chrono::seconds(10);  // longest duration of a ping
 
 Json::Value toJson(Findings::OrderOutcome outcome) {
     switch (outcome) {
@@ -33,7 +33,7 @@ Json::Value textOrNull(const std::string& text) {
     return text.empty() ? Json::Value() : Json::Value(text);
 }
 
-// The name as it is sent to the peer, else the machine's.
+// Return the name that is sent to the peer, or else that of the machine.
 std::string nodeName(const Health& health) {
     std::string name = printable(health.hostname());
     if (name.empty()) {

@@ -10,7 +10,7 @@
 
 namespace ternhad {
 
-// Builds version 1 of the report for clients of the control socket.
+// Makes the report, version 1, for clients of the control socket.
 class Reporter {
  public:
     Reporter(const Options& options, Health& health) : _options(options), _health(health) {}
