@@ -41,6 +41,28 @@ class NamelessCheck : public EnvCheck {
 
 class ExchangeTest : public test::SandboxTest {
  protected:
+    void expectTimeout() {
+        const test::Stopwatch watch;
+        EXPECT_FALSE(check._sendToRemote(reply));
+        EXPECT_GE(watch.elapsed(), 3s);
+        EXPECT_EQ(reply, "before");
+        EXPECT_EQ(test::bufferText(), "");
+    }
+
+    // Expect that nothing is sent and a line logged when `call` fails with `error`.
+    void expectNothingSent(const char* call, int error) {
+        UdpSocket peer(PEER_ADDRESS, PEER_PORT);
+        remoteIP(PEER_ADDRESS);
+        {
+            const test::FailingCall failing(call, error);
+            EXPECT_FALSE(check._sendToRemote(reply));
+        }
+        EXPECT_EQ(reply, "before");
+        EXPECT_THAT(arrived(peer), IsEmpty());
+        EXPECT_THAT(test::daemonLogMessages(),
+                    ElementsAre(test::LogLine("env_check.cpp", "Failed to start socket client")));
+    }
+
     TestCheck check;
     std::string reply = "before";
 };
@@ -85,70 +107,36 @@ TEST_F(ExchangeTest, CheckWithoutATypeNameSendsUndefine) {
 TEST_F(ExchangeTest, SendsOneRequestAndTimesOutAfterThreeSeconds) {
     UdpSocket peer(PEER_ADDRESS, PEER_PORT);
     remoteIP(PEER_ADDRESS);
-    const test::Stopwatch watch;
-    EXPECT_FALSE(check._sendToRemote(reply));
-    EXPECT_GE(watch.elapsed(), 3s);
+    expectTimeout();
     EXPECT_EQ(test::receiveTimeout(), 3s);
-    EXPECT_EQ(reply, "before");
     EXPECT_THAT(arrived(peer), ElementsAre("test_request"));
-    EXPECT_EQ(test::bufferText(), "");
 }
 
 TEST_F(ExchangeTest, MissingRemoteAddressCountsAs0000) {
     ASSERT_EQ(remoteIP(""), "");
     UdpSocket own("127.0.0.1", PEER_PORT);
-    const test::Stopwatch watch;
-    EXPECT_FALSE(check._sendToRemote(reply));
-    EXPECT_GE(watch.elapsed(), 3s);
-    EXPECT_EQ(reply, "before");
+    expectTimeout();
     EXPECT_THAT(arrived(own), ElementsAre("test_request"));
-    EXPECT_EQ(test::bufferText(), "");
 }
 
 TEST_F(ExchangeTest, ClosedPeerPortTimesOut) {
     remoteIP(PEER_ADDRESS);
-    const test::Stopwatch watch;
-    EXPECT_FALSE(check._sendToRemote(reply));
-    EXPECT_GE(watch.elapsed(), 3s);
-    EXPECT_EQ(reply, "before");
-    EXPECT_EQ(test::bufferText(), "");
+    expectTimeout();
 }
 
 TEST_F(ExchangeTest, SendFailureTimesOut) {
     remoteIP("255.255.255.255");
-    const test::Stopwatch watch;
-    EXPECT_FALSE(check._sendToRemote(reply));
-    EXPECT_GE(watch.elapsed(), 3s);
-    EXPECT_EQ(reply, "before");
-    EXPECT_EQ(test::bufferText(), "");
+    expectTimeout();
 }
 
 TEST_F(ExchangeTest, SocketFailureIsLoggedAndNothingIsSent) {
     test::SystemLog systemLog;
-    UdpSocket peer(PEER_ADDRESS, PEER_PORT);
-    remoteIP(PEER_ADDRESS);
-    {
-        const test::FailingCall failing("socket", EMFILE);
-        EXPECT_FALSE(check._sendToRemote(reply));
-    }
-    EXPECT_EQ(reply, "before");
-    EXPECT_THAT(arrived(peer), IsEmpty());
-    EXPECT_THAT(test::daemonLogMessages(),
-                ElementsAre(test::LogLine("env_check.cpp", "Failed to start socket client")));
+    expectNothingSent("socket", EMFILE);
     EXPECT_THAT(systemLog.texts(), ElementsAre(test::LogLine("chkstate.cpp", "Failed to set socket")));
 }
 
 TEST_F(ExchangeTest, TimeoutOptionFailureIsLoggedAndNothingIsSent) {
-    UdpSocket peer(PEER_ADDRESS, PEER_PORT);
-    remoteIP(PEER_ADDRESS);
-    {
-        const test::FailingCall failing("setsockopt", EDOM);
-        EXPECT_FALSE(check._sendToRemote(reply));
-    }
-    EXPECT_EQ(reply, "before");
-    EXPECT_THAT(arrived(peer), IsEmpty());
-    EXPECT_THAT(test::daemonLogMessages(),
-                ElementsAre(test::LogLine("env_check.cpp", "Failed to start socket client")));
+    expectNothingSent("setsockopt", EDOM);
 }
 
 TEST_F(ExchangeTest, DatagramFromAnotherAddressIsTakenAsTheReply) {

@@ -8,6 +8,7 @@
 #include <atomic>
 #include <cerrno>
 #include <csignal>
+#include <initializer_list>
 #include <memory>
 #include <optional>
 #include <ostream>
@@ -38,7 +39,19 @@ bool echo(const Json::Value& request, Json::Value& reply) {
     return true;
 }
 
-class ServerSocketTest : public test::SocketTest {};
+class ServerSocketTest : public test::SocketTest {
+ protected:
+    static void expectEchoes(std::initializer_list<std::string> requests) {
+        HandlerSocket server(echo);
+        ASSERT_TRUE(server.serverBind());
+        for (const std::string& request : requests) {
+            const test::RawClient client;
+            client.send(request);
+            EXPECT_TRUE(server.serverListen());
+            EXPECT_EQ(client.receiveAll(), "{\"got\":" + request + "}");
+        }
+    }
+};
 
 TEST_F(ServerSocketTest, SendsACompactReplyAndCloses) {
     HandlerSocket server(echo);
@@ -194,14 +207,7 @@ TEST_F(ServerSocketTest, DeepNestingWithinTheLimitIsServed) {
 }
 
 TEST_F(ServerSocketTest, NonObjectsArePassedToTheHandler) {
-    HandlerSocket server(echo);
-    ASSERT_TRUE(server.serverBind());
-    for (const std::string request : {"[1,2]", "7", "\"I\"", "null", "true"}) {
-        const test::RawClient client;
-        client.send(request);
-        EXPECT_TRUE(server.serverListen());
-        EXPECT_EQ(client.receiveAll(), "{\"got\":" + request + "}");
-    }
+    expectEchoes({"[1,2]", "7", "\"I\"", "null", "true"});
 }
 
 TEST_F(ServerSocketTest, RequestEndsAtFirstZeroByte) {
@@ -214,14 +220,7 @@ TEST_F(ServerSocketTest, RequestEndsAtFirstZeroByte) {
 }
 
 TEST_F(ServerSocketTest, ShortRequestOverwritesALongerOne) {
-    HandlerSocket server(echo);
-    ASSERT_TRUE(server.serverBind());
-    for (const std::string request : {"[\"a long request comes first\"]", "[]"}) {
-        const test::RawClient client;
-        client.send(request);
-        EXPECT_TRUE(server.serverListen());
-        EXPECT_EQ(client.receiveAll(), "{\"got\":" + request + "}");
-    }
+    expectEchoes({"[\"a long request comes first\"]", "[]"});
 }
 
 TEST_F(ServerSocketTest, EmptyConnectionFailsToParse) {
