@@ -22,7 +22,7 @@ constexpr auto SILENCE_LIMIT = std::chrono::seconds(5);
 constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the socket file
 constexpr std::size_t MOST_CLIENTS = 16;
 constexpr auto OBEYED = std::chrono::seconds(6);  // after an order a peer that obeys replies no more
-constexpr char RESTORING[] = "make the missing socket";
+constexpr char RESTORING[] = "create the missing socket";
 constexpr char ACCEPTING[] = "accept control clients";
 constexpr char ORDER = 'R';  // the actions
 constexpr char REPORT = 'S';
@@ -116,9 +116,9 @@ void ControlServer::restoreFile() {
     const bool hadFile = _listener.hasHadFile();
     if (_listener.listen()) {
         if (hadFile) {
-            TERNHAD_LOG(_events, "The socket " + _listener.path() + " had vanished, it is there again");
+            TERNHAD_LOG(_events, "Recreated the socket " + _listener.path());
         } else {
-            TERNHAD_LOG(_events, "The socket " + _listener.path() + " is there now");
+            TERNHAD_LOG(_events, "Created the socket " + _listener.path());
         }
         _isFileLost = false;
     } else if (!_isFileLost) {

@@ -96,7 +96,7 @@ void Events::write(const Happening& happening) {
             HA_LOG(std::string("Cannot ") + happening.what + ": " + std::strerror(happening.error));
             break;
         case Happening::Kind::recovery:
-            HA_LOG(std::string("Can again ") + happening.what);
+            HA_LOG(std::string("Can ") + happening.what + " again");
             break;
         case Happening::Kind::message:
             TERN::HA::Daemon::logAt(happening.file, happening.line, happening.text);

@@ -151,7 +151,7 @@ void LogKeeper::reap() {
     const auto isGone = [](pid_t process) { return waitpid(process, nullptr, WNOHANG) != 0; };
     _leftBehind.erase(std::remove_if(_leftBehind.begin(), _leftBehind.end(), isGone), _leftBehind.end());
     if (_process >= 0 && isGone(_process)) {
-        TERNHAD_LOG(_events, "The log keeper has died, another is started");
+        TERNHAD_LOG(_events, "The log keeper has exited: restarting it");
         _process = -1;
         closePipes();
     }
@@ -159,7 +159,7 @@ void LogKeeper::reap() {
 
 void LogKeeper::replaceIfHanging() {
     if (_process >= 0 && _busySince && Clock::now() >= workTime()) {
-        TERNHAD_LOG(_events, "The log keeper hangs, another takes its place");
+        TERNHAD_LOG(_events, "The log keeper hangs: replacing it");
         leaveBehind(SIGKILL);
         _nextStart = Clock::now();
     }

@@ -65,7 +65,7 @@ void Notifier::run() {
                     return;
                 }
                 if (lost > 0) {
-                    TERNHAD_LOG(_events, "Changes not notified of: " + std::to_string(lost));
+                    TERNHAD_LOG(_events, "Notifications lost: " + std::to_string(lost));
                 }
                 notify(*transition);
             }
@@ -89,7 +89,7 @@ void Notifier::notify(const Transition& transition) {
     }
     waitpid(process, &status, 0);
     if (!_shutdown.isRequested()) {
-        TERNHAD_LOG(_events, "Ended " + what + ", which took more than 30 seconds");
+        TERNHAD_LOG(_events, "Killed " + what + " after 30 seconds");
     }
 }
 

@@ -53,7 +53,7 @@ bool Reboot::complete() noexcept {
     const int trigger = open("/proc/sysrq-trigger", O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
     const bool isWritten = trigger >= 0 && write(trigger, "b", 1) == 1;
     if (!isWritten) {
-        _events.troubleBegan("reboot at the peer's order", errno);
+        _events.troubleBegan("reboot at the peer's request", errno);
     }
     if (trigger >= 0) {
         close(trigger);

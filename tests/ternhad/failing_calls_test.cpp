@@ -97,7 +97,7 @@ TEST_F(FailingCallsTest, UnsentProbesAreLoggedOnceAndKeepThePeerAlive) {
     EXPECT_FALSE(test::eventually(3s, [] { return !isPeerAlive(); }));
     test::removeTree("/tmp/no-buffers");
     EXPECT_TRUE(test::eventually(
-        20s, [] { return test::wholeLog().find("Can again send liveness probes\n") != std::string::npos; }));
+        20s, [] { return test::wholeLog().find("Can send liveness probes again\n") != std::string::npos; }));
     const std::string log = test::wholeLog();
     EXPECT_EQ(log.find("Cannot send"), log.rfind("Cannot send"));
     EXPECT_THAT(log, Not(HasSubstr("changed to dead")));
@@ -149,7 +149,7 @@ TEST_F(FailingCallsTest, LateFlushCostsNoProcessorTime) {
     test::writeFile("/tmp/hanging-sync", "");
     orderReboot();
     ASSERT_TRUE(test::eventually(20s, [] {
-        return test::wholeLog().find("Cannot reboot at the peer's order: Is a directory") !=
+        return test::wholeLog().find("Cannot reboot at the peer's request: Is a directory") !=
                std::string::npos;
     }));
     test::removeTree("/tmp/hanging-sync");
@@ -288,7 +288,7 @@ TEST_F(FailingCallsTest, HungLogKeeperIsReplacedAndLeftBehind) {
     test::writeFile("/tmp/an-hour-later", "");
     EXPECT_TRUE(test::eventually(20s, [&] {
         daemon->signal(SIGHUP);
-        return test::wholeLog().find("The log keeper hangs, another takes its place") != std::string::npos;
+        return test::wholeLog().find("The log keeper hangs: replacing it") != std::string::npos;
     }));
     EXPECT_TRUE(test::eventually(20s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
     EXPECT_EQ(kill(keeper, 0), 0) << "it is not left behind, but gone";

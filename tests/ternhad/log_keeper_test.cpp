@@ -44,7 +44,7 @@ TEST_F(LogKeeperTest, IsRestartedWhenItDies) {
     daemon->signal(SIGHUP);
     EXPECT_TRUE(test::eventually(20s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
     EXPECT_THAT(test::wholeLog() + test::run({"xz", "-dc", "/var/log/ha/ha.daemon.log.0.xz"}).output,
-                HasSubstr("The log keeper has died, another is started"));
+                HasSubstr("The log keeper has exited: restarting it"));
     expectEndInTime();
 }
 

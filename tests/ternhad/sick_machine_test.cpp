@@ -65,7 +65,7 @@ TEST_F(SickMachineTest, FailedRebootIsReplied) {
     start();
     EXPECT_TRUE(replies("reboot_remote"));
     EXPECT_TRUE(test::eventually(10s, [] {
-        return test::wholeLog().find("Cannot reboot at the peer's order: Is a directory") !=
+        return test::wholeLog().find("Cannot reboot at the peer's request: Is a directory") !=
                std::string::npos;
     }));
     expectEndInTime();

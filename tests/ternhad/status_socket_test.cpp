@@ -102,7 +102,7 @@ TEST_F(StatusSocketTest, DaemonRunsWithoutItUntilItCanBeCreated) {
         test::eventually(20s, [] { return !test::statusAt("/run/missing/below/status.sock").isNull(); }));
     EXPECT_EQ(test::run({"stat", "-c", "%a %G", "/run/missing/below/status.sock"}).output, "660 daemon\n");
     EXPECT_TRUE(test::eventually(10s, [] {
-        return test::wholeLog().find(" The socket /run/missing/below/status.sock is there now\n") !=
+        return test::wholeLog().find(" Created the socket /run/missing/below/status.sock\n") !=
                std::string::npos;
     }));
     EXPECT_THAT(test::wholeLog(), Not(HasSubstr("vanished")));
