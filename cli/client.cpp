@@ -36,7 +36,7 @@ Json::Value parse(const std::string& text) {
             return value;
         }
     } catch (const Json::Exception&) {
-        // Nested past the parser's limit.
+        // Nested deeper than the parser's limit.
     }
     throw NoAnswer(NOT_TERNHADS);
 }
@@ -52,7 +52,7 @@ int connectedSocket(const Settings& settings, const Deadline& deadline) {
     if (fd < 0) {
         failWithError();
     }
-    // Also limits the wait for a place in the queue. 0 would be no limit.
+    // Also limits the wait for the backlog. 0 would mean no limit.
     const auto rest =
         std::chrono::duration_cast<std::chrono::microseconds>(deadline.time - Deadline::Clock::now());
     const auto limit = std::max(rest, std::chrono::microseconds(1)).count();
@@ -102,7 +102,7 @@ Connection::Input Connection::receive(Clock::time_point deadline) {
             }
             _buffer.append(part.data(), static_cast<std::size_t>(count));
             if (_buffer.size() > LONGEST_REPLY) {
-                throw NoAnswer(NOT_TERNHADS);  // it may never end, nor leave a moment in which the time is up
+                throw NoAnswer(NOT_TERNHADS);  // an endless reply would also prevent the timeout
             }
             return count > 0 ? Input::Data : Input::End;
         }

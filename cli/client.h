@@ -11,20 +11,21 @@
 
 namespace ternhactl {
 
-// What ternhad sends in place of a reply that it refuses; a reason follows.
+// Prefix of what ternhad sends for a refused request; the reason follows.
 inline constexpr char REFUSAL[] = "refused: ";
 
-// The daemon does not answer; what() tells why.
+// The daemon does not reply; what() is the reason.
 struct NoAnswer : std::runtime_error {
     using std::runtime_error::runtime_error;
 };
 
-// The daemon closed the connection without a reply: it does not know the request, or serves no more clients.
+// The daemon closed the connection without a reply: it does not know the request or is out of
+// connections.
 struct Refused : NoAnswer {
     using NoAnswer::NoAnswer;
 };
 
-// When to give up: after `seconds` from now, whatever the daemon does.
+// Return the deadline `seconds` from now.
 struct Deadline {
     using Clock = std::chrono::steady_clock;
 
@@ -35,20 +36,20 @@ struct Deadline {
     Clock::time_point time;
 };
 
-// A connection to the daemon that carries one request.
+// A connection to the daemon for one request.
 class Connection {
  public:
     using Clock = Deadline::Clock;
 
-    // Connects and sends {"act": `action`}. Throws NoAnswer.
+    // Connect and send {"act": `action`}. Throws NoAnswer.
     Connection(const Settings& settings, const std::string& action, const Deadline& deadline);
     ~Connection();
 
     Connection(const Connection&) = delete;
     Connection& operator=(const Connection&) = delete;
 
-    // The reply up to the end of the connection, or of its next line for replies of several. Nothing when
-    // `deadline` has passed first; throws Refused at the end of the connection.
+    // Return the reply up to the end of the connection, or its next line. Returns nothing on
+    // timeout; throws Refused if the connection ended without one.
     std::optional<Json::Value> reply(Clock::time_point deadline);
     std::optional<Json::Value> line(Clock::time_point deadline);
 
@@ -60,7 +61,7 @@ class Connection {
     std::string _buffer;
 };
 
-// The reply to {"act": `action`}, which must come by `deadline`. Throws NoAnswer.
+// Return the reply to {"act": `action`}, which must arrive by `deadline`. Throws NoAnswer.
 Json::Value ask(const Settings& settings, const std::string& action, const Deadline& deadline);
 
 }  // namespace ternhactl

@@ -2,7 +2,7 @@
 
 #include "settings.h"
 
-// The commands. Each prints to standard output and throws NoAnswer when the daemon does not answer.
+// The commands. Each prints to standard output and throws NoAnswer if the daemon does not reply.
 namespace ternhactl {
 
 ExitCode status(const Settings& settings);
@@ -14,7 +14,7 @@ ExitCode printMetrics(const Settings& settings);
 ExitCode wait(const Settings& settings);
 ExitCode events(const Settings& settings);
 
-// Tells on standard error that the daemon does not answer, and why.
+// Print to standard error that the daemon does not reply, and why.
 void complain(const Settings& settings, const char* reason);
 
 }  // namespace ternhactl

@@ -18,8 +18,8 @@ constexpr char LOST[] = "lost";  // the event in place of those that the daemon 
 
 constexpr auto NO_LIMIT = std::chrono::hours(24 * 365);
 
-// Asks for the changes. The first line of the reply is the report, which tells what holds already; a line for
-// each change follows as it comes.
+// Request the event stream. The first line of the reply is the report, which has the current state;
+// each event follows as a line.
 Json::Value firstLine(Connection& connection, const Deadline& deadline) {
     auto line = connection.line(deadline.time);
     if (!line) {
@@ -38,7 +38,7 @@ std::string when(const Json::Value& event) {
     return time.isNumeric() ? timeStamp(time.asDouble()) : "unknown";
 }
 
-// What was last known of a dead peer holds no longer.
+// The last known state of a dead peer no longer holds.
 bool holds(const Report& report, const std::string& condition) {
     return std::any_of(flagNames().begin(), flagNames().end(), [&](const FlagName& name) {
         const Report::Flag& flag = report.*name.flag;

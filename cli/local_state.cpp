@@ -12,7 +12,7 @@ namespace ternhactl {
 
 namespace {
 
-// As the library tells connected from not connected.
+// The states that the library counts as connected.
 bool isLinked(const std::string& state) {
     static constexpr std::array<std::string_view, 13> LINKED = {
         "WFReportParams", "Connected",  "StartingSyncS", "StartingSyncT", "WFBitMapS",
@@ -21,7 +21,7 @@ bool isLinked(const std::string& state) {
     return std::find(LINKED.begin(), LINKED.end(), state) != LINKED.end();
 }
 
-// The value of the word "KEY:VALUE"; empty without one.
+// Return the value of the word "KEY:VALUE", or the empty string.
 std::string valueOf(const std::vector<std::string>& words, const std::string& key) {
     for (const std::string& word : words) {
         if (word.rfind(key + ':', 0) == 0) {
@@ -31,7 +31,7 @@ std::string valueOf(const std::vector<std::string>& words, const std::string& ke
     return {};
 }
 
-// A line as " 0: cs:Connected ro:Primary/Secondary ds:UpToDate/UpToDate C r-----".
+// Parse a line such as " 0: cs:Connected ro:Primary/Secondary ds:UpToDate/UpToDate C r-----".
 void readResource(const std::vector<std::string>& words, LocalState& state) {
     const std::string name = "DRBD " + words.front().substr(0, words.front().find(':'));
     const std::string link = valueOf(words, "cs");
@@ -51,7 +51,7 @@ void readResource(const std::vector<std::string>& words, LocalState& state) {
     if (const std::string own = replicas.substr(0, slash); own != "UpToDate") {
         state.replicaProblems.push_back(name + " replica " + own);
     }
-    // Without a connection the peer's replica is not known to be any better.
+    // Without a connection, the state of the peer's replica is unknown.
     if (const std::string peer = replicas.substr(slash + 1); isConnected && peer != "UpToDate") {
         state.peerReplicaProblems.push_back(name + " peer's replica " + peer);
     }
@@ -87,7 +87,7 @@ std::string firstWord(const std::filesystem::path& path) {
     return word;
 }
 
-// The entries of a directory whose names begin with `prefix`, sorted.
+// Return the entries of a directory whose names begin with `prefix`, sorted.
 std::vector<std::filesystem::path> entries(const char* directory, const std::string& prefix) {
     std::vector<std::filesystem::path> found;
     std::error_code error;

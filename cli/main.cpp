@@ -82,11 +82,11 @@ void addCommands(CLI::App& app, Settings& settings, Command& command) {
         ->type_name("FILE");
 }
 
-// The one line of a plugin that cannot tell.
+// Print the one line of a plugin whose result is unknown.
 ExitCode unknown(const std::string& reason) {
     std::string line = reason.substr(0, reason.find('\n'));
     for (char& c : line) {
-        c = c == '|' ? '/' : c;  // performance data would begin there
+        c = c == '|' ? '/' : c;  // it would start performance data
     }
     std::cout << "TERNHA UNKNOWN - " << line << '\n' << std::flush;
     return ExitCode::NoAnswer;
@@ -99,7 +99,7 @@ std::string noAnswer(const Settings& settings, const std::string& reason) {
     return "ternhad does not answer on " + settings.socket + ": " + reason;
 }
 
-// Right after a write has failed. `error`: errno
+// To be called right after a failed write. error: errno
 ExitCode outputError(int error, ExitCode code) {
     std::cerr << "ternhactl: cannot write to standard output: " << std::strerror(error) << '\n';
     return code;
@@ -174,12 +174,12 @@ int main(int argc, char** argv) try {
     using ternhactl::ExitCode;
     bool isPlugin = false;
     try {
-        // Where a write fails, and not later: errno has the cause.
+        // Throw where a write fails, because errno has the cause there.
         std::cout.exceptions(std::ios::badbit | std::ios::failbit);
         return static_cast<int>(ternhactl::run(argc, argv, isPlugin));
     } catch (const std::ios::failure&) {
         const int error = errno;
-        std::cout.exceptions(std::ios::goodbit);  // it is flushed once more at the end
+        std::cout.exceptions(std::ios::goodbit);  // it is flushed again at exit
         const auto code = isPlugin ? ExitCode::NoAnswer : ExitCode::OutputError;
         return static_cast<int>(ternhactl::outputError(error, code));
     }

@@ -46,7 +46,7 @@ class Text {
     std::ostringstream _text;
 };
 
-// Device names are the kernel's or the peer's word: they must not break the line that quotes them.
+// Escape device names, which come from the kernel or the peer.
 std::string quoted(const std::string& text) {
     std::string escaped = "\"";
     for (const char c : text) {
@@ -163,13 +163,13 @@ std::string metricsOfNoDaemon() {
 }
 
 void writeAtomically(const std::string& path, const std::string& text) {
-    // Collectors read *.prom: the name of the unfinished file must not end so.
+    // Collectors read *.prom: the temporary name must not end like that.
     std::string unfinished = path + ".XXXXXX";
     const int fd = mkostemp(unfinished.data(), O_CLOEXEC);
     if (fd < 0) {
         failWith(errno, path);
     }
-    fchmod(fd, READABLE);  // whatever the umask is
+    fchmod(fd, READABLE);  // independent of the umask
     const ssize_t written = write(fd, text.data(), text.size());
     int error = written < 0 ? errno : 0;
     if (error == 0 && written != static_cast<ssize_t>(text.size())) {

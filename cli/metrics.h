@@ -8,14 +8,13 @@
 
 namespace ternhactl {
 
-// Prometheus' text format. What is unknown or stale has no sample.
+// Format in the text format of Prometheus. Unknown and stale values have no sample.
 std::string metrics(const Report& report, const LocalState& local, const Verdict& verdict);
 
-// The same when the daemon does not answer.
+// The same while the daemon does not reply.
 std::string metricsOfNoDaemon();
 
-// Replaces `path` in one step, readable by all: a collector sees the old text or the new one. Throws
-// std::system_error.
+// Atomically replace `path` by a file that everybody can read. Throws std::system_error.
 void writeAtomically(const std::string& path, const std::string& text);
 
 }  // namespace ternhactl

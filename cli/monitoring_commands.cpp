@@ -14,7 +14,7 @@ ExitCode check(const Settings& settings) {
     const LocalState local = readLocalState();
     const Verdict result = settings.isSelfOnly ? verdictOfNode(report, local) : verdict(report, local);
     std::cout << (settings.isSelfOnly ? pluginLine(result) : pluginLine(report, result)) << '\n';
-    return static_cast<ExitCode>(result.level);  // the levels are the convention's exit codes
+    return static_cast<ExitCode>(result.level);  // levels are the exit codes of monitoring plugins
 }
 
 ExitCode printMetrics(const Settings& settings) {

@@ -10,12 +10,12 @@ namespace ternhactl {
 
 namespace {
 
-constexpr unsigned int REBOOT_TIMEOUT = 40;  // seconds; the daemon follows the peer down for up to 33
+constexpr unsigned int REBOOT_TIMEOUT = 40;  // seconds; the daemon waits up to 33 for the peer to go down
 
 constexpr char WAS_DEAD[] = "was-dead";
 constexpr char WENT_DOWN[] = "went-down";
 
-// Asks on the terminal; anything but "y" or "yes" is no.
+// Ask on the terminal; anything but "y" or "yes" means no.
 bool confirm() {
     std::cout << "Reboot the peer at once, without a shutdown? [y/N] " << std::flush;
     std::string answer;
@@ -23,7 +23,7 @@ bool confirm() {
     return answer == "y" || answer == "Y" || answer == "yes";
 }
 
-// An older daemon does not tell.
+// Older daemons do not report it.
 std::string outcomeOf(const Report& before, const Report& after) {
     if (!after.orderOutcome.empty()) {
         return after.orderOutcome;
@@ -34,8 +34,8 @@ std::string outcomeOf(const Report& before, const Report& after) {
     return after.peerAlive.is(false) ? WENT_DOWN : "still-answers";
 }
 
-// Orders the reboot and fetches what became of it. False, after a message on standard error, when that is
-// unknown; throws NoAnswer when nothing was ordered.
+// Request the reboot and fetch its outcome. Returns false, after a message on standard error, if
+// the outcome is unknown; throws NoAnswer if nothing was requested.
 bool order(const Settings& settings, std::optional<Report>& after) {
     const Deadline deadline(REBOOT_TIMEOUT);
     Connection connection(settings, "R", deadline);

@@ -6,7 +6,7 @@ namespace ternhactl {
 
 namespace {
 
-// jsoncpp throws when a member of something other than an object is asked for.
+// jsoncpp throws if a member of something other than an object is requested.
 const Json::Value& member(const Json::Value& object, const char* key) {
     return object.isObject() ? object[key] : Json::Value::nullSingleton();
 }
@@ -32,7 +32,7 @@ std::optional<std::vector<std::string>> names(const Json::Value& value) {
     return result;
 }
 
-// An older daemon does not tell.
+// Older daemons do not report it.
 bool isStale(const Json::Value& json, bool otherwise) {
     const Json::Value& value = member(json, "stale");
     return value.isBool() ? value.asBool() : otherwise;
@@ -46,7 +46,7 @@ Report::Flag flag(const Json::Value& json) {
             number(member(json, "checked")), isStale(json, false)};
 }
 
-// What the peer said or was needed for is stale when it is not alive.
+// Values that come from the peer or need it are stale while it is not alive.
 Report::Flag peerFlag(const Json::Value& json, const Report& report) {
     Report::Flag result = flag(json);
     result.isStale = isStale(json, !report.peerAlive.is(true));
@@ -60,7 +60,7 @@ Report::Figure figure(const Json::Value& json, bool isStaleOtherwise) {
     return {number(member(json, "value")), number(member(json, "time")), isStale(json, isStaleOtherwise)};
 }
 
-// How people call a node: its name, else its address.
+// Display name of a node: its hostname, or else its address.
 std::string label(const Json::Value& node, const char* otherwise) {
     for (const char* key : {"name", "address"}) {
         std::string found = text(member(node, key));
@@ -77,7 +77,7 @@ Json::Value valueOnly(const Json::Value& value) {
     return json;
 }
 
-// An older daemon knows neither names nor times. Its latency is 0 when it was not measured.
+// Older daemons know neither names nor times; an unknown latency is 0 there.
 Json::Value reportOf(const Json::Value& record, bool isRebooting) {
     Json::Value report(Json::objectValue);
     report["version"] = 1;

@@ -11,14 +11,14 @@
 
 namespace ternhactl {
 
-// What the daemon knows, read from its report (version 1). What is missing, null or of a wrong type is
-// unknown. Times are seconds since 1970.
+// The daemon's state, read from its report (version 1). Values that are missing, null or of a wrong
+// type are unknown. Times are seconds since 1970.
 struct Report {
     struct Flag {
         std::optional<bool> value;
         std::optional<double> since;
         std::optional<std::uint64_t> changes;
-        std::optional<double> checked;  // when a check has found the value last
+        std::optional<double> checked;  // when a check last confirmed the value
         bool isStale = false;           // the value is the last known one
 
         bool isKnown() const { return value && !isStale; }
@@ -36,7 +36,7 @@ struct Report {
     explicit Report(const Json::Value& json);
 
     std::optional<double> time;     // of the report
-    std::string version;            // of the daemon; empty for one that does not tell
+    std::string version;            // of the daemon; empty for older ones
     std::optional<double> started;  // the daemon
     std::string node;               // name, else address, else "this node"
     std::string peer;               // the same of the peer
@@ -65,7 +65,7 @@ inline constexpr char TOO_MANY_DISKS[] = "more disks than a report holds";
 
 using FlagMember = Report::Flag Report::*;
 
-// A flag of the report, and what it is called: in events and metrics, and when it is set or clear.
+// A flag of the report with its names: in events and metrics, and of both its conditions.
 struct FlagName {
     const char* name;
     const char* set;
@@ -74,10 +74,11 @@ struct FlagName {
 };
 const std::vector<FlagName>& flagNames();
 
-// The daemon's status record as it is. Throws NoAnswer.
+// Return the daemon's status record as it is. Throws NoAnswer.
 Json::Value fetchRecord(const Settings& settings);
 
-// The daemon's report, version 1. For an older daemon one that is made of its record. Throws NoAnswer.
+// Return version 1 of the daemon's report; built from the status record for older daemons. Throws
+// NoAnswer.
 Json::Value fetchReport(const Settings& settings);
 
 }  // namespace ternhactl

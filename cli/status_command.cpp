@@ -15,7 +15,7 @@ namespace ternhactl {
 namespace {
 
 constexpr char CLEAR_SCREEN[] = "\033[H\033[2J";
-constexpr std::size_t HISTORY = 60;  // latencies that are drawn
+constexpr std::size_t HISTORY = 60;  // number of latencies in the graph
 
 std::string compact(const Json::Value& value) {
     Json::StreamWriterBuilder builder;
@@ -27,7 +27,7 @@ std::string asJson(const Settings& settings) {
     return compact(settings.json == Settings::Json::Record ? fetchRecord(settings) : fetchReport(settings));
 }
 
-// The status for people, drawn again and again; when the daemon stops, the last one stays.
+// Print the status repeatedly; when the daemon stops, the last one stays on the screen.
 class Watch {
  public:
     Watch(const Settings& settings, bool useColour) : _settings(settings), _useColour(useColour) {}

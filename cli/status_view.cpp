@@ -46,7 +46,7 @@ Look troubleIf(bool isTrouble) {
     return isTrouble ? Look::Trouble : Look::Normal;
 }
 
-// What users call the peer's disks. A disk that the table does not know keeps its device name.
+// Human-readable names of the peer's disks; device names for those not in the table.
 std::vector<std::string> readable(const std::vector<std::string>& devices) {
     std::vector<std::string> result;
     for (const std::string& device : devices) {
@@ -161,7 +161,7 @@ void addLink(View& view, const Report& report, const LocalState& local, double n
     addFigure(view, "non-OK packets", report.nonOkRate, 100, 2, " %", now);
 }
 
-// A line for each name; without any, none when that is certain.
+// Print a line for each name, and none if it is certain that there are no disks.
 std::string disksOf(const std::string& owner, const Report::Flag& flag, std::vector<std::string> names,
                     double now) {
     if (!flag.value) {

@@ -9,16 +9,17 @@
 
 namespace ternhactl {
 
-// The headline and the table that `status` prints. With `useColour` trouble is red, and what is stale dim.
+// The headline and the table that `status` prints. With `useColour`, problems are red and stale
+// values dim.
 std::string statusView(const Report& report, const LocalState& local, bool useColour);
 
 // `text`, dim if `useColour`.
 std::string dimmed(const std::string& text, bool useColour);
 
-// The names that users see for the disks under error handling on both nodes, a line each.
+// The human-readable names of the disks under error handling on both nodes, one per line.
 std::string diskList(const Report& report);
 
-// Values as a line of blocks, the largest one as a full block; a dot for one that is unknown.
+// Format values as a line of blocks, the largest one as a full block, unknown ones as dots.
 std::string blocks(const std::vector<std::optional<double>>& values);
 
 }  // namespace ternhactl

@@ -15,7 +15,7 @@ void append(Reasons& to, const Reasons& from) {
     to.insert(to.end(), from.begin(), from.end());
 }
 
-// What was wrong with a peer that can no longer be asked.
+// Last known problems of a peer that is no longer alive.
 Reasons lastKnownTrouble(const Report& report, double now) {
     Reasons found;
     if (report.peerResync.isStale && report.peerResync.value == true) {
@@ -31,12 +31,12 @@ Reasons lastKnownTrouble(const Report& report, double now) {
     return {"peer's last known state" + age + ": " + joined(found)};
 }
 
-// A flag that no check tells of: "not known yet", or the age of what it told last.
+// A flag without a recent check: "not known yet", or the age of its last known value.
 std::string unknownState(const Report::Flag& flag, const char* verb, double now) {
     return flag.value ? lastKnown(flag.checked, now) : std::string("not ") + verb + " yet";
 }
 
-// The older of two flags that must both be known; null when they are.
+// Return the older of two flags that must both be known; null if they are.
 const Report::Flag* unknownOf(const Report::Flag& a, const Report::Flag& b) {
     if (!a.isKnown()) {
         return &a;
@@ -44,7 +44,7 @@ const Report::Flag* unknownOf(const Report::Flag& a, const Report::Flag& b) {
     return b.isKnown() ? nullptr : &b;
 }
 
-// One figure of the performance data.
+// Format one value of the performance data.
 std::string figure(const char* name, const std::string& value, const char* limits) {
     return std::string(name) + '=' + value + limits;
 }

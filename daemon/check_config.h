@@ -10,7 +10,7 @@ namespace ternhad {
 // Return the values in effect in the format of the configuration file.
 std::string configurationText(const Options& options);
 
-// What is allowed but hardly meant, or not so yet.
+// Return warnings about values that are valid but probably wrong.
 std::vector<std::string> warningsOf(const Options& options);
 
 }  // namespace ternhad

@@ -12,7 +12,7 @@ namespace {
 
 constexpr char BYTE_ORDER_MARK[] = "\xEF\xBB\xBF";
 
-// A mistake in the file whose place the message tells already.
+// An error in the file whose message already has its location.
 class LocatedError : public CLI::ConfigError {
  public:
     LocatedError(const std::string& place, const std::string& reason)
@@ -25,7 +25,7 @@ bool isGiven(const std::string& option, const std::vector<std::string>& argument
     });
 }
 
-// Whether `text` speaks of the option, not of another one whose name is longer.
+// Return whether `text` names the option, and not one whose longer name begins with it.
 bool names(const std::string& text, const std::string& option) {
     const std::size_t place = text.find(option);
     if (place == std::string::npos) {
@@ -36,14 +36,14 @@ bool names(const std::string& text, const std::string& option) {
            (std::isalnum(static_cast<unsigned char>(text[end])) == 0 && text[end] != '-');
 }
 
-// Whether a comment follows the value, which may contain one in quotes.
+// Return whether a comment follows the value, which may contain one in quotes.
 bool hasComment(const std::string& value) {
     const std::string trimmed = CLI::detail::trim_copy(value);
     const bool isQuoted = !trimmed.empty() && (trimmed.front() == '"' || trimmed.front() == '\'');
     return !isQuoted && (value.find(" #") != std::string::npos || value.find(" ;") != std::string::npos);
 }
 
-// Why the file cannot be read. A directory can be opened, but not read.
+// Return why the file cannot be read. A directory can be opened, but not read.
 std::string reasonOf(const std::string& path) {
     errno = 0;
     std::ifstream(path).peek();
@@ -105,7 +105,7 @@ std::string ConfigFile::located(const CLI::ParseError& error,
     if (dynamic_cast<const CLI::FileError*>(&error) != nullptr) {
         return path() + ": " + reasonOf(path());
     }
-    // The option that the message begins with is to blame before one that it mentions.
+    // Prefer the option that begins the message to others that it mentions.
     for (const bool isSubject : {true, false}) {
         for (const auto& [name, line] : _lines) {
             const std::string option = "--" + name;

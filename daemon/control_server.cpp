@@ -17,14 +17,14 @@ namespace ternhad {
 
 namespace {
 
-constexpr unsigned int CLIENT_TIMEOUT = 0;  // a client's; this end does not use it
+constexpr unsigned int CLIENT_TIMEOUT = 0;  // of clients only
 constexpr auto SILENCE_LIMIT = std::chrono::seconds(5);
-constexpr auto ROUND = std::chrono::seconds(5);  // between two looks at the socket file
+constexpr auto ROUND = std::chrono::seconds(5);  // between two checks of the socket file
 constexpr std::size_t MOST_CLIENTS = 16;
-constexpr auto OBEYED = std::chrono::seconds(6);  // after an order a peer that obeys replies no more
+constexpr auto OBEYED = std::chrono::seconds(6);  // a rebooting peer stops replying by then
 constexpr char RESTORING[] = "create the missing socket";
 constexpr char ACCEPTING[] = "accept control clients";
-constexpr char ORDER = 'R';  // the actions
+constexpr char ORDER = 'R';  // the actions of requests
 constexpr char REPORT = 'S';
 constexpr char EVENTS = 'E';
 
@@ -66,7 +66,7 @@ bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Val
     const auto start = Clock::now();
     const bool isServed = MonitordSocket::serverHandle(request, reply);
     if (!wasAlive && !wasRebooting) {
-        // Nobody knows whether it heard the order.
+        // A dead peer may not have received the request.
         _orders->status().delRemoteNodeState(TERN::HA::Daemon::NodeRebooting);
     }
     if (!wasAlive) {
@@ -81,8 +81,8 @@ bool ControlServer::Endpoint::serverHandle(const Json::Value& request, Json::Val
     return isServed;
 }
 
-// The library has waited until the peer was dead, or for 30 seconds. With a long `dead-after` a peer that
-// went down is not dead yet: what counts is whether it has replied since.
+// The library has waited until the peer was dead, or for 30 seconds. With a long `dead-after`, a peer
+// that went down is not dead yet: the time of its last reply counts.
 bool ControlServer::Endpoint::hasGoneDown(Clock::time_point start) const {
     return !_orders->isPeerAlive() || _orders->findings().lastReplyTime() < start + OBEYED;
 }
@@ -165,7 +165,7 @@ void ControlServer::acceptClients() {
         const int fd = accept4(_listener.fd(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
         if (fd < 0) {
             if (errno != EAGAIN && errno != EINTR && errno != ECONNABORTED) {
-                _isFull = true;  // back off for a round: the lack would recur immediately
+                _isFull = true;  // back off for a round: the failure would recur immediately
                 if (!wasFull) {
                     _events.troubleBegan(ACCEPTING, errno);
                 }
@@ -178,7 +178,7 @@ void ControlServer::acceptClients() {
     }
 }
 
-// Serves the client if its request has come. False while it is waited for.
+// Serve the client if its request has arrived. Returns false while waiting for it.
 bool ControlServer::serve(const Client& client) {
     pollfd state = {client.fd, POLLIN, 0};
     if (poll(&state, 1, 0) == 0 && Clock::now() < client.deadline) {
@@ -201,7 +201,7 @@ bool ControlServer::serve(const Client& client) {
     return true;
 }
 
-// The events go to the client from now on.
+// Turn the connection into an event stream.
 void ControlServer::follow(int fd) {
     if (!_streams.add(fd)) {
         refuse(fd, "too many clients follow the events");

@@ -11,30 +11,30 @@
 
 namespace ternhad {
 
-// What the daemon has found out and the health record has no place for. Thread-safe.
+// Data about peer and link that the status record has no field for. Thread-safe.
 class Findings {
  public:
     struct Figure {
         std::optional<double> value;
         std::chrono::system_clock::time_point time;  // of the measurement
-        Clock::time_point measured;                  // the same
+        Clock::time_point measured;                  // the same on the monotonic clock
         bool isStale = false;                        // a later measurement has failed
     };
 
-    // What became of an order to reboot the peer.
+    // Outcome of a reboot request to the peer.
     enum class OrderOutcome { none, wentDown, stillAnswers, wasDead, wasUnknown };
 
-    // The peer has replied to a liveness probe. Neither blocks nor allocates.
+    // Record a reply to a liveness probe. Neither blocks nor allocates.
     void peerReplied() noexcept {
         _lastReply = secondsOf(wallClock());
         _lastReplyTime = Clock::now();
     }
 
-    // Seconds since 1970, 0 before the first reply.
+    // Seconds since 1970; 0 before the first reply.
     double lastReply() const noexcept { return _lastReply; }
     Clock::time_point lastReplyTime() const noexcept { return _lastReplyTime; }
 
-    // Of the latest order that has ended.
+    // Outcome of the latest completed request.
     void setOrderOutcome(OrderOutcome outcome) noexcept { _orderOutcome = outcome; }
     OrderOutcome orderOutcome() const noexcept { return _orderOutcome; }
 
@@ -47,7 +47,7 @@ class Findings {
         return _peerName;
     }
 
-    // The version of this node's DRBD when it is not 8, the only one that tells whether it is connected.
+    // Version of this node's DRBD unless it is 8, the only one whose connection state is known.
     void setUnsupportedDrbd(const std::string& version) {
         const std::lock_guard<std::mutex> lock(_mutex);
         _unsupportedDrbd = version;
@@ -57,19 +57,19 @@ class Findings {
         return _unsupportedDrbd;
     }
 
-    // Whether the peer's report could be read: without it the names of its disks are unknown.
+    // Whether the peer's disk report could be parsed: otherwise the names of its disks are unknown.
     void setPeerDisksKnown(bool areKnown) noexcept { _arePeerDisksKnown = areKnown; }
     bool arePeerDisksKnown() const noexcept { return _arePeerDisksKnown; }
 
     void setLatency(double milliseconds) { set(_latency, milliseconds); }
 
-    // The last one, if any, is the last known from now on.
+    // Mark the last value, if any, as stale.
     void setLatencyStale() {
         const std::lock_guard<std::mutex> lock(_mutex);
         _latency.isStale = true;
     }
 
-    // Nothing: it is unknown from now on.
+    // std::nullopt: unknown from now on.
     void setNonOkRate(std::optional<double> rate) { set(_nonOkRate, rate); }
 
     Figure latency() const { return get(_latency); }

@@ -12,8 +12,8 @@
 
 namespace ternhad {
 
-// The node's health record, and the one place through which its flags change: the record first, then the
-// trace. Thread-safe.
+// The status record of this node, and the only place that changes its flags: stores the change
+// first, then records the event. Thread-safe.
 class Health {
  public:
     // `staleAfter`: see Transitions.
@@ -23,20 +23,21 @@ class Health {
 
     bool isPeerAlive() const noexcept { return _status.isRemoteAlive(); }
 
-    // Nothing until the peer has replied, or could have for long enough.
+    // Nothing until the peer has replied, or has not for `dead-after`.
     bool isPeerKnown() const noexcept { return _transitions.state(Flag::peerAlive).value.has_value(); }
 
-    // The outcome of the liveness probes, as Status::setRemoteAlive stores it; do not call before there is
-    // one. Waits for nothing but the record's lock, under which nobody waits.
+    // Store the outcome of the liveness probes as Status::setRemoteAlive does; not to be called
+    // while it is unknown. Blocks only for the lock of the record, which is never held while
+    // blocking.
     void setPeerAlive(bool isAlive) noexcept;
 
-    // The peer has replied to a liveness probe: it is no longer being rebooted.
+    // Record a reply to a liveness probe: the peer is no longer being rebooted.
     void peerReplied() noexcept;
 
-    // Any other flag.
+    // Store any other flag.
     void set(Flag flag, bool value) noexcept;
 
-    // Stores whether the peer is being rebooted as the record has it now.
+    // Copy the reboot state of the record to the transitions.
     void updatePeerRebooting() noexcept {
         _transitions.found(Flag::peerRebooting, _status.isRemoteRebooting());
     }
@@ -46,11 +47,11 @@ class Health {
     Findings& findings() noexcept { return _findings; }
     const Findings& findings() const noexcept { return _findings; }
 
-    // This node's own host name; empty while unknown.
+    // This node's own hostname; empty while unknown.
     std::string hostname() const;
     void setHostname(const std::string& name);
 
-    // Set when the peer has become alive, and when something has changed that is worth a snapshot.
+    // Set when the peer has become alive, and when a transition calls for a snapshot.
     Event& peerAppeared() noexcept { return _peerAppeared; }
     Event& snapshotWanted() noexcept { return _snapshotWanted; }
 
@@ -61,7 +62,7 @@ class Health {
     TERN::HA::Daemon::Status _status;
     Transitions _transitions;
     Findings _findings;
-    mutable std::mutex _mutex;  // guards the name
+    mutable std::mutex _mutex;  // guards the hostname
     std::string _hostname;
     Event _peerAppeared;
     Event _snapshotWanted;

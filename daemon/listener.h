@@ -8,10 +8,10 @@
 
 namespace ternhad {
 
-// A listening local socket and its file. For one thread.
+// A listening Unix socket and its file. Not thread-safe.
 class Listener {
  public:
-    // `directoryMode`: of the socket's directory, should it vanish.
+    // directoryMode: mode of the socket's directory if it must be recreated.
     Listener(std::string path, mode_t directoryMode)
         : _path(std::move(path)), _directoryMode(directoryMode) {}
     ~Listener() { close(); }
@@ -19,24 +19,24 @@ class Listener {
     Listener(const Listener&) = delete;
     Listener& operator=(const Listener&) = delete;
 
-    // Makes the socket file, in place of one that a former daemon has left, and its directory if that is
-    // missing but the one above is not, and listens. False, with errno,
-    // when that fails; EEXIST when something else than a socket has the name.
+    // Create the socket file, replacing that of an earlier daemon, and its directory if only that
+    // is missing, and listen. Returns false with errno on failure; EEXIST if the path is not a
+    // socket.
     bool listen();
 
-    // Gives the socket file, which listen() makes, to a group: it may connect. Call first.
+    // Allow `group` to connect to the socket. To be called before listen().
     void shareWith(gid_t group) { _group = group; }
 
-    // False once somebody has removed or replaced the socket file.
+    // False if the socket file was removed or replaced.
     bool hasFile() const;
 
-    // True once it has listened.
+    // True once listen() has succeeded.
     bool hasHadFile() const { return _inode != 0; }
 
-    // Removes the socket file if it is still this listener's.
+    // Remove the socket file if it is still this listener's.
     void removeFile() const;
 
-    int fd() const { return _fd; }  // -1 when it does not listen
+    int fd() const { return _fd; }  // -1 while not listening
     const std::string& path() const { return _path; }
 
  private:

@@ -17,7 +17,7 @@ namespace ternhad {
 
 namespace {
 
-// The version that /proc/drbd begins with, unless it is 8: others do not list their connections there.
+// Return the version in /proc/drbd unless it is 8; others do not list their connections there.
 std::string unsupportedDrbd() {
     std::ifstream file("/proc/drbd");
     std::string word;
@@ -76,7 +76,7 @@ void NodeWatcher::checkDrbd() {
     if (unsupported.empty()) {
         _health.set(Flag::drbdConnected, isConnected);
     } else {
-        _health.status().isDRBDConnect = isConnected;  // as the record has it; the flag stays unknown
+        _health.status().isDRBDConnect = isConnected;  // in the record only; the flag stays unknown
     }
 }
 
