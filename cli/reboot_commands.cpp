@@ -52,7 +52,7 @@ bool order(const Settings& settings, std::optional<Report>& after) {
             throw;
         }
         complain(settings, error.what());
-        std::cerr << "ternhactl: the order was " << done << ", its outcome is unknown\n";
+        std::cerr << "ternhactl: the reboot request was " << done << ", its outcome is unknown\n";
         return false;
     }
 }
@@ -75,18 +75,18 @@ ExitCode rebootPeer(const Settings& settings) {
         std::cout << "The peer is being rebooted already. Nothing done.\n";
         return ExitCode::No;
     }
-    std::cout << "Ordering the reboot and following the peer down, up to 33 seconds...\n" << std::flush;
+    std::cout << "Requesting the reboot, waiting up to 33 seconds for the peer to go down...\n" << std::flush;
     std::optional<Report> after;
     if (!order(settings, after)) {
         return ExitCode::Unknown;
     }
     if (!before.peerAlive.value) {
-        std::cout << "The peer had not replied yet: nobody knows whether it heard the order.\n";
+        std::cout << "The peer had not replied yet: it may not have received the request.\n";
         return ExitCode::No;
     }
     const std::string outcome = outcomeOf(before, *after);
     if (outcome == WAS_DEAD) {
-        std::cout << "The peer was already dead: nobody knows whether it heard the order.\n";
+        std::cout << "The peer was already dead: it may not have received the request.\n";
         return ExitCode::No;
     }
     if (outcome != WENT_DOWN) {

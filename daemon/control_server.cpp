@@ -217,7 +217,7 @@ void ControlServer::order(int fd) {
         _ordered.set();
         return;
     } else {
-        refuse(fd, "an earlier order to reboot the peer is still being carried out");
+        refuse(fd, "another reboot request is still in progress");
     }
     close(fd);
 }
@@ -237,7 +237,7 @@ void ControlServer::carryOutOrder() {
     if (_health.isPeerAlive()) {
         state = "is alive";
     }
-    TERNHAD_LOG(_events, "Reboot of the peer ordered, which " + state);
+    TERNHAD_LOG(_events, "Requesting a reboot of the peer, which " + state);
     _orders.serve(_orderer);
     if (_shutdown.isRequested()) {
         return;

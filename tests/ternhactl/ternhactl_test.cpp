@@ -468,8 +468,7 @@ TEST_F(TernhactlTest, ReportsTheOutcomeOfAReboot) {
     const ControlServer server(status);
     const auto dead = shell("ternhactl reboot-peer --yes");
     EXPECT_EQ(dead.exitCode, 1);
-    EXPECT_THAT(dead.output,
-                EndsWith("The peer was already dead: nobody knows whether it heard the order.\n"));
+    EXPECT_THAT(dead.output, EndsWith("The peer was already dead: it may not have received the request.\n"));
 
     status.setRemoteAlive(true);
     test::Process obeyed({"/bin/bash", "-c", TERNHACTL_DIR "/ternhactl reboot-peer --yes"});
@@ -512,8 +511,8 @@ TEST_F(TernhactlTest, ReportsAnOrderWhoseOutcomeIsUnknown) {
         EXPECT_EQ(result.exitCode, 2);
         EXPECT_THAT(result.output, HasSubstr(silence));
         EXPECT_THAT(result.output,
-                    EndsWith(isCarriedOut ? "the order was carried out, its outcome is unknown\n"
-                                          : "the order was sent, its outcome is unknown\n"));
+                    EndsWith(isCarriedOut ? "the reboot request was carried out, its outcome is unknown\n"
+                                          : "the reboot request was sent, its outcome is unknown\n"));
     }
 }
 

@@ -51,7 +51,7 @@ TEST_F(RebootOrderTest, PeerThatIgnoresItWasNotRebooted) {
     b.start();
     ASSERT_TRUE(test::eventually(20s, [this] { return a.sees("isRemoteAlive", true); }));
     test::Process ordered = a.node.start({TERNHACTL, "reboot-peer", "--yes"});
-    EXPECT_TRUE(eventuallyLogs("Reboot of the peer ordered, which is alive"));
+    EXPECT_TRUE(eventuallyLogs("Requesting a reboot of the peer, which is alive"));
     // Nobody else waits for it.
     EXPECT_TRUE(test::eventually(10s, [&] { return isRebooting("yes\n"); }));
     EXPECT_THAT(a.node.run({TERNHACTL, "check"}).output, HasSubstr("peer being rebooted"));
@@ -74,8 +74,7 @@ TEST_F(RebootOrderTest, ObeyingPeerWentDownAndDeadPeerWasAlreadyDead) {
 
     const auto again = order();
     EXPECT_EQ(again.exitCode, 1);
-    EXPECT_THAT(again.output,
-                EndsWith("The peer was already dead: nobody knows whether it heard the order.\n"));
+    EXPECT_THAT(again.output, EndsWith("The peer was already dead: it may not have received the request.\n"));
     EXPECT_TRUE(eventuallyLogs("Reboot of the peer: it was already dead"));
 }
 
@@ -95,8 +94,8 @@ TEST_F(RebootOrderTest, PeerThatHasNotRepliedYetIsNeitherDeadNorAlive) {
     const auto result = order();
     EXPECT_EQ(result.exitCode, 1);
     EXPECT_THAT(result.output,
-                EndsWith("The peer had not replied yet: nobody knows whether it heard the order.\n"));
-    EXPECT_TRUE(eventuallyLogs("Reboot of the peer ordered, which has not replied yet"));
+                EndsWith("The peer had not replied yet: it may not have received the request.\n"));
+    EXPECT_TRUE(eventuallyLogs("Requesting a reboot of the peer, which has not replied yet"));
     EXPECT_TRUE(eventuallyLogs("Reboot of the peer: unknown, it had not replied yet"));
     EXPECT_THAT(a.node.run({TERNHACTL, "status", "--json=1"}).output,
                 HasSubstr(R"("orderOutcome":"was-unknown")"));

@@ -47,7 +47,7 @@ TEST_F(StatusSocketTest, ServesItsGroupAndRefusesReboots) {
         HasSubstr("ternhactl: ternhad on /run/ternha/status.sock refused: this socket is read-only\n"));
     EXPECT_THAT(runAs(1, "status").output, HasSubstr("Permission denied"));
     EXPECT_THAT(runAs(2, socket + " status").output, HasSubstr("Permission denied"));
-    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("Reboot of the peer ordered")));
+    EXPECT_THAT(test::wholeLog(), Not(HasSubstr("Requesting a reboot of the peer")));
     daemon.signal(SIGTERM);
     EXPECT_TRUE(daemon.waitFor(10s).has_value());
     EXPECT_FALSE(test::exists(STATUS_SOCKET));
