@@ -52,7 +52,7 @@ TEST_F(FailingCallsTest, LackOfDescriptorsMeansNeitherDeadPeerNorDiskErrors) {
     const auto logs = [](const std::string& line) {
         return test::eventually(20s, [&] { return test::wholeLog().find(line) != std::string::npos; });
     };
-    EXPECT_TRUE(logs("Can again accept control clients\n"));  // the log could not be opened before
+    EXPECT_TRUE(logs("Can accept control clients again\n"));  // the log could not be opened before
     EXPECT_THAT(test::wholeLog(), Not(HasSubstr("changed to dead")));
     expectEndInTime();
 }
