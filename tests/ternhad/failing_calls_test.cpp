@@ -73,7 +73,7 @@ TEST_F(FailingCallsTest, ConnectionsThatCannotBeAcceptedAreLoggedOnce) {
     EXPECT_TRUE(test::eventually(20s, [&] { return count(lack) == 1; }));
     EXPECT_FALSE(test::eventually(6s, [&] { return count(lack) == 2; }));
     test::removeTree("/tmp/no-connections");
-    EXPECT_TRUE(test::eventually(20s, [&] { return count("Can again accept control clients\n") == 1; }));
+    EXPECT_TRUE(test::eventually(20s, [&] { return count("Can accept control clients again\n") == 1; }));
     EXPECT_TRUE(isPeerAlive());
     expectEndInTime();
 }
