@@ -1,6 +1,7 @@
 #include "config_file.h"
 
 #include <algorithm>
+#include <cctype>
 #include <cerrno>
 #include <cstring>
 #include <fstream>
@@ -36,11 +37,18 @@ bool names(const std::string& text, const std::string& option) {
            (std::isalnum(static_cast<unsigned char>(text[end])) == 0 && text[end] != '-');
 }
 
-// Return whether a comment follows the value, which may contain one in quotes.
-bool hasComment(const std::string& value) {
+// What is wrong with the blanks in a value, if anything is. It may contain everything in quotes.
+const char* mistakeIn(const std::string& value) {
     const std::string trimmed = CLI::detail::trim_copy(value);
-    const bool isQuoted = !trimmed.empty() && (trimmed.front() == '"' || trimmed.front() == '\'');
-    return !isQuoted && (value.find(" #") != std::string::npos || value.find(" ;") != std::string::npos);
+    if (trimmed.empty() || trimmed.front() == '"' || trimmed.front() == '\'') {
+        return nullptr;
+    }
+    const std::size_t mark = value.find_first_of("#;");
+    if (mark != std::string::npos &&
+        (mark == 0 || std::isspace(static_cast<unsigned char>(value[mark - 1])) != 0)) {
+        return "a comment needs a line of its own: ";
+    }
+    return trimmed.find_first_of(" \t") != std::string::npos ? "a value with blanks needs quotes: " : nullptr;
 }
 
 // Return why the file cannot be read. A directory can be opened, but not read.
@@ -77,8 +85,8 @@ void ConfigFile::scan(const std::string& text) const {
         if (name.empty() || option == nullptr || !option->get_configurable()) {
             throw LocatedError(place, "unknown name: " + name);
         }
-        if (hasComment(line.substr(equals + 1))) {
-            throw LocatedError(place, "a comment needs a line of its own: " + line);
+        if (const char* const mistake = mistakeIn(line.substr(equals + 1))) {
+            throw LocatedError(place, mistake + line);
         }
         const auto [known, isNew] = _lines.insert({name, {number, line}});
         if (!isNew) {
