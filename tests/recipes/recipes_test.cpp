@@ -14,7 +14,6 @@ namespace {
 
 using namespace std::chrono_literals;
 using ::testing::HasSubstr;
-using ::testing::Not;
 using ::testing::StartsWith;
 
 constexpr char SYNC_ACTION[] = "/sys/block/md0/md/sync_action";
