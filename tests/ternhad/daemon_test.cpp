@@ -406,7 +406,9 @@ TEST_F(DaemonTest, FailedCompressionKeepsTheArchives) {
 TEST_F(DaemonTest, ExitsWhenTheAddressIsNotLocal) {
     const auto result = test::run(test::daemonArguments("10.9.8.7", "127.0.0.2", "lo"));
     EXPECT_EQ(result.exitCode, 1);
-    EXPECT_EQ(result.error, "ternhad: cannot serve the peer on 10.9.8.7: Cannot assign requested address\n");
+    EXPECT_EQ(result.error,
+              "ternhad: interface lo does not have the address 10.9.8.7\n"
+              "ternhad: cannot serve the peer on 10.9.8.7: Cannot assign requested address\n");
 }
 
 TEST_F(DaemonTest, ExitsWhenThePortIsTaken) {
