@@ -37,7 +37,7 @@ bool names(const std::string& text, const std::string& option) {
            (std::isalnum(static_cast<unsigned char>(text[end])) == 0 && text[end] != '-');
 }
 
-// What is wrong with the blanks in a value, if anything is. It may contain everything in quotes.
+// Return what is wrong with the blanks in a value, or null. It may contain everything in quotes.
 const char* mistakeIn(const std::string& value) {
     const std::string trimmed = CLI::detail::trim_copy(value);
     if (trimmed.empty() || trimmed.front() == '"' || trimmed.front() == '\'') {
