@@ -5,7 +5,6 @@
 #include <unistd.h>
 
 #include <array>
-#include <cerrno>
 #include <climits>
 #include <csignal>
 #include <string>
@@ -84,9 +83,6 @@ int keepLogs(std::int64_t rotateSize) {
     std::array<char, PIPE_BUF> request;
     for (;;) {
         const ssize_t size = read(STDIN_FILENO, request.data(), request.size());
-        if (size < 0 && errno == EINTR) {
-            continue;
-        }
         if (size <= 0) {
             return 0;  // the daemon closed the pipe
         }
