@@ -1,3 +1,4 @@
+#include <fcntl.h>
 #include <malloc.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
@@ -18,6 +19,7 @@ namespace ternhad {
 
 using TERN::HA::Daemon::DaemonLog;
 using TERN::HA::Daemon::daemonLog;
+using TERN::HA::Daemon::LOG_DIR;
 using TERN::HA::Daemon::recordLog;
 
 namespace {
@@ -34,14 +36,18 @@ class Mover {
  public:
     Mover(DaemonLog& log, std::int64_t rotateSize) : _log(log), _rotateSize(rotateSize) {}
 
-    void move(bool rotateNow) {
+    // Returns whether anything was written to the disk.
+    bool move(bool rotateNow) {
+        const std::int64_t before = _log.size();
         _log.writeLogToDisk();
         if (rotateNow || _log.size() >= _nextRotation) {
             _log.rotate();
             // If the compression failed, the log stays large, and each further attempt drops an
             // archive.
             _nextRotation = _log.size() + _rotateSize;
+            return true;
         }
+        return _log.size() != before;
     }
 
  private:
@@ -49,6 +55,15 @@ class Mover {
     std::int64_t _rotateSize;
     std::int64_t _nextRotation = _rotateSize;
 };
+
+// Otherwise a loss of power would take lines that had been moved half a minute before.
+void flushDisk() {
+    const int directory = open(LOG_DIR, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    if (directory >= 0) {
+        (void)syncfs(directory);
+        close(directory);
+    }
+}
 
 void limitMemory(rlim_t bytes) {
     rlimit limit = {};
@@ -77,8 +92,13 @@ int keepLogs(std::int64_t rotateSize) {
     Mover daemonMover(*daemonLog, rotateSize);
     Mover recordMover(*recordLog, rotateSize);
     const auto moveBoth = [&](bool rotateNow) {
-        attempt([&] { daemonMover.move(rotateNow); });
-        attempt([&] { recordMover.move(rotateNow); });
+        bool hasWritten = false;
+        for (Mover* mover : {&daemonMover, &recordMover}) {
+            attempt([&] { hasWritten |= mover->move(rotateNow); });
+        }
+        if (hasWritten) {
+            flushDisk();
+        }
     };
     std::array<char, PIPE_BUF> request;
     for (;;) {

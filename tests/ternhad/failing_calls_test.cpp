@@ -323,4 +323,15 @@ TEST_F(FailingCallsTest, StatusSocketRefusesARebootRequestInPieces) {
     EXPECT_FALSE(test::statusAt("/run/ternha/status.sock").isNull());
 }
 
+TEST_F(FailingCallsTest, MoveOfTheLogFlushesItsDisk) {
+    start({"--log-interval", "3600"});
+    EXPECT_FALSE(test::exists("/tmp/flushed"));
+    daemon->signal(SIGHUP);
+    const auto isFlushed = [] {
+        return test::exists("/tmp/flushed") && test::readFile("/tmp/flushed") == "/var/log/ha";
+    };
+    EXPECT_TRUE(test::eventually(20s, isFlushed));
+    expectEndInTime();
+}
+
 }  // namespace
