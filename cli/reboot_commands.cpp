@@ -34,9 +34,9 @@ std::string outcomeOf(const Report& before, const Report& after) {
     return after.peerAlive.is(false) ? WENT_DOWN : "still-answers";
 }
 
-// Request the reboot and fetch its outcome. Returns false, after a message on standard error, if
-// the outcome is unknown; throws NoAnswer if nothing was requested.
-bool order(const Settings& settings, std::optional<Report>& after) {
+// Request the reboot and fetch the report with its outcome. Returns nothing, after a message on
+// standard error, if the outcome is unknown; throws NoAnswer if nothing was requested.
+std::optional<Report> order(const Settings& settings) {
     const Deadline deadline(REBOOT_TIMEOUT);
     Connection connection(settings, "R", deadline);
     const char* done = "sent";
@@ -45,15 +45,14 @@ bool order(const Settings& settings, std::optional<Report>& after) {
             throw NoAnswer("no reply within " + std::to_string(deadline.seconds) + " s");
         }
         done = "carried out";
-        after.emplace(fetchReport(settings));
-        return true;
+        return Report(fetchReport(settings));
     } catch (const NoAnswer& error) {
         if (std::string(error.what()).rfind(REFUSAL, 0) == 0) {
             throw;
         }
         complain(settings, error.what());
         std::cerr << "ternhactl: the reboot request was " << done << ", its outcome is unknown\n";
-        return false;
+        return std::nullopt;
     }
 }
 
@@ -76,8 +75,8 @@ ExitCode rebootPeer(const Settings& settings) {
         return ExitCode::No;
     }
     std::cout << "Requesting the reboot, waiting up to 33 seconds for the peer to go down...\n" << std::flush;
-    std::optional<Report> after;
-    if (!order(settings, after)) {
+    const std::optional<Report> after = order(settings);
+    if (!after) {
         return ExitCode::Unknown;
     }
     if (!before.peerAlive.value) {

@@ -40,6 +40,7 @@ std::vector<std::string> environmentOf(const Transition& transition, const std::
 // Return a null-terminated vector of pointers into `texts`.
 std::vector<char*> pointersTo(std::vector<std::string>& texts) {
     std::vector<char*> pointers;
+    pointers.reserve(texts.size() + 1);
     for (std::string& text : texts) {
         pointers.push_back(text.data());
     }
