@@ -48,6 +48,42 @@ TEST_F(LogKeeperTest, IsRestartedWhenItDies) {
     expectEndInTime();
 }
 
+TEST_F(LogKeeperTest, RestartsLeaveNoDescriptorOpen) {
+    start();
+    const auto descriptors = [this] {
+        const std::filesystem::directory_iterator all("/proc/" + std::to_string(daemon->pid()) + "/fd");
+        return std::distance(begin(all), end(all));
+    };
+    const auto before = descriptors();
+    for (int i = 0; i < 5; ++i) {
+        const pid_t keeper = test::childOf(daemon->pid());
+        ASSERT_GT(keeper, 0);
+        kill(keeper, SIGKILL);
+        ASSERT_TRUE(test::eventually(20s, [&] {
+            const pid_t next = test::childOf(daemon->pid());
+            return next > 0 && next != keeper;
+        }));
+    }
+    // A program that runs takes two for a while.
+    EXPECT_TRUE(test::eventually(10s, [&] { return descriptors() <= before; })) << descriptors();
+    expectEndInTime();
+}
+
+TEST_F(LogKeeperTest, MovesTheLogOnceInAnInterval) {
+    start({"--log-interval", "8", "--dead-after", "0.6"});
+    ASSERT_TRUE(test::eventually(30s, [] { return test::exists(test::LOG_FILE); }));
+    const test::Stopwatch sinceMove;
+    peer.reset();
+    const std::string line = "changed to dead";
+    ASSERT_TRUE(test::eventually(10s, [&] { return test::wholeLog().find(line) != std::string::npos; }));
+    // On a machine that took too long the next move may have come.
+    EXPECT_FALSE(test::eventually(1s, [&] {
+        return sinceMove.elapsed() < 6s && test::readFile(test::LOG_FILE).find(line) != std::string::npos;
+    }));
+    expectEndInTime();
+    EXPECT_THAT(test::readFile(test::LOG_FILE), HasSubstr(line));
+}
+
 TEST_F(LogKeeperTest, DiesWithTheDaemon) {
     start();
     const pid_t keeper = test::childOf(daemon->pid());

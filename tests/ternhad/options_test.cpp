@@ -116,6 +116,7 @@ INSTANTIATE_TEST_SUITE_P(
                    "--check-interval: above a third of --dead-after"},
         WrongUsage{"WordForInterval", plus({"--log-interval", "often"}), "--log-interval"},
         WrongUsage{"SmallRotateSize", plus({"--rotate-size", "1"}), "--rotate-size: "},
+        WrongUsage{"LargeRotateSize", plus({"--rotate-size", "1099511627777"}), "--rotate-size: "},
         WrongUsage{"Unknown", plus({"--frobnicate"}), "--frobnicate"},
         WrongUsage{"NoSuchConfiguration", plus({"--config", "/nowhere.conf"}), "/nowhere.conf"}),
     [](const auto& usage) { return usage.param.name; });
