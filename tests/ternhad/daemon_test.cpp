@@ -234,7 +234,7 @@ TEST_F(DaemonTest, ControlSocketThatCannotBeCreatedAgainIsLoggedOnce) {
     auto daemon = startAndWait();
     test::removeTree(test::CONTROL_SOCKET);
     test::writeFile(test::CONTROL_SOCKET, "");
-    const std::string line = "Cannot make the missing socket: File exists\n";
+    const std::string line = "Cannot create the missing socket: File exists\n";
     EXPECT_TRUE(test::eventually(15s, [&] { return test::wholeLog().find(line) != std::string::npos; }));
     EXPECT_FALSE(test::eventually(6s, [&] {
         const std::string log = test::wholeLog();

@@ -193,7 +193,7 @@ TEST_F(FailingCallsTest, WallClockStepsChangeNothing) {
     expectEndInTime();
 }
 
-#ifndef IS_EMULATED  // user-mode emulation knows no ptrace, and no limit of memory
+#ifndef IS_EMULATED  // user-mode emulation has no ptrace and no memory limit, but threads of its own
 // Holds a process as a hanging disk would: when it is killed, it is not gone until the object is.
 class Undying {
  public:
@@ -301,6 +301,13 @@ TEST_F(FailingCallsTest, HungLogKeeperIsReplacedAndLeftBehind) {
     test::removeTree("/tmp/an-hour-later");
     expectEndInTime();
     EXPECT_EQ(kill(keeper, 0), 0);
+}
+
+TEST_F(FailingCallsTest, LogKeeperHasANameOfItsOwn) {
+    start();
+    const std::string name = "/proc/" + std::to_string(test::childOf(daemon->pid())) + "/comm";
+    EXPECT_TRUE(test::eventually(10s, [&] { return test::readFile(name) == "ternhad-logs\n"; }));
+    expectEndInTime();
 }
 
 TEST_F(FailingCallsTest, SnapshotLeavesOutWhatDoesNotFitItsMemory) {

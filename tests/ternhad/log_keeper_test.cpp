@@ -92,13 +92,6 @@ TEST_F(LogKeeperTest, DiesWithTheDaemon) {
     EXPECT_TRUE(test::eventually(10s, [&] { return kill(keeper, 0) != 0; }));
 }
 
-TEST_F(LogKeeperTest, HasANameOfItsOwn) {
-    start();
-    const std::string name = "/proc/" + std::to_string(test::childOf(daemon->pid())) + "/comm";
-    EXPECT_TRUE(test::eventually(10s, [&] { return test::readFile(name) == "ternhad-logs\n"; }));
-    expectEndInTime();
-}
-
 TEST_F(LogKeeperTest, HoldsNoSocket) {
     start();
     const pid_t keeper = test::childOf(daemon->pid());
