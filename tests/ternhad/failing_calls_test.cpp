@@ -1,5 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/mman.h>
 #include <sys/ptrace.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
@@ -193,7 +194,7 @@ TEST_F(FailingCallsTest, WallClockStepsChangeNothing) {
     expectEndInTime();
 }
 
-#ifndef IS_EMULATED  // user-mode emulation has no ptrace and no memory limit, but threads of its own
+#ifndef IS_EMULATED  // user-mode emulation has no ptrace and no memory limits, but threads of its own
 // Holds a process as a hanging disk would: when it is killed, it is not gone until the object is.
 class Undying {
  public:
@@ -307,6 +308,28 @@ TEST_F(FailingCallsTest, LogKeeperHasANameOfItsOwn) {
     start();
     const std::string name = "/proc/" + std::to_string(test::childOf(daemon->pid())) + "/comm";
     EXPECT_TRUE(test::eventually(10s, [&] { return test::readFile(name) == "ternhad-logs\n"; }));
+    expectEndInTime();
+}
+
+// Nobody but root may usually lock more memory than a limit.
+bool isLockingPermitted() {
+    rlimit limit = {};
+    getrlimit(RLIMIT_MEMLOCK, &limit);
+    const std::size_t size = (limit.rlim_cur == RLIM_INFINITY ? 0 : limit.rlim_cur) + 4096;
+    void* const memory = mmap(nullptr, size, PROT_READ, MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0);
+    const bool isPermitted = memory != MAP_FAILED && mlock2(memory, size, MLOCK_ONFAULT) == 0;
+    munmap(memory, size);
+    return isPermitted;
+}
+
+TEST_F(FailingCallsTest, MemoryInUseStaysInMemory) {
+    start();
+    const std::string status = "/proc/" + std::to_string(daemon->pid()) + "/status";
+    if (isLockingPermitted()) {
+        EXPECT_TRUE(test::eventually(10s, [&] {
+            return test::readFile(status).find("VmLck:\t       0 kB") == std::string::npos;
+        })) << test::readFile(status);
+    }
     expectEndInTime();
 }
 
