@@ -6,8 +6,8 @@
 #include <array>
 #include <cerrno>
 #include <cstdlib>
-#include <exception>
 #include <memory>
+#include <new>
 #include <string>
 
 #include "chkstate.h"
@@ -77,7 +77,7 @@ void PeerServer::serve(Socket& socket) noexcept {
                 return;
             }
             serveOne(socket, request);
-        } catch (const std::exception&) {
+        } catch (const std::bad_alloc&) {
             reportTrouble(ENOMEM);
         }
     }

@@ -7,7 +7,7 @@
 
 #include <array>
 #include <cerrno>
-#include <exception>
+#include <new>
 
 #include "checker.h"
 #include "chkstate.h"
@@ -165,7 +165,7 @@ void Prober::receive(FailureDetector& detector) noexcept {
                     _health.peerReplied();
                 }
             }
-        } catch (const std::exception&) {
+        } catch (const std::bad_alloc&) {
             continue;  // out of memory for a reply longer than the expected one
         }
     }

@@ -13,10 +13,10 @@
 #include <cstdarg>
 #include <cstdio>
 #include <cstring>
-#include <exception>
 #include <map>
 #include <memory>
 #include <mutex>
+#include <new>
 #include <optional>
 #include <sstream>
 #include <string>
@@ -207,7 +207,7 @@ int PLATExec(const char* path, ...) try {
     }
     va_end(arguments);
     return PLATExecv(path, argv.data(), 1);
-} catch (const std::exception&) {
+} catch (const std::bad_alloc&) {
     return FAILURE;
 }
 
@@ -248,12 +248,12 @@ FILE* PLATPopenv(const char* path, const char* mode, const char* const argv[]) t
     const std::lock_guard<std::mutex> lock(streamsMutex);
     table.insert(std::move(node));
     return stream.release();
-} catch (const std::exception&) {
+} catch (const std::bad_alloc&) {
     errno = ENOMEM;
     return nullptr;
 }
 
-int PLATPclose(FILE* stream) try {
+int PLATPclose(FILE* stream) {
     pid_t pid = 0;
     {
         const std::lock_guard<std::mutex> lock(streamsMutex);
@@ -267,9 +267,6 @@ int PLATPclose(FILE* stream) try {
     }
     (void)std::fclose(stream);  // the program's end tells how it went
     return waitForEnd(pid);
-} catch (const std::exception&) {
-    errno = ENOMEM;
-    return FAILURE;
 }
 
 int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size, int flags) try {
@@ -298,7 +295,7 @@ int PLATFileGetKeyValue(const char* file, const char* key, char* value, int size
         return 1;
     }
     return stream.bad() ? FAILURE : 0;
-} catch (const std::exception&) {
+} catch (const std::bad_alloc&) {
     return FAILURE;
 }
 
@@ -322,7 +319,7 @@ int TERNDiskGetDevnamebyAtaPort(char* name, int size, const char* port) try {
         return 0;
     }
     return FAILURE;
-} catch (const std::exception&) {
+} catch (const std::bad_alloc&) {
     return FAILURE;
 }
 }

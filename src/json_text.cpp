@@ -17,7 +17,7 @@ bool parseJson(const std::string& text, Json::Value& value) {
         value.swap(parsed);
         return true;
     } catch (const Json::Exception&) {
-        return false;  // nested past the reader's limit
+        return false;  // nested past the reader's limit, or out of memory
     }
 }
 

@@ -109,7 +109,11 @@ TEST_F(RebootTest, WaitsForASilentPeerUntilItIsDeclaredDead) {
     });
     EXPECT_TRUE(RebootRemote()(status));
     EXPECT_THAT(test::FastSleep::sleeps(), SizeIs(2));
-    EXPECT_THAT(test::daemonLogMessages().back(), test::LogLine("checker.cpp", "Remote offline"));
+    EXPECT_THAT(test::daemonLogMessages(),
+                ElementsAre(test::LogLine("status.cpp", "Remote server status changed to alive"),
+                            test::LogLine("checker.cpp", "Failed to reboot remote, but keep checking"),
+                            test::LogLine("status.cpp", "Remote server status changed to dead"),
+                            test::LogLine("checker.cpp", "Remote offline")));
     EXPECT_EQ(status.getRemoteNodeState(), NodeRebooting);
 }
 

@@ -79,6 +79,15 @@ TEST_F(StatusLockTest, SetDisksProceedsWithoutTheLock) {
     EXPECT_EQ(status.getErrHandlingDisk(), disks("sdx"));
 }
 
+TEST_F(StatusLockTest, WaitLastsAsLongAsItsTimeout) {
+    status.lockTimeout = 1;
+    const Holder holder(status.errHandlingDiskMutex);
+    const test::Stopwatch stopwatch;
+    EXPECT_EQ(status.getErrHandlingDisk(), disks("sda"));
+    EXPECT_GE(stopwatch.elapsed(), 1s);
+    EXPECT_LT(stopwatch.elapsed(), 4s);
+}
+
 TEST_F(StatusLockTest, WaitIsUnaffectedByAForwardClockStep) {
     test::stepClockAfterNextRead(1h);
     expectToProceed(status.errHandlingDiskMutex,

@@ -75,7 +75,8 @@ TEST_F(StatusSocketTest, DirectoryIsTraversableButNotListable) {
     ASSERT_EQ(test::run({"mkdir", "-m", "700", "/run/private"}).exitCode, 0);
     for (const auto& [directory, mode] : {std::pair("/run/private", "700\n"), {"/run/monitoring", "711\n"}}) {
         auto another = start(directory + std::string("/status.sock"));
-        EXPECT_EQ(test::run({"stat", "-c", "%a", directory}).output, mode) << directory;
+        const std::vector<std::string> stat = {"stat", "-c", "%a", directory};
+        EXPECT_TRUE(test::eventually(10s, [&] { return test::run(stat).output == mode; })) << directory;
         another.signal(SIGTERM);
         EXPECT_TRUE(another.waitFor(10s).has_value());
     }
