@@ -76,7 +76,8 @@ TEST_F(StatusSocketTest, DirectoryIsTraversableButNotListable) {
     for (const auto& [directory, mode] : {std::pair("/run/private", "700\n"), {"/run/monitoring", "711\n"}}) {
         auto another = start(directory + std::string("/status.sock"));
         const std::vector<std::string> stat = {"stat", "-c", "%a", directory};
-        EXPECT_TRUE(test::eventually(10s, [&] { return test::run(stat).output == mode; })) << directory;
+        const std::string expected = mode;
+        EXPECT_TRUE(test::eventually(10s, [&] { return test::run(stat).output == expected; })) << stat.back();
         another.signal(SIGTERM);
         EXPECT_TRUE(another.waitFor(10s).has_value());
     }
