@@ -10,7 +10,20 @@ namespace {
 using namespace std::chrono_literals;
 using ::testing::HasSubstr;
 using ::testing::Not;
-using LogKeeperTest = test::SickMachineTest;
+
+class LogKeeperTest : public test::SickMachineTest {
+ protected:
+    // Kills the log keeper and waits for the next.
+    void replaceKeeper() {
+        const pid_t keeper = test::childOf(daemon->pid());
+        ASSERT_GT(keeper, 0);
+        kill(keeper, SIGKILL);
+        ASSERT_TRUE(test::eventually(20s, [&] {
+            const pid_t next = test::childOf(daemon->pid());
+            return next > 0 && next != keeper;
+        }));
+    }
+};
 
 TEST_F(LogKeeperTest, HungLogDiskDelaysNeitherStopNorRestart) {
     start({"--log-interval", "0.1"});
@@ -34,13 +47,7 @@ TEST_F(LogKeeperTest, HungCompressionDelaysNoStopAndLosesNoLine) {
 
 TEST_F(LogKeeperTest, IsRestartedWhenItDies) {
     start({"--log-interval", "3600"});
-    const pid_t keeper = test::childOf(daemon->pid());
-    ASSERT_GT(keeper, 0);
-    kill(keeper, SIGKILL);
-    ASSERT_TRUE(test::eventually(20s, [&] {
-        const pid_t next = test::childOf(daemon->pid());
-        return next > 0 && next != keeper;
-    }));
+    ASSERT_NO_FATAL_FAILURE(replaceKeeper());
     daemon->signal(SIGHUP);
     EXPECT_TRUE(test::eventually(20s, [] { return test::exists("/var/log/ha/ha.daemon.log.0.xz"); }));
     EXPECT_THAT(test::wholeLog() + test::run({"xz", "-dc", "/var/log/ha/ha.daemon.log.0.xz"}).output,
@@ -56,13 +63,7 @@ TEST_F(LogKeeperTest, RestartsLeaveNoDescriptorOpen) {
     };
     const auto before = descriptors();
     for (int i = 0; i < 5; ++i) {
-        const pid_t keeper = test::childOf(daemon->pid());
-        ASSERT_GT(keeper, 0);
-        kill(keeper, SIGKILL);
-        ASSERT_TRUE(test::eventually(20s, [&] {
-            const pid_t next = test::childOf(daemon->pid());
-            return next > 0 && next != keeper;
-        }));
+        ASSERT_NO_FATAL_FAILURE(replaceKeeper());
     }
     // A program that runs takes two for a while.
     EXPECT_TRUE(test::eventually(10s, [&] { return descriptors() <= before; })) << descriptors();
