@@ -8,6 +8,7 @@
 
 #include "chkstate.h"
 #include "ha_log.h"
+#include "json_text.h"
 #include "status.h"
 
 namespace {
@@ -102,6 +103,8 @@ bool SocketServer::operator()(TERN::HA::Daemon::Status& status) try {
     return true;
 } catch (const std::bad_alloc&) {
     return true;  // the request gets no reply
+} catch (const TERN::HA::Daemon::JsonOutOfMemory&) {
+    return true;
 }
 
 std::string drbdIF(const std::string& value) {

@@ -52,6 +52,14 @@ class EmptyReply : public EnvCheck {
 };
 const CheckerRegister<EmptyReply> emptyReply("test_empty_reply");
 
+// Has no memory for JSON.
+class JsonReply : public EnvCheck {
+    std::string handle(Status&) override {
+        throw Json::RuntimeError("Failed to allocate string value buffer");
+    }
+};
+const CheckerRegister<JsonReply> jsonReply("test_json_reply");
+
 // Larger than any datagram.
 class HugeReply : public EnvCheck {
     std::string handle(Status&) override { return std::string(65508, 'x'); }
@@ -99,6 +107,12 @@ TEST_F(ServerTest, RepliesToTheSendersAddressAndPort) {
     EXPECT_EQ(reply->address, SERVER);
     EXPECT_EQ(reply->port, 7499);
     EXPECT_EQ(test::bufferText(), "");
+}
+
+TEST_F(ServerTest, OutOfMemoryForJsonDropsTheRequest) {
+    EXPECT_THAT(repliesTo("test_json_reply"), IsEmpty());
+    EXPECT_EQ(test::bufferText(), "");
+    EXPECT_THAT(repliesTo("is_alive"), ElementsAre("alive"));
 }
 
 TEST_F(ServerTest, RepliesFromTheStatusOfThePass) {
