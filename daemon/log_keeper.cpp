@@ -209,6 +209,7 @@ void LogKeeper::sendNext() {
 
 void LogKeeper::finish(Clock::time_point deadline) {
     takeReply();
+    reap();
     if (_process >= 0 && _busySince && !isDoneBy(std::min(deadline, Clock::now() + GRACE))) {
         leaveBehind(SIGTERM);  // xz removes its incomplete output
     }

@@ -2,6 +2,7 @@
 #include <syslog.h>
 
 #include <cerrno>
+#include <csignal>
 #include <cstdlib>
 #include <cstring>
 #include <iostream>
@@ -58,6 +59,8 @@ int main(int argc, char** argv) try {
         return ternhad::isPrinted() ? EXIT_SUCCESS : FAILURE;
     }
     openlog("ternhad", LOG_PID, LOG_DAEMON);
+    // The log keeper or the reader of standard error may exit at any time.
+    (void)std::signal(SIGPIPE, SIG_IGN);
     return run(options);
 } catch (const std::exception& error) {
     std::cerr << "ternhad: " << error.what() << '\n';

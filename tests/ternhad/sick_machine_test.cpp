@@ -59,6 +59,14 @@ TEST_F(SickMachineTest, RebootDoesNotWaitOnAHealthyMachine) {
     EXPECT_TRUE(test::eventually(4s, isRebooted)) << "the deadline is for what hangs";
 }
 
+TEST_F(SickMachineTest, SurvivesTheReaderOfItsStandardError) {
+    prefix = {"bash", "-c", R"(exec 2> >(exec true); wait $!; exec "$@")", "sh"};
+    start();
+    peer.reset();
+    EXPECT_TRUE(test::eventually(6s, [] { return !isPeerAlive(); }));
+    expectEndInTime();
+}
+
 TEST_F(SickMachineTest, FailedRebootIsReplied) {
     test::removeTree(test::TRIGGER);
     test::makeDirectories(test::TRIGGER);
