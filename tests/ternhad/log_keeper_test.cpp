@@ -70,6 +70,19 @@ TEST_F(LogKeeperTest, RestartsLeaveNoDescriptorOpen) {
     expectEndInTime();
 }
 
+TEST_F(LogKeeperTest, DeathJustBeforeTheStopLosesNoLine) {
+    start({"--log-interval", "3600"});
+    ASSERT_NO_FATAL_FAILURE(replaceKeeper());  // the new one has nothing to do
+    const pid_t keeper = test::childOf(daemon->pid());
+    ASSERT_GT(keeper, 0);
+    daemon->signal(SIGSTOP);
+    kill(keeper, SIGKILL);
+    daemon->signal(SIGTERM);
+    daemon->signal(SIGCONT);
+    expectEndInTime();
+    EXPECT_THAT(test::readFile(test::LOG_FILE), HasSubstr("Stopping"));
+}
+
 TEST_F(LogKeeperTest, MovesTheLogOnceInAnInterval) {
     start({"--log-interval", "8", "--dead-after", "0.6"});
     ASSERT_TRUE(test::eventually(30s, [] { return test::exists(test::LOG_FILE); }));

@@ -8,6 +8,7 @@
 #include <chrono>
 #include <csignal>
 #include <cstdio>
+#include <fstream>
 #include <optional>
 #include <string>
 #include <thread>
@@ -75,8 +76,10 @@ inline void hang(const char* file) {
 
 // The log keeper of a daemon; -1 while there is none.
 inline pid_t childOf(pid_t process) {
-    const auto result = run({"pgrep", "-P", std::to_string(process), "ternhad"});
-    return result.exitCode == 0 ? std::stoi(result.output) : -1;
+    const std::string name = std::to_string(process);  // of the thread that starts log keepers, too
+    std::ifstream children("/proc/" + name + "/task/" + name + "/children");
+    pid_t child = -1;
+    return children >> child ? child : -1;
 }
 
 // A daemon on 127.0.0.1, on a machine that gets sick while its peer at 127.0.0.2 is well.
