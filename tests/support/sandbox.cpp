@@ -5,6 +5,7 @@
 
 #include <filesystem>
 #include <regex>
+#include <sstream>
 
 #include "support/files.h"
 
@@ -42,6 +43,18 @@ std::size_t timeStampLength(const std::string& line) {
 }
 
 }  // namespace
+
+bool hasOtherUsers() {
+    std::istringstream map(readFile("/proc/self/uid_map"));
+    unsigned long first = 0;
+    unsigned long outside = 0;
+    unsigned long count = 0;
+    unsigned long sum = 0;
+    while (map >> first >> outside >> count) {
+        sum += count;
+    }
+    return sum > 1;
+}
 
 void SandboxTest::SetUp() {
     for (const char* directory : {"/tmp/ha", "/var/log/ha"}) {

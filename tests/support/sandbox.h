@@ -21,6 +21,10 @@ class SandboxTest : public ::testing::Test {
     std::map<std::string, std::string> _descriptors;
 };
 
+/// Return whether the sandbox has users other than root: not if it was made by an ordinary user
+/// without subordinate ids.
+bool hasOtherUsers();
+
 /// The daemon log and its buffer.
 inline constexpr char LOG[] = "/var/log/ha/ha.daemon.log";
 inline constexpr char BUFFER[] = "/tmp/ha/ha.daemon.log";

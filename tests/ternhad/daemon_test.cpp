@@ -249,7 +249,7 @@ TEST_F(DaemonTest, RemovedSocketDirectoryIsCreatedAgain) {
     const std::string statusSocket = "/run/ternha/status.sock";
     for (const bool hasStatusSocket : {false, true}) {
         auto daemon = startAndWait(hasStatusSocket ? std::vector<std::string>{"--status-socket", statusSocket,
-                                                                              "--status-group", "daemon"}
+                                                                              "--status-group", "root"}
                                                    : std::vector<std::string>());
         test::removeTree("/run/ternha");
         EXPECT_TRUE(test::eventually(15s, isUp));

@@ -348,7 +348,7 @@ TEST_F(FailingCallsTest, SnapshotLeavesOutWhatDoesNotFitItsMemory) {
 
 // It is looked at before it is read, and an order must not slip through between the two.
 TEST_F(FailingCallsTest, StatusSocketRefusesARebootRequestInPieces) {
-    start({"--status-socket", "/run/ternha/status.sock", "--status-group", "daemon"});
+    start({"--status-socket", "/run/ternha/status.sock", "--status-group", "root"});
     test::writeFile("/tmp/slow-client", "");
     const auto order = test::control("--socket /run/ternha/status.sock reboot-peer --yes");
     EXPECT_EQ(order.exitCode, 2);  // it cannot know

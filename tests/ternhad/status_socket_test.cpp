@@ -17,6 +17,12 @@ constexpr char STATUS_SOCKET[] = "/run/ternha/status.sock";
 
 class StatusSocketTest : public ::testing::Test {
  protected:
+    void SetUp() override {
+        if (!test::hasOtherUsers()) {
+            GTEST_SKIP() << "needs users other than root";
+        }
+    }
+
     static test::Process start(const std::string& statusSocket = STATUS_SOCKET) {
         test::Process daemon(test::daemonArguments(
             "127.0.0.1", "127.0.0.2", "lo", {"--status-socket", statusSocket, "--status-group", "daemon"}));
