@@ -61,7 +61,8 @@ std::string reasonOf(const std::string& path) {
 }  // namespace
 
 std::string ConfigFile::path() const {
-    return _app.get_config_ptr()->as<std::string>();
+    const CLI::Option* const option = _app.get_config_ptr();
+    return option->count() == 0 ? std::string() : option->results().back();
 }
 
 void ConfigFile::scan(const std::string& text) const {
