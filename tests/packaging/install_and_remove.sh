@@ -18,10 +18,20 @@ eventually() { # LIMIT_IN_SECONDS COMMAND...
 }
 
 # The machine's programs are read-only: an overlay takes changes. A lower layer has missing
-# libraries of the other architecture.
+# libraries of the other architecture. The sandbox of an ordinary user may not change directories of
+# the machine's root: the upper layer has its own.
 layers=/run/layers
 sysroot=
 [ "$architecture" = "$(dpkg --print-architecture)" ] || sysroot=$("${0%/*}/../../script/debian-root" sysroot)
+attributes=
+grep -q 4294967295 /proc/self/uid_map || attributes=,userxattr # others are root's
+changed=$(for package in "$packages"/*_"$architecture".deb; do dpkg-deb --contents "$package"; done |
+    sed -n 's|^d.* \./|/|p' | sort -u)
+for directory in $changed; do
+    directory=$(realpath --canonicalize-missing "$directory")
+    below=${directory#/usr/}
+    [[ $directory != /usr/*/* ]] || [ ! -d "$directory" ] || mkdir -p "$layers/${below%%/*}/upper/${below#*/}"
+done
 for directory in /usr/*; do
     if [ ! -d "$directory" ] || [ -L "$directory" ]; then
         continue
@@ -30,7 +40,7 @@ for directory in /usr/*; do
     mkdir -p "$layer/upper" "$layer/work"
     lower=$directory
     [ -z "$sysroot" ] || [ ! -d "$sysroot$directory" ] || lower=$directory:$sysroot$directory
-    mount -t overlay overlay -o "lowerdir=$lower,upperdir=$layer/upper,workdir=$layer/work" "$directory"
+    mount -t overlay overlay -o "lowerdir=$lower,upperdir=$layer/upper,workdir=$layer/work$attributes" "$directory"
 done
 
 # Files that differ from the machine's, without directories. Not those on other file systems, such
@@ -45,7 +55,7 @@ changes() {
 # Dependencies are checked against the machine; triggers are skipped to save time.
 # Without the locks, which an ordinary user cannot read.
 mkdir /run/dpkg
-tar -c -C /var/lib/dpkg --exclude=./lock --exclude=./lock-frontend --exclude=./triggers/Lock . | tar -x -C /run/dpkg
+tar -c -C /var/lib/dpkg --exclude=./lock --exclude=./lock-frontend --exclude=./triggers/Lock . | tar -x --no-same-owner -C /run/dpkg
 mkdir -p /var/lib/systemd
 # Programs that packages of another architecture depend on are those of the machine.
 options=()
