@@ -128,11 +128,9 @@ std::optional<std::string> textOf(const std::string& path) {
     }
     std::string text;
     std::string block(4096, '\0');
-    std::size_t size = 0;
-    do {
-        size = std::fread(block.data(), 1, block.size(), file.get());
-        text.append(block, 0, size);
-    } while (size == block.size());
+    while (std::feof(file.get()) == 0 && std::ferror(file.get()) == 0) {
+        text.append(block, 0, std::fread(block.data(), 1, block.size(), file.get()));
+    }
     return std::ferror(file.get()) == 0 ? std::optional(text) : std::nullopt;
 }
 

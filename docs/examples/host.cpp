@@ -12,7 +12,9 @@
 
 using namespace TERN::HA::Daemon;
 
-static void check(Status& status) {
+namespace {
+
+void check(Status& status) {
     status.setRemoteAlive(
         IsRemoteAlive()());  // one missed probe declares it dead here: a real host probes again
     status.isRemoteMDResync = status.isRemoteAlive() && IsRemoteMDResync()();
@@ -22,6 +24,8 @@ static void check(Status& status) {
     status.isDiskErrHandling = isDiskErrHandling(disks);
     status.setErrHandlingDisk(disks);
 }
+
+}  // namespace
 
 int main(int argc, char** argv) {
     if (argc != 5) {

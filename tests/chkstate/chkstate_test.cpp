@@ -122,7 +122,7 @@ TEST_F(TransportTest, RecvIsTheFirstVirtualFunction) {
     using Recv = int (*)(HASocketComm*, std::string&);
     HASocketCommServer server(OWN_ADDRESS, TIMEOUT);
     const Recv* table = nullptr;
-    std::memcpy(&table, static_cast<const void*>(&server), sizeof table);
+    std::memcpy(static_cast<void*>(&table), static_cast<const void*>(&server), sizeof table);
     UdpSocket sender;
     sender.send("is_alive", OWN_ADDRESS, PEER_PORT);
     std::string text;
