@@ -38,6 +38,15 @@ void* operator new(std::size_t size) {
     return memory;
 }
 
+// As in the C++ library, whose own valgrind replaces.
+void* operator new(std::size_t size, const std::nothrow_t& /*nothrow*/) noexcept {
+    try {
+        return operator new(size);
+    } catch (const std::bad_alloc&) {
+        return nullptr;
+    }
+}
+
 void operator delete(void* memory) noexcept {
     std::free(memory);
 }
