@@ -52,7 +52,9 @@ stub dpkg-query 'exit 1'
 stub apt-cache '[ "$2" = xz-utils ] || echo "$2 | 1.0 | here"'
 bootstrap_as 0 demo
 [ "$code" = 1 ] || fail "unknown package: exit code $code"
-says "unknown package xz-utils, needed by the demo, the tests and script/soak; everything else works without it"
+says "unknown package xz-utils, needed by script/bench, script/check-style, "
+says ", script/test valgrind. All else works without it"
+if grep -qF script/check-docs <<<"$output"; then fail "says that script/check-docs needs xz-utils"; fi
 if grep -q ' install ' <<<"$calls"; then fail "installs without all packages"; fi
 
 bootstrap_as 0 breakfast
