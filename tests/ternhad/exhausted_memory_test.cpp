@@ -43,7 +43,8 @@ class ExhaustedMemoryTest : public ::testing::Test {
 
 TEST_F(ExhaustedMemoryTest, TemporaryExhaustionEndsNothing) {
     a.write("/tmp/no-memory", "");
-    EXPECT_TRUE(test::eventually(20s, [this] { return failedSteps() > 20; })) << a.daemon->error();
+    // Few: a slow machine must not take so long that the daemon gives up.
+    EXPECT_TRUE(test::eventually(20s, [this] { return failedSteps() > 5; })) << a.daemon->error();
     test::removeTree(a.node.path("/tmp/no-memory"));
 
     a.write("/sys/block/md0/md/sync_action", "resync\n");
