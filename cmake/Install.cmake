@@ -19,7 +19,11 @@ set(TERNHA_INSTALL_CMAKEDIR ${CMAKE_INSTALL_LIBDIR}/cmake/ternhadaemon)
 #
 # Installs FILE as NAME.gz, reproducibly.
 function(ternha_install_compressed FILE NAME DESTINATION COMPONENT)
-  find_program(TERNHA_GZIP gzip REQUIRED)
+  find_program(TERNHA_GZIP gzip)
+  mark_as_advanced(TERNHA_GZIP)
+  if(NOT TERNHA_GZIP)
+    message(FATAL_ERROR "gzip was not found: it compresses the manual pages")
+  endif()
   set(compressed "${CMAKE_CURRENT_BINARY_DIR}/${COMPONENT}/${NAME}.gz")
   file(MAKE_DIRECTORY "${CMAKE_CURRENT_BINARY_DIR}/${COMPONENT}")
   add_custom_command(

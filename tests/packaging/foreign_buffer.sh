@@ -11,7 +11,7 @@ fail() { echo "FAILED: $1: $2" >&2; exit 1; }
 another_users() {
     mkdir -m 0777 /tmp/ha
     echo mine >/tmp/ha/ha.daemon.log
-    chown -R 1000 /tmp/ha 2>/dev/null || true # in the sandbox of an ordinary user there is no other one
+    chown -R 1000 /tmp/ha 2>/dev/null || true # there may be no other one
 }
 is_another_users() { [ "$(cat "$1/ha.daemon.log")" = mine ]; }
 
