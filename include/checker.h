@@ -135,10 +135,10 @@ bool isMDResync();
 ///
 /// @param disks  becomes an array of their device names in the order of the sorted port paths
 ///               (ata10 before ata2); unchanged when there are no ATA ports
-/// @return true when there is at least one such disk. Logs "Failed to set globBuf from
-///         /sys/class/ata_port/ata*" when there are no ATA ports, and "Failed to get dev name by
-///         ata path: " and the path for a port whose disk has no name, and the line of isSysfsValue
-///         for one without the attribute error_handling; such ports do not count.
+/// @return true when there is at least one such disk. Two kinds of port do not count: one whose
+///         disk has no name logs "Failed to get dev name by ata path: " and the path; one without
+///         the attribute error_handling logs the line of isSysfsValue. Without any ATA port, logs
+///         "Failed to set globBuf from /sys/class/ata_port/ata*".
 bool isDiskErrHandling(Json::Value& disks);
 
 /// Store the device name (1 to 7 characters) of the disk on the ATA port `path` (a path or a bare
@@ -186,8 +186,8 @@ class InterfaceChecker {
     /// Sample the counters of /sbin/ifconfig.
     ///
     /// @param rate  receives the share of packets that were not OK (errors, drops, overruns) since
-    ///              the previous sample, since the counters were reset for the first one. 0 to 1;
-    ///              outside this range when the counters went backwards. Unchanged on failure.
+    ///              the previous sample; for the first sample, since the counters were reset. 0 to
+    ///              1; outside this range when the counters went backwards. Unchanged on failure.
     /// @return true on success, also when the interface is not listed: the rate is then
     ///         meaningless. False, with "Failed to get interface detail" as the last line logged,
     ///         when ifconfig could not be started or printed nothing, a line too short, or a
@@ -209,7 +209,7 @@ class InterfaceChecker {
 // line after the time stamp. A program that cannot be started and a file that cannot be opened log
 // a line to the daemon log and record no entry. Thread-safe.
 
-/// Record the status as compact JSON. Blocks for the locks of the record.
+/// Record the status as compact JSON. Blocks for the locks of `status`, then as DaemonLog::set does.
 void recordStatus(Status& status);
 
 /// Run argv[0] with the null-terminated argument vector `argv` and record everything that it writes
@@ -234,8 +234,9 @@ void recordMemoryInfo();
 /// process. Thread-safe; blocks for the reading of a small file.
 std::string getLocalHostname();
 
-/// Return true when the HA tool reports a constraint on this node (it exits with status 0), false
-/// otherwise and when it cannot be started. Blocks until the tool ends. Thread-safe.
+/// Return true when the appliance's program `ternha --local-has-constraint` exits with status 0: a
+/// constraint holds on this node. Returns false otherwise, also when it cannot be started. Blocks
+/// until it ends. Thread-safe.
 bool isHadConstraints();
 
 }  // namespace TERN::HA::Daemon

@@ -11,7 +11,7 @@
 
 #pragma GCC visibility push(default)
 
-/// UDP port on which every node replies to its peer.
+/// UDP port on which every node receives the requests of its peer.
 constexpr std::uint16_t HA_PEER_PORT = 7499;
 
 /// Transport for one request and one reply, each a short text datagram over UDP/IPv4. Base of
@@ -39,9 +39,9 @@ class HASocketComm {
     /// may block.
     bool HasError();
 
-    /// Send `data` as one datagram, without a terminating zero. A client sends to its peer; a
-    /// server sends to the sender of the last datagram received, to its own address before the
-    /// first Recv, and fails after a failed Recv.
+    /// Send `data` as one datagram, without a terminating zero. A client sends to its peer. A
+    /// server sends to the sender of the last datagram received; before the first Recv it sends to
+    /// its own address, and after a failed Recv it fails.
     ///
     /// @return the number of bytes sent, -1 on failure. Does not wait for the peer.
     int Send(const std::string& data);

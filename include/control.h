@@ -42,7 +42,7 @@ class MonitordSocket : public DaemonLocalSocket {
 
     /// Server: carry out `request` as described above and store its reply in `reply`. Returns true
     /// when the reply is to be sent, false when the request was refused. Blocks for up to 33
-    /// seconds in "R", and for the locks of the record otherwise.
+    /// seconds in "R", and for the locks of the status otherwise.
     bool serverHandle(const Json::Value& request, Json::Value& reply) override;
 
     /// Client: store the daemon's status (see Status::toJson) in `out`. Returns false, with `out`

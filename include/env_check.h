@@ -61,8 +61,8 @@ class EnvCheck {
 class CheckerFactory {
  public:
     /// Type name to factory function; the caller owns the check that the function returns. Null
-    /// until the first registration. Filled by static initialisation and only read afterwards: not
-    /// locked. Never freed.
+    /// until the first registration. Filled by static initialisation; a host may replace entries
+    /// before it starts threads. Not locked. Never freed.
     static std::map<std::string, EnvCheck* (*)()>* opMap;
 };
 
@@ -98,9 +98,9 @@ class SocketServer {
     ///
     /// @param status  the record from which replies are computed
     /// @return true, whether or not a request arrived; false when the server socket could not be
-    ///         opened, set up or bound. Every later call then fails at once, too, and logs "Failed
-    ///         to start socket server" directly followed by the system's error text. A reply that
-    ///         cannot be sent is logged as "Failed to sendto". A request is dropped when memory
+    ///         opened, set up or bound, logging "Failed to start socket server" directly followed by
+    ///         the system's error text. Every later call then fails at once in the same way. A reply
+    ///         that cannot be sent is logged as "Failed to sendto". A request is dropped when memory
     ///         runs out.
     ///
     /// A request that is not a registered type name aborts the process without a reply: only the

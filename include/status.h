@@ -33,10 +33,10 @@ constexpr NodeState operator|(NodeState a, NodeState b) {
 /// the peer. One object per process, shared by all threads of the daemon; nothing in it outlives
 /// the process.
 ///
-/// Thread-safe. No operation fails. The const operations neither lock nor block. The others lock
-/// one mutex at a time, for which they wait up to 5 seconds, and then proceed without the lock: a
-/// hung holder delays an update but never blocks it. Only operations that take or return JSON
-/// allocate; when memory runs out they throw and leave the record unchanged.
+/// Thread-safe. The const operations neither lock nor block. The others lock one mutex at a time,
+/// for which they wait up to 5 seconds, and then proceed without the lock: a hung holder delays an
+/// update but never blocks it. No operation fails unless memory runs out: those that take or return
+/// JSON then throw and leave the record unchanged, and setRemoteAlive drops its log line.
 class Status {
  public:
     /// Construct a record in which isDRBDConnect is true, every other flag false, every number 0,
@@ -75,7 +75,7 @@ class Status {
     /// Return all bits.
     NodeState getRemoteNodeState() const;
 
-    /// Record the outcome of a liveness check: set or clear NodeAlive. Returns true.
+    /// Record whether the peer is alive: set or clear NodeAlive. Returns true.
     ///
     /// A change is logged first: "Remote server status changed to " and "alive" or "dead". A peer
     /// that is alive is no longer NodeRebooting, but stays NodeRebootPending; one that is dead
