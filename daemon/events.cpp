@@ -55,6 +55,8 @@ void Events::push(Happening&& happening) noexcept {
 
 bool Events::pop(Happening& happening, std::size_t& lost) {
     std::unique_lock<std::mutex> lock(_mutex);
+    _isWriting = false;
+    _written.notify_all();
     _wakeUp.wait(lock, [this] { return _count > 0 || _isEnding; });
     if (_count == 0) {
         return false;
@@ -63,6 +65,7 @@ bool Events::pop(Happening& happening, std::size_t& lost) {
     _first = (_first + 1) % CAPACITY;
     --_count;
     lost = std::exchange(_lost, 0);
+    _isWriting = true;
     return true;
 }
 
@@ -83,6 +86,11 @@ void Events::end() noexcept {
     const std::lock_guard<std::mutex> lock(_mutex);
     _isEnding = true;
     _wakeUp.notify_one();
+}
+
+void Events::waitUntilWritten(std::chrono::milliseconds limit) {
+    std::unique_lock<std::mutex> lock(_mutex);
+    _written.wait_for(lock, limit, [this] { return _count == 0 && !_isWriting; });
 }
 
 void Events::write(const Happening& happening) {

@@ -55,6 +55,9 @@ class Events {
     void run();
     void end() noexcept;
 
+    // Wait until all entries so far are in the log, but not longer than `limit`.
+    void waitUntilWritten(std::chrono::milliseconds limit);
+
  private:
     static constexpr std::size_t CAPACITY = 256;
 
@@ -64,10 +67,12 @@ class Events {
 
     std::mutex _mutex;  // guards the queue; never held while blocking
     std::condition_variable _wakeUp;
+    std::condition_variable _written;
     std::array<Happening, CAPACITY> _queue;
     std::size_t _first = 0;
     std::size_t _count = 0;
     std::size_t _lost = 0;
+    bool _isWriting = false;
     bool _isEnding = false;
 
     // Status::setRemoteAlive logs a transition before it stores it. The daemon stores it first, in

@@ -15,6 +15,7 @@ namespace ternhad {
 namespace {
 
 constexpr auto DEADLINE = std::chrono::seconds(5);
+constexpr auto EVENTS_LIMIT = std::chrono::seconds(3);  // leaves time to move them
 
 // Static, because checks have no data members.
 Reboot* theReboot = nullptr;
@@ -27,7 +28,8 @@ void Reboot::flush() {
         if (!_ordered.take()) {
             continue;
         }
-        attempt([] {
+        attempt([this] {
+            _events.waitUntilWritten(EVENTS_LIMIT);
             TERN::HA::Daemon::daemonLog->writeLogToDisk();
             TERN::HA::Daemon::recordLog->writeLogToDisk();
         });

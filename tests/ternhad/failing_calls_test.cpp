@@ -311,6 +311,19 @@ TEST_F(FailingCallsTest, LogKeeperHasANameOfItsOwn) {
     expectEndInTime();
 }
 
+TEST_F(FailingCallsTest, RebootWaitsForLinesThatAreNotLoggedYet) {
+    start({"--log-interval", "3600", "--dead-after", "0.6"});
+    {
+        const HeldThread events(daemon->pid(), "events");
+        peer.reset();
+        ASSERT_TRUE(test::eventually(10s, [] { return !isPeerAlive(); }));
+        orderReboot();
+        EXPECT_FALSE(test::eventually(500ms, isRebooted));
+    }
+    EXPECT_TRUE(test::eventually(10s, isRebooted));
+    EXPECT_THAT(test::readFile(test::LOG_FILE), HasSubstr("changed to dead\n"));
+}
+
 // Nobody but root may usually lock more memory than a limit.
 bool isLockingPermitted() {
     rlimit limit = {};
