@@ -24,7 +24,8 @@ layers=/run/layers
 sysroot=
 [ "$architecture" = "$(dpkg --print-architecture)" ] || sysroot=$("${0%/*}/../../script/debian-root" sysroot)
 attributes=
-grep -q 4294967295 /proc/self/uid_map || attributes=,userxattr # others are root's
+# In a user namespace an overlay may only set user attributes.
+grep -q 4294967295 /proc/self/uid_map || attributes=,userxattr
 changed=$(for package in "$packages"/*_"$architecture".deb; do dpkg-deb --contents "$package"; done |
     sed -n 's|^d.* \./|/|p' | sort -u)
 for directory in $changed; do
