@@ -7,6 +7,7 @@
 #include "journal.h"
 #include "passes.h"
 #include "service_notifier.h"
+#include "threads.h"
 
 namespace ternhad {
 
@@ -28,6 +29,7 @@ std::string timeText(std::chrono::system_clock::time_point time) {
 }  // namespace
 
 void Announcer::run() {
+    raisePriority(Priority::journal);
     Passes passes;
     do {
         _reader.event().take();

@@ -2,7 +2,6 @@
 
 #include <poll.h>
 #include <pthread.h>
-#include <sys/mman.h>
 #include <sys/signalfd.h>
 #include <unistd.h>
 
@@ -19,6 +18,7 @@
 #include "directories.h"
 #include "env_check.h"
 #include "journal.h"
+#include "memory.h"
 #include "passes.h"
 #include "service_notifier.h"
 
@@ -95,8 +95,7 @@ int Daemon::run() {
         _shutdown.request(1);
         return stop();
     }
-    // Lock pages in memory as they are used, if permitted. Locking all would triple the memory use.
-    mlockall(MCL_CURRENT | MCL_ONFAULT);
+    lockUsedMemory();
     TERNHAD_LOG(_events, "Started on " + _options.localIp + ", peer " + _options.remoteIp);
     notifyReady();
     waitForStop(signals);

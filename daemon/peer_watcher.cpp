@@ -84,12 +84,13 @@ bool PeerWatcher::isReportCut() const {
 }
 
 void PeerWatcher::requestResync() {
-    const bool isResync = IsRemoteMDResync()();
-    // The check returns "no resync" without a reply, too, which confirms nothing.
-    if (_shutdown.isRequested() || (!isResync && replyTo<IsRemoteMDResync>() != "not_resync")) {
-        return;
+    // The check returns "no resync" without a reply, too, which confirms nothing: it is only used
+    // for other replies, and to log that there is none.
+    if (replyTo<IsRemoteMDResync>() == "not_resync") {
+        _health.set(Flag::peerResync, false);
+    } else if (!_shutdown.isRequested() && IsRemoteMDResync()() && !_shutdown.isRequested()) {
+        _health.set(Flag::peerResync, true);
     }
-    _health.set(Flag::peerResync, isResync);
 }
 
 void PeerWatcher::requestHostname() {

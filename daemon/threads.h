@@ -38,8 +38,9 @@ class Threads {
 bool isolateDescriptors() noexcept;
 
 // Give the calling thread real-time priority, if permitted. Probes precede replies, of which anyone
-// on the link can request any number.
-enum class Priority { probes, replies };
+// on the link can request any number; what they find precedes other programs' work on its way to the
+// journal.
+enum class Priority { probes, replies, journal };
 void raisePriority(Priority priority) noexcept;
 
 }  // namespace ternhad
