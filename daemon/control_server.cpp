@@ -155,8 +155,7 @@ void ControlServer::wait() const {
     if (_clients.size() < MOST_CLIENTS && !_isFull) {
         waits.at(count++) = {_listener.fd(), POLLIN, 0};
     }
-    const timespec rest = timeUntil(end);
-    ppoll(waits.data(), count, &rest, nullptr);
+    pollUntil(end, waits.data(), count);
 }
 
 void ControlServer::acceptClients() {

@@ -177,8 +177,7 @@ void Daemon::waitForStop(int signals) {
         }
         std::array<pollfd, 3> waits = {
             {{signals, POLLIN, 0}, {_logKeeper.fd(), POLLIN, 0}, {_health.snapshotWanted().fd(), POLLIN, 0}}};
-        const timespec rest = timeUntil(end);
-        ppoll(waits.data(), waits.size(), &rest, nullptr);
+        pollUntil(end, waits.data(), waits.size());
         takeSignals(signals);
     }
 }

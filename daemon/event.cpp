@@ -1,6 +1,5 @@
 #include "event.h"
 
-#include <poll.h>
 #include <sys/eventfd.h>
 #include <unistd.h>
 
@@ -8,6 +7,7 @@
 #include <array>
 #include <cerrno>
 #include <cstdint>
+#include <limits>
 #include <stdexcept>
 #include <system_error>
 
@@ -65,9 +65,7 @@ bool Shutdown::sleepUntil(Clock::time_point time, std::initializer_list<const Ev
         waits.at(count++) = {other->fd(), POLLIN, 0};
     }
     while (!isRequested()) {
-        const timespec rest = timeUntil(time);
-        const int ready = ppoll(waits.data(), count, &rest, nullptr);
-        if (ready >= 0) {
+        if (pollUntil(time, waits.data(), count) >= 0) {
             break;
         }
     }
@@ -82,14 +80,13 @@ Clock::time_point nextRound(Clock::time_point round, std::chrono::duration<doubl
     return std::max(round + std::chrono::duration_cast<Clock::duration>(interval), Clock::now());
 }
 
-timespec timeUntil(Clock::time_point time) noexcept {
-    const auto rest = std::max(time - Clock::now(), Clock::duration::zero());
-    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(rest);
-    const std::chrono::nanoseconds fraction = rest - seconds;
-    timespec result = {};
-    result.tv_sec = seconds.count();
-    result.tv_nsec = static_cast<int>(fraction.count());
-    return result;
+// Not ppoll(): on 32-bit machines, that of glibc before 2.37 misreads its timeout when it is compiled
+// with _FORTIFY_SOURCE and 64-bit times, and returns at once.
+int pollUntil(Clock::time_point time, pollfd* waits, std::size_t count) noexcept {
+    using std::chrono::milliseconds;
+    const auto rest = std::chrono::ceil<milliseconds>(time - Clock::now());
+    const auto timeout = std::clamp(rest, milliseconds(0), milliseconds(std::numeric_limits<int>::max()));
+    return poll(waits, count, static_cast<int>(timeout.count()));
 }
 
 }  // namespace ternhad

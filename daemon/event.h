@@ -1,7 +1,10 @@
 #pragma once
 
+#include <poll.h>
+
 #include <atomic>
 #include <chrono>
+#include <cstddef>
 #include <initializer_list>
 
 namespace ternhad {
@@ -63,7 +66,8 @@ class Shutdown {
 // skipped.
 Clock::time_point nextRound(Clock::time_point round, std::chrono::duration<double> interval) noexcept;
 
-// Return the time from now until `time` for ppoll; 0 if it has passed.
-timespec timeUntil(Clock::time_point time) noexcept;
+// poll() until `time`, up to a millisecond longer, or until some of the descriptors are ready.
+// Returns what it returns.
+int pollUntil(Clock::time_point time, pollfd* waits, std::size_t count) noexcept;
 
 }  // namespace ternhad

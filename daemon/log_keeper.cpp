@@ -227,8 +227,7 @@ void LogKeeper::finish(Clock::time_point deadline) {
 bool LogKeeper::isDoneBy(Clock::time_point deadline) {
     while (_busySince && Clock::now() < deadline) {
         pollfd wait = {_replies, POLLIN, 0};
-        const timespec rest = timeUntil(deadline);
-        if (ppoll(&wait, 1, &rest, nullptr) > 0) {
+        if (pollUntil(deadline, &wait, 1) > 0) {
             takeReply();
             if ((wait.revents & POLLIN) == 0) {
                 return false;  // it has exited

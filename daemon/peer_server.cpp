@@ -119,8 +119,7 @@ void PeerServer::wait(const Socket& socket) const noexcept {
     std::array<pollfd, 3> waits = {
         {{socket.fd(), POLLIN, 0}, {_shutdown.event().fd(), POLLIN, 0}, {flushed, POLLIN, 0}}};
     const auto limit = Clock::now() + LONGEST_WAIT;
-    const timespec rest = timeUntil(_reboot.isOrdered() ? _reboot.deadline() : limit);
-    ppoll(waits.data(), waits.size(), &rest, nullptr);
+    pollUntil(_reboot.isOrdered() ? _reboot.deadline() : limit, waits.data(), waits.size());
 }
 
 }  // namespace ternhad

@@ -181,8 +181,7 @@ void Prober::wait(const FailureDetector& detector) const noexcept {
             waits[count++] = {_sockets[i]->fd(), POLLIN, 0};
         }
     }
-    const timespec rest = timeUntil(detector.wakeUpTime());
-    ppoll(waits.data(), count, &rest, nullptr);
+    pollUntil(detector.wakeUpTime(), waits.data(), count);
 }
 
 }  // namespace ternhad
