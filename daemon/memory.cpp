@@ -20,6 +20,7 @@ int releaseFilePages(dl_phdr_info* object, std::size_t /*size*/, void* /*data*/)
         if (segment.p_type == PT_LOAD && (segment.p_flags & PF_W) == 0) {
             const auto begin = (object->dlpi_addr + segment.p_vaddr) & pageMask;
             const auto end = object->dlpi_addr + segment.p_vaddr + segment.p_memsz;
+            // NOLINTNEXTLINE(performance-no-int-to-ptr): program headers have addresses as integers
             madvise(reinterpret_cast<void*>(begin), end - begin, MADV_DONTNEED);
         }
     }
