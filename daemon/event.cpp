@@ -80,8 +80,8 @@ Clock::time_point nextRound(Clock::time_point round, std::chrono::duration<doubl
     return std::max(round + std::chrono::duration_cast<Clock::duration>(interval), Clock::now());
 }
 
-// Not ppoll(): on 32-bit machines, that of glibc before 2.37 misreads its timeout when it is compiled
-// with _FORTIFY_SOURCE and 64-bit times, and returns at once.
+// Not ppoll(): on 32-bit machines with 64-bit times and _FORTIFY_SOURCE, that of glibc before 2.37
+// drops the fraction of a second of its timeout, and the caller spins.
 int pollUntil(Clock::time_point time, pollfd* waits, std::size_t count) noexcept {
     using std::chrono::milliseconds;
     const auto rest = std::chrono::ceil<milliseconds>(time - Clock::now());

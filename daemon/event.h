@@ -66,8 +66,8 @@ class Shutdown {
 // skipped.
 Clock::time_point nextRound(Clock::time_point round, std::chrono::duration<double> interval) noexcept;
 
-// poll() until `time`, up to a millisecond longer, or until some of the descriptors are ready.
-// Returns what it returns.
+// Wait like poll() until `time`, rounded up to a millisecond, or for 24 days at most. Return its
+// result.
 int pollUntil(Clock::time_point time, pollfd* waits, std::size_t count) noexcept;
 
 }  // namespace ternhad

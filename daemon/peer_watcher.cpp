@@ -84,12 +84,14 @@ bool PeerWatcher::isReportCut() const {
 }
 
 void PeerWatcher::requestResync() {
-    // The check returns "no resync" without a reply, too, which confirms nothing: it is only used
-    // for other replies, and to log that there is none.
-    if (replyTo<IsRemoteMDResync>() == "not_resync") {
-        _health.set(Flag::peerResync, false);
-    } else if (!_shutdown.isRequested() && IsRemoteMDResync()() && !_shutdown.isRequested()) {
-        _health.set(Flag::peerResync, true);
+    const auto reply = replyTo<IsRemoteMDResync>();
+    if (reply == "resync" || reply == "not_resync") {
+        _health.set(Flag::peerResync, reply == "resync");
+    } else if (!reply && !_shutdown.isRequested()) {
+        // The check logs that there is no reply, unless there is one this time.
+        if (IsRemoteMDResync()() && !_shutdown.isRequested()) {
+            _health.set(Flag::peerResync, true);
+        }
     }
 }
 

@@ -38,8 +38,7 @@ class Threads {
 bool isolateDescriptors() noexcept;
 
 // Give the calling thread real-time priority, if permitted. Probes precede replies, of which anyone
-// on the link can request any number; what they find precedes other programs' work on its way to the
-// journal.
+// on the link can request any number. The journal comes third, so that busy programs do not delay it.
 enum class Priority { probes, replies, journal };
 void raisePriority(Priority priority) noexcept;
 

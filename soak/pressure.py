@@ -259,7 +259,7 @@ def press(watchers, condition, seconds):
         time.sleep(seconds)
         wrong = {name: count - before[name] for name, count in times_dead().items()}
         seeing = watchers.wait_until_alive(20)
-        # Ends it at once: real-time hogs delay the end of a link, and SIGSTOP, by seconds.
+        # SIGKILL acts at once; real-time hogs delay the end of a link, and SIGSTOP, by seconds.
         failure = killed(watchers)
         begin = time.monotonic()
         next(failure)

@@ -104,12 +104,14 @@ bool isPriorityPermitted(int priority) {
     return isPermitted;
 }
 
-TEST_F(SickMachineTest, ProbesComeBeforeRepliesAndRepliesBeforeAllElse) {
+TEST_F(SickMachineTest, ProbesComeBeforeRepliesAndTheseBeforeTheJournalAndAllElse) {
     start();
     const int highest = sched_get_priority_max(SCHED_RR);
     const bool isPermitted = isPriorityPermitted(highest);
     EXPECT_EQ(priorityOf(daemon->pid(), "probes"), isPermitted ? highest : 0);
     EXPECT_EQ(priorityOf(daemon->pid(), "replies"), isPermitted ? highest - 1 : 0);
+    EXPECT_TRUE(test::eventually(
+        10s, [&] { return priorityOf(daemon->pid(), "journal") == (isPermitted ? highest - 2 : 0); }));
     EXPECT_EQ(priorityOf(daemon->pid(), "clients"), 0);
     expectEndInTime();
 }

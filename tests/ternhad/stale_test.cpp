@@ -68,11 +68,16 @@ TEST_F(StaleTest, StateOfAnAlivePeerThatStopsReportingIsLastKnown) {
     EXPECT_THAT(control("metrics").output, HasSubstr("\nternha_peer_md_resync 0\n"));
 }
 
-TEST_F(StaleTest, ReplyAfterThePeerWasDeclaredDeadIsDiscarded) {
+TEST_F(StaleTest, ResyncReportedAfterThePeerWasDeclaredDeadIsDiscarded) {
     peer->dieAt("is_md_resync");
     ASSERT_EQ(control("wait peer-dead --timeout 20").exitCode, 0);
     peer->replyLate("resync");
     EXPECT_EQ(control("wait peer-resync --timeout 0.5").exitCode, 1);
+}
+
+TEST_F(StaleTest, NoResyncReportedAfterThePeerWasDeclaredDeadIsDiscarded) {
+    peer->dieAt("is_md_resync");
+    ASSERT_EQ(control("wait peer-dead --timeout 20").exitCode, 0);
     peer->replyLate("not_resync");
     EXPECT_EQ(control("wait peer-no-resync --timeout 0.5").exitCode, 1);
 }
