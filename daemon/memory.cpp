@@ -11,9 +11,9 @@ namespace ternhad {
 
 namespace {
 
-char* addressOf(const dl_phdr_info& object, std::uintptr_t offset) {
+void* addressOf(const dl_phdr_info& object, std::uintptr_t offset) {
     // NOLINTNEXTLINE(performance-no-int-to-ptr): program headers have addresses as integers
-    return reinterpret_cast<char*>(object.dlpi_addr + offset);
+    return reinterpret_cast<void*>(object.dlpi_addr + offset);
 }
 
 // Return true if the code of an object was changed when it was loaded.
@@ -22,8 +22,7 @@ bool isCodeRelocated(const dl_phdr_info& object) {
         if (object.dlpi_phdr[i].p_type != PT_DYNAMIC) {
             continue;
         }
-        const char* const address = addressOf(object, object.dlpi_phdr[i].p_vaddr);
-        const auto* entry = reinterpret_cast<const ElfW(Dyn)*>(address);
+        const auto* entry = static_cast<const ElfW(Dyn)*>(addressOf(object, object.dlpi_phdr[i].p_vaddr));
         for (; entry->d_tag != DT_NULL; ++entry) {
             if (entry->d_tag == DT_TEXTREL ||
                 (entry->d_tag == DT_FLAGS && (entry->d_un.d_val & DF_TEXTREL) != 0)) {
