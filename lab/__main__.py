@@ -2,25 +2,26 @@
 
 import argparse
 import fcntl
+import os
+import shutil
 import signal
 import subprocess
 import sys
+import tempfile
 import time
 from pathlib import Path
 
-import image
-import packages
 import scenario
 from checks import Checks
 from consoles import Consoles
 from failure import CheckFailed, LabError
 from lab import INTERRUPTIONS, Lab
 from node import Channel
+from repack import two_versions
 
 ROOT = Path(__file__).resolve().parents[1]
-CACHE = ROOT / "build/lab"
-BUILD = ROOT / "build/arm"  # of the arm tests, reused if it exists
-TARGETS = ["ternhad", "ternhactl", "ternha-lab-tool"]
+BUILD = ROOT / "build/lab"
+PACKAGES = ROOT / "build/packages"
 
 
 def main() -> int:
@@ -55,19 +56,23 @@ def interrupt(number, _frame):
 
 
 def run_lab(keep: bool) -> int:
-    CACHE.mkdir(parents=True, exist_ok=True)
-    with open(CACHE / "lock", "w") as lock:
-        fcntl.flock(lock, fcntl.LOCK_EX)  # concurrent runs share the build and the images
-        build_programs()
-        guest_packages = packages.unpacked(CACHE)
-        archive = image.system(guest_packages, CACHE) + image.programs(BUILD)
+    BUILD.mkdir(parents=True, exist_ok=True)
+    as_root = [] if os.geteuid() == 0 else ["sudo", "--preserve-env=HOME,XDG_CACHE_HOME"]
+    with tempfile.TemporaryDirectory(prefix="ternha-packages.") as directory:
+        with open(BUILD / "lock", "w") as lock:
+            fcntl.flock(lock, fcntl.LOCK_EX)  # runs side by side share what they are made from
+            make_packages(Path(directory))
+        image = Path(make("image", *as_root, ROOT / "lab/debian-image").strip())
+        return run_nodes(image, Path(directory), keep)
 
+
+def run_nodes(image: Path, packages: Path, keep: bool) -> int:
     begin = time.monotonic()
-    consoles = Consoles(CACHE / "consoles", begin)
+    consoles = Consoles(BUILD / "consoles", begin)
     checks = Checks(consoles, begin)
     print(f"lab: the consoles of both nodes go to {consoles.path.relative_to(ROOT)}", flush=True)
     failed = False
-    with Lab(image.kernel(guest_packages), archive, consoles) as lab:
+    with Lab(image, packages, consoles) as lab:
         try:
             scenario.run(lab, checks)
         except (CheckFailed, LabError) as failure:
@@ -80,15 +85,21 @@ def run_lab(keep: bool) -> int:
     return 1 if failed else 0
 
 
-def build_programs():
-    options = ["-D", "TERNHA_BUILD_LAB=ON"]
-    if not (BUILD / "CMakeCache.txt").exists():
-        options += ["-D", "TERNHA_BUILD_TESTS=OFF"]
-    configure = ["cmake", "--preset", "arm", *options]
-    for command in (configure, ["cmake", "--build", BUILD, "--target", *TARGETS]):
-        result = subprocess.run(command, cwd=ROOT, capture_output=True, text=True, check=False)
-        if result.returncode != 0:
-            raise LabError(f"the programs cannot be built:\n{result.stdout}{result.stderr}")
+def make_packages(directory: Path):
+    """Two versions of the packages, and the lab's own tool."""
+    make("packages", ROOT / "script/package", "armhf")
+    tree = PACKAGES / "build-armhf"
+    make("tool", "cmake", "-D", "TERNHA_BUILD_LAB=ON", tree)
+    make("tool", "cmake", "--build", tree, "--target", "ternha-lab-tool")
+    shutil.copy(tree / "lab/ternha-lab-tool", directory)
+    two_versions(PACKAGES, "armhf", directory)
+
+
+def make(what: str, *command: str | Path) -> str:
+    result = subprocess.run(command, cwd=ROOT, capture_output=True, text=True, check=False)
+    if result.returncode != 0:
+        raise LabError(f"the {what} cannot be made:\n{result.stdout}{result.stderr}")
+    return result.stdout
 
 
 def report(failure: Exception, consoles: Consoles):

@@ -30,7 +30,7 @@ def run(pair: Containers, checks: Checks):
     reboot_trigger(pair, checks)
     stop(pair, checks, ALIVE)
     wrong_options(pair, checks)
-    upgrade(pair, checks, ALIVE, "/packages/new")
+    upgrade(pair, checks, ALIVE, "apt-get install --quiet --yes /packages/new/*.deb")
     remove(pair, checks)
 
 

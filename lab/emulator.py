@@ -9,6 +9,10 @@ from pathlib import Path
 from failure import LabError
 
 PROMPT = 10  # seconds within which an emulator replies
+KERNEL_OPTIONS = (
+    "console=ttyAMA0 quiet panic=5 net.ifnames=0 root=/dev/vda rw rootflags=noatime"
+    " systemd.show_status=0 systemd.journald.forward_to_console=1"
+)
 
 
 class Emulator:
@@ -17,15 +21,15 @@ class Emulator:
     def __init__(
         self,
         name: str,
-        kernel: Path,
-        initrd: Path,
+        image: Path,
         disks: dict[str, Path],
         link: socket.socket,
         channel: Path,
     ):
         """Start the machine called `name`.
 
-        disks: images by serial number.
+        image: directory with kernel and initramfs.
+        disks: by serial number; the last one has the root.
         link: datagram socket to which the network interface is connected.
         channel: path of the Unix socket on which its command channel will listen.
         """
@@ -40,18 +44,21 @@ class Emulator:
             "setpriv", "--pdeathsig", "KILL",
             "qemu-system-arm", "-no-user-config", "-nodefaults", "-display", "none",
             "-machine", "virt,highmem=off", "-cpu", "cortex-a15", "-smp", "1", "-m", "256",
-            "-accel", "tcg,thread=single,tb-size=64",
-            "-kernel", kernel, "-initrd", initrd, "-append", f"console=ttyAMA0 quiet panic=5 node={name}",
+            "-accel", "tcg,thread=single,tb-size=256",
+            "-kernel", image / "vmlinuz", "-initrd", image / "initrd",
+            "-append", f"{KERNEL_OPTIONS} systemd.hostname=node-{name}",
             "-chardev", f"socket,id=console,fd={console.fileno()}", "-serial", "chardev:console",
             "-chardev", f"socket,id=control,fd={control.fileno()}", "-mon", "chardev=control,mode=control",
             "-chardev", f"socket,id=channel,path={channel},server=on,wait=off",
             "-device", "virtio-serial-device", "-device", "virtserialport,chardev=channel,name=channel",
             "-device", "virtio-rng-device",
             "-netdev", f"dgram,id=link,local.type=fd,local.str={link.fileno()}",
-            "-device", f"virtio-net-device,netdev=link,mac=52:54:00:00:00:{ord(name):02x}",
+            "-device", f"virtio-net-device,netdev=link,mac=52:54:00:00:00:{ord(name) - ord('a') + 1:02x}",
         ]
-        for serial, image in disks.items():
-            command += ["-drive", f"if=none,id={serial},file={image},format=raw,cache=unsafe"]
+        for serial, disk in disks.items():
+            kind = "qcow2" if disk.suffix == ".qcow2" else "raw"
+            access = ",readonly=on" if serial == "packages" else ""  # shared by both machines
+            command += ["-drive", f"if=none,id={serial},file={disk},format={kind},cache=unsafe{access}"]
             command += ["-device", f"virtio-blk-device,drive={serial},serial={serial}"]
         # Its own process group: Ctrl-C must reach only this process, which stops the emulator.
         self._process = subprocess.Popen(
@@ -111,6 +118,8 @@ class Emulator:
                 data = self._control.recv(65536)
             except TimeoutError:
                 data = None
+            except ConnectionResetError:
+                data = b""
             if data == b"":
                 raise LabError(f"emulator {self.name} has ended: {self._last_words()}")
             if data is None or time.monotonic() > deadline:

@@ -16,53 +16,60 @@ from node_pair import NodePair
 
 MIB = 1024 * 1024
 DISKS = {"log": 16 * MIB, "drbd": 24 * MIB, "md0": 12 * MIB, "md1": 12 * MIB}  # by serial number
-BOOT_LIMIT = 60  # seconds
 INTERRUPTIONS = (signal.SIGINT, signal.SIGTERM, signal.SIGHUP)
 
 
 class Lab(NodePair):
     """Two emulated machines; leaves nothing behind."""
 
-    def __init__(self, kernel: Path, archive: bytes, consoles: Consoles):
-        """`archive` is the initramfs."""
+    def __init__(self, image: Path, packages: Path, consoles: Consoles):
+        """Both boot the system in `image` and have a disk with the files of `packages`."""
         super().__init__()
-        self._kernel = kernel
-        self._archive = archive
+        self._image = image
+        self._packages = packages
         self._consoles = consoles
         self.directory = Path()
+        self._links: list[socket.socket] = []
         self._emulators: list[Emulator] = []
 
     def set_link(self, up: bool):
         for node in self.nodes:
             node.emulator.set_link(up)
 
+    def lose_power(self, node: Node):
+        """Kill the machine and start it with the same disks."""
+        node.emulator.end()
+        node.channel.close()
+        node.emulator, node.channel = self._power_on(self.nodes.index(node))
+
     def _start(self):
         self.directory = Path(tempfile.mkdtemp(prefix="ternha-lab."))
-        system = self.directory / "system"
-        system.write_bytes(self._archive)
-        links = _link()
+        run("mke2fs", "-q", "-t", "ext4", "-d", self._packages, self.directory / "packages", "16M")
+        self._links = _link()
         for index, name in enumerate("ab"):
-            channel = self.directory / f"node-{name}"
-            emulator = Emulator(name, self._kernel, system, self._make_disks(name), links[index], channel)
-            self._emulators.append(emulator)
-            self._consoles.follow(name, emulator.console)
-            self.nodes.append(Node(name, f"10.11.0.{index + 1}", emulator, Channel(f"node-{name}", channel)))
-        for link in links:
-            link.close()
+            self._make_disks(name)
+            self.nodes.append(Node(name, f"10.11.0.{index + 1}", *self._power_on(index)))
         for node in self.nodes:
-            node.wait_for_boot(BOOT_LIMIT)
+            node.wait_for_boot()
 
-    def _make_disks(self, name: str) -> dict[str, Path]:
-        disks = {}
+    def _power_on(self, index: int) -> tuple[Emulator, Channel]:
+        name = "ab"[index]
+        channel = self.directory / f"node-{name}"
+        channel.unlink(missing_ok=True)
+        disks = {serial: self.directory / f"{name}.{serial}" for serial in DISKS}
+        disks |= {"packages": self.directory / "packages", "root": self.directory / f"{name}.qcow2"}
+        emulator = Emulator(name, self._image, disks, self._links[index], channel)
+        self._emulators.append(emulator)
+        self._consoles.follow(name, emulator.console)
+        return emulator, Channel(f"node-{name}", channel)
+
+    def _make_disks(self, name: str):
+        root = self._image / "root.img"
+        run("qemu-img", "create", "-q", "-f", "qcow2", "-F", "raw", "-b", root, self.directory / f"{name}.qcow2")
         for serial, size in DISKS.items():
-            disks[serial] = self.directory / f"{name}.{serial}"
-            with open(disks[serial], "wb") as file:
+            with open(self.directory / f"{name}.{serial}", "wb") as file:
                 os.truncate(file.fileno(), size)
-        command = ["/sbin/mke2fs", "-q", "-F", "-t", "ext4", disks["log"]]
-        result = subprocess.run(command, capture_output=True, text=True, check=False)
-        if result.returncode != 0:
-            raise LabError(f"mke2fs failed: {result.stderr}")
-        return disks
+        run("mke2fs", "-q", "-F", "-t", "ext4", self.directory / f"{name}.log")
 
     def _end(self):
         signal.pthread_sigmask(signal.SIG_BLOCK, INTERRUPTIONS)
@@ -70,9 +77,18 @@ class Lab(NodePair):
             emulator.end()
         for node in self.nodes:
             node.channel.close()
+        for link in self._links:
+            link.close()
         if self.directory != Path():
             shutil.rmtree(self.directory)
         signal.pthread_sigmask(signal.SIG_UNBLOCK, INTERRUPTIONS)
+
+
+def run(*command: str | Path):
+    environment = os.environ | {"PATH": os.environ["PATH"] + ":/usr/sbin:/sbin"}
+    result = subprocess.run(command, capture_output=True, text=True, env=environment, check=False)
+    if result.returncode != 0:
+        raise LabError(f"{command[0]} failed: {result.stderr}")
 
 
 def _link() -> list[socket.socket]:

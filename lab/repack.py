@@ -1,22 +1,34 @@
-"""Packages of another version, for upgrades."""
+"""Two versions of the packages, for upgrades."""
 
+import shutil
 import subprocess
 from pathlib import Path
 
 from failure import LabError
+from service import PACKAGES
 
 SCRIPT = """
     unpacked=$(mktemp -d)
     trap 'rm -r "$unpacked"' EXIT
     dpkg-deb --raw-extract "$1" "$unpacked/package"
-    sed -i "s/^\\(Version: .*\\)-[^-]*$/\\1-$3/" "$unpacked/package/DEBIAN/control"
+    sed -i "s/^\\(Version: .*\\)-[^-]*$/\\1-0/" "$unpacked/package/DEBIAN/control"
     dpkg-deb --root-owner-group -Znone --build "$unpacked/package" "$2"
 """
 
 
-def repack(package: Path, target: Path, revision: int):
-    """Build the same package with another Debian revision."""
-    command = ["sh", "-ec", SCRIPT, "repack", package, target, str(revision)]
+def two_versions(built: Path, architecture: str, directory: Path):
+    """Copy the packages to `new`, and with a lower version to `old`."""
+    for age in ("new", "old"):
+        (directory / age).mkdir()
+    for name in PACKAGES:
+        (package,) = built.glob(f"{name}_*_{architecture}.deb")
+        shutil.copy(package, directory / "new")
+        repack(package, directory / "old" / package.name)
+
+
+def repack(package: Path, target: Path):
+    """Build the same package with a lower Debian revision."""
+    command = ["sh", "-ec", SCRIPT, "repack", package, target]
     result = subprocess.run(command, capture_output=True, text=True, check=False)
     if result.returncode != 0:
         raise LabError(f"{package} cannot be repacked: {result.stderr}")

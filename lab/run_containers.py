@@ -1,6 +1,5 @@
 """Run the scenario of the service: run_containers.py ROOT PACKAGES, in private namespaces."""
 
-import shutil
 import signal
 import sys
 import tempfile
@@ -12,8 +11,7 @@ from checks import Checks
 from consoles import Consoles
 from containers import Containers
 from failure import CheckFailed, LabError
-from repack import repack
-from service import PACKAGES
+from repack import two_versions
 
 ROOT = Path(__file__).resolve().parents[1]
 
@@ -29,7 +27,7 @@ def main() -> int:
     failed = False
     try:
         with tempfile.TemporaryDirectory(prefix="ternha-containers.") as directory:
-            make_packages(built, Path(directory))
+            two_versions(built, "amd64", Path(directory))
             with Containers(root, Path(directory), consoles) as pair:
                 container_scenario.run(pair, checks)
     except CheckFailed as failure:
@@ -45,16 +43,6 @@ def main() -> int:
         print(f"The last lines of the consoles, all of which are in {consoles.path}:\n{consoles.tail()}", flush=True)
     print(f"containers: {checks.passed} passed, {int(failed)} failed", flush=True)
     return int(failed)
-
-
-def make_packages(built: Path, directory: Path):
-    """Copy the packages to `new`, and with a lower version to `old`."""
-    for age in ("new", "old"):
-        (directory / age).mkdir()
-    for name in PACKAGES:
-        (package,) = built.glob(f"{name}_*_amd64.deb")
-        shutil.copy(package, directory / "new")
-        repack(package, directory / "old" / package.name, 0)
 
 
 sys.exit(main())

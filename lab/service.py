@@ -9,9 +9,9 @@ DROP_IN = "/run/systemd/system/ternhad.service.d/lab.conf"
 PACKAGES = ["libterncore6", "libternhadaemon6", "ternhad"]
 
 
-def configure(node: Node, peer: Node, interface: str):
+def configure(node: Node, peer: Node, interface: str, **others):
     """Edit the configuration as an administrator does."""
-    values = {"local-ip": node.address, "remote-ip": peer.address, "interface": interface}
+    values = {"local-ip": node.address, "remote-ip": peer.address, "interface": interface} | others
     edits = " ".join(f"-e 's/^#{key} = .*/{key} = {value}/'" for key, value in values.items())
     node.run(f"sed -i {edits} {FILE}")
 

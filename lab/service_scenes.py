@@ -65,13 +65,13 @@ def stop(lab, checks: Checks, well: dict):
     checks.within(RETURN_LIMIT, "after the start both are in normal operation", lab.statuses, [well] * 2)
 
 
-def upgrade(lab, checks: Checks, well: dict, packages: str):
+def upgrade(lab, checks: Checks, well: dict, command: str):
     checks.scene("Rolling upgrade: node-a, then node-b")
     times_dead = [service.times_dead(node) for node in lab.nodes]
     for node in lab.nodes:
         configuration = node.run(f"cat {service.FILE}")
         starts, version = service.starts(node), installed_version(node)
-        node.run(f"apt-get install --quiet --yes {packages}/*.deb", 300)
+        node.run(command, 300)
         checks.that(f"{node} has another version", installed_version(node) != version, f"not {version}", version)
         checks.equal("its edited configuration is kept", configuration, node.run(f"cat {service.FILE}"))
         checks.equal("the daemon was restarted once", starts + 1, service.starts(node))
