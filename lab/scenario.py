@@ -218,10 +218,10 @@ def measure(lab: Lab, checks: Checks):
 
 def memory(node: Node) -> tuple[int, int]:
     """Return the resident and the anonymous memory of the daemon in KiB."""
-    fields = dict(
-        line.split(":", 1) for line in node.run(f"cat /proc/{PID}/status").splitlines()
-    )
-    return int(fields["VmRSS"].split()[0]), int(fields["RssAnon"].split()[0])
+    # The figures in `status` are only updated every 64 pages and thread.
+    rows = node.run(f"cat /proc/{PID}/smaps_rollup").splitlines()[1:]
+    fields = {name: int(value.split()[0]) for name, value in (row.split(":") for row in rows)}
+    return fields["Rss"], fields["Anonymous"]
 
 
 def processor_use(lab: Lab) -> list[tuple[float, float]]:

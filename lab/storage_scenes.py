@@ -51,7 +51,7 @@ def md_actions(lab: Lab, checks: Checks):
     checks.within(RESYNC_LIMIT, "no resync yet", lab.statuses, none)
     lab.b.run(
         f"{SLOW_RESYNC}; mdadm --quiet --stop /dev/md0 &&"
-        f" mdadm --quiet --assemble /dev/md0 --update=resync {MIRROR}"
+        f" mdadm --quiet --assemble /dev/md0 --update=resync {MIRROR} && mdadm --readwrite /dev/md0"
     )
     begin = resync_begin(lab.b)
     checks.within(
@@ -84,8 +84,8 @@ def md_actions(lab: Lab, checks: Checks):
 def resync_begin(node: Node) -> float:
     """Return when md began its latest resync, on this machine's clock."""
     message, uptime = node.run(
-        "dmesg | grep 'md: resync of RAID array md0' | tail -n 1; cat /proc/uptime"
-    ).splitlines()
+        "for i in $(seq 50); do dmesg | grep 'md: resync of RAID array md0' && break; sleep 0.1; done; cat /proc/uptime"
+    ).splitlines()[-2:]
     age = float(uptime.split()[0]) - float(message.strip("[").split("]")[0])
     return time.monotonic() - age
 
@@ -106,7 +106,7 @@ def check_snapshot(node: Node, checks: Checks, flag: str):
     """Check for a snapshot whose status record has the flag set."""
     parts = [
         rf'^\{{.*"{flag}":true.*\}}$',
-        r"^ *\d+ .* ternhad --config",
+        r"^ *\d+ .*ternhad --config",
         r"^/dev/vd.* \d+% /var/log/ha$",
         r"^MemTotal: +\d+ kB$",
     ]
