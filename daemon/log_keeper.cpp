@@ -141,10 +141,20 @@ Clock::time_point LogKeeper::workTime() const {
     if (_process < 0) {
         return std::max(_nextStart, Clock::now() + RESTART_DELAY);
     }
-    if (_busySince) {
-        return *_busySince + HANGS_AFTER + std::chrono::seconds(_options.rotateSize / SLOWEST_XZ);
+    if (_busySince && isNextDue()) {
+        return hangTime();
     }
-    return std::min(_nextMove, _nextSnapshot);
+    return std::min({_nextMove, _nextSnapshot, hangTime()});
+}
+
+bool LogKeeper::isNextDue() const {
+    return _isSnapshotWanted || _isRotationWanted || Clock::now() >= std::min(_nextMove, _nextSnapshot);
+}
+
+// When the request in progress has taken too long.
+Clock::time_point LogKeeper::hangTime() const {
+    return _busySince ? *_busySince + HANGS_AFTER + std::chrono::seconds(_options.rotateSize / SLOWEST_XZ)
+                      : Clock::time_point::max();
 }
 
 void LogKeeper::reap() {
@@ -158,7 +168,7 @@ void LogKeeper::reap() {
 }
 
 void LogKeeper::replaceIfHanging() {
-    if (_process >= 0 && _busySince && Clock::now() >= workTime()) {
+    if (_process >= 0 && Clock::now() >= hangTime()) {
         TERNHAD_LOG(_events, "The log keeper hangs: replacing it");
         leaveBehind(SIGKILL);
         _nextStart = Clock::now();

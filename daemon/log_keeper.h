@@ -34,8 +34,10 @@ class LogKeeper {
     void wantSnapshot() { _isSnapshotWanted = true; }
     void wantRotation() { _isRotationWanted = true; }
 
-    // Poll this descriptor and call work() when it is readable, after SIGCHLD, and at workTime().
-    int fd() const { return _replies; }
+    // Poll this descriptor, unless negative, and call work() when it is readable, after SIGCHLD, and
+    // at workTime(). A reply is only waited for if the next request is due: that saves a wake-up for
+    // each request.
+    int fd() const { return _busySince && isNextDue() ? _replies : -1; }
     void work();
     Clock::time_point workTime() const;
 
@@ -43,6 +45,8 @@ class LogKeeper {
     void finish(Clock::time_point deadline);
 
  private:
+    bool isNextDue() const;
+    Clock::time_point hangTime() const;
     void reap();
     void replaceIfHanging();
     void sendNext();
