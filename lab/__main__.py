@@ -2,13 +2,13 @@
 
 import argparse
 import fcntl
-import os
 import shutil
 import signal
 import subprocess
 import sys
 import tempfile
 import time
+import traceback
 from pathlib import Path
 
 import scenario
@@ -57,12 +57,11 @@ def interrupt(number, _frame):
 
 def run_lab(keep: bool) -> int:
     BUILD.mkdir(parents=True, exist_ok=True)
-    as_root = [] if os.geteuid() == 0 else ["sudo", "--preserve-env=HOME,XDG_CACHE_HOME"]
     with tempfile.TemporaryDirectory(prefix="ternha-packages.") as directory:
         with open(BUILD / "lock", "w") as lock:
             fcntl.flock(lock, fcntl.LOCK_EX)  # runs side by side share what they are made from
             make_packages(Path(directory))
-        image = Path(make("image", *as_root, ROOT / "lab/debian-image").strip())
+        image = Path(make("image", ROOT / "lab/debian-image", shown=sys.stderr).strip())
         return run_nodes(image, Path(directory), keep)
 
 
@@ -75,7 +74,7 @@ def run_nodes(image: Path, packages: Path, keep: bool) -> int:
     with Lab(image, packages, consoles) as lab:
         try:
             scenario.run(lab, checks)
-        except (CheckFailed, LabError) as failure:
+        except Exception as failure:
             failed = True
             report(failure, consoles)
         verdict = "1 failed, the rest not reached" if failed else "0 failed"
@@ -95,11 +94,17 @@ def make_packages(directory: Path):
     two_versions(PACKAGES, "armhf", directory)
 
 
-def make(what: str, *command: str | Path) -> str:
-    result = subprocess.run(command, cwd=ROOT, capture_output=True, text=True, check=False)
-    if result.returncode != 0:
-        raise LabError(f"the {what} cannot be made:\n{result.stdout}{result.stderr}")
-    return result.stdout
+def make(what: str, *command: str | Path, shown=subprocess.PIPE) -> str:
+    """Run the command and return its output; `shown` is where its standard error goes."""
+    with subprocess.Popen(command, cwd=ROOT, stdout=subprocess.PIPE, stderr=shown, text=True) as process:
+        try:
+            output, errors = process.communicate()
+        except BaseException:
+            process.terminate()
+            raise
+    if process.returncode != 0:
+        raise LabError(f"the {what} cannot be made:\n{output}{errors or ''}")
+    return output
 
 
 def report(failure: Exception, consoles: Consoles):
@@ -108,8 +113,10 @@ def report(failure: Exception, consoles: Consoles):
         print(f"FAILED: {failure.what}", file=sys.stderr)
         print(f"  expected: {failure.expected}\n  actual:   {failure.seen}", file=sys.stderr)
         consoles.note(f"FAILED: {failure.what}")
-    else:
+    elif isinstance(failure, LabError):
         print(f"FAILED: {failure}", file=sys.stderr)
+    else:
+        traceback.print_exception(failure)
     print(f"The last lines of the consoles, all of which are in {consoles.path}:", file=sys.stderr)
     print(consoles.tail(), file=sys.stderr, flush=True)
 

@@ -50,7 +50,7 @@ def full_disk(lab: Lab, checks: Checks):
     checks.scene("/var/log/ha of node-a is full")
     node = lab.a
     pid, before = service.pid(node), lab_lines(on_disk(node))
-    node.run("! dd if=/dev/zero of=/var/log/ha/filler bs=64k 2>/dev/null")
+    node.run("dd if=/dev/zero of=/var/log/ha/filler bs=64k 2>&1 | grep -q 'No space left on device'")
     log_lines(node, 201, 250)
     node.run("systemctl reload ternhad")
     checks.within(RETURN_LIMIT, "the buffer is emptied nevertheless", lambda: node.run("cat /tmp/ha/ha.daemon.log"), "")
@@ -84,7 +84,8 @@ def lose_power(lab: Lab, checks: Checks):
     node.run(STORAGE)
     checks.within(RETURN_LIMIT, "both report alive and connected", lab.statuses, [WELL] * 2)
     lab.a.run(STOP_WRITER)
-    checks.within(RETURN_LIMIT, "DRBD has resynced", lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
+    checks.within(RETURN_LIMIT, "DRBD has resynced", lambda: node.try_run("dmesg | grep -q 'Resync done'")[0], 0)
+    checks.within(RETURN_LIMIT, "and both disks are up to date", lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
 
 
 def reboot_peer(lab: Lab, checks: Checks):

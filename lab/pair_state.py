@@ -3,7 +3,7 @@
 import re
 
 from lab import Lab
-from node import parse_drbd_state
+from node import Node, parse_drbd_state
 
 DEAD_LIMIT = 5  # seconds until a silent peer is declared dead
 CUT_LIMIT = 8  # until both nodes declare the peer dead after a link cut
@@ -19,7 +19,7 @@ APART = {"isRemoteAlive": False, "isDRBDConnect": False}
 MIRROR = "/dev/disk/by-id/virtio-md0 /dev/disk/by-id/virtio-md1"
 START_WRITER = (
     "drbdadm primary r0 && systemd-run --quiet --unit=writer sh -c"
-    " 'while dd if=/dev/urandom of=/dev/drbd0 bs=64k count=8 conv=fsync status=none; do sleep 0.5; done'"
+    " 'while dd if=/dev/urandom of=/dev/drbd0 bs=64k count=1 conv=fsync status=none; do sleep 0.5; done'"
 )
 STOP_WRITER = "systemctl stop writer && drbdadm secondary r0"
 STORAGE = f"mdadm --quiet --assemble /dev/md0 {MIRROR} && drbdadm up r0"  # after a boot
@@ -33,3 +33,13 @@ def drbd_disks(lab: Lab) -> list[str]:
     """Return the local and the peer disk states of each node while Connected."""
     found = [re.search(r"cs:Connected .* ds:(\S+)", output) for output in lab.run("cat /proc/drbd")]
     return [match.group(1) if match else "" for match in found]
+
+
+def drbd_received(node: Node) -> int:
+    """Return how much the node has received from its peer, in KiB."""
+    return int(re.search(r" nr:(\d+) ", node.run("cat /proc/drbd")).group(1))
+
+
+def count_disconnects(lab: Lab) -> list[int]:
+    """Return how often DRBD has left the state Connected on each node since its boot."""
+    return [int(output) for output in lab.run("dmesg | grep -c 'conn( Connected -> ' || true")]

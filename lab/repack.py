@@ -2,17 +2,16 @@
 
 import shutil
 import subprocess
+import tempfile
 from pathlib import Path
 
 from failure import LabError
 from service import PACKAGES
 
 SCRIPT = """
-    unpacked=$(mktemp -d)
-    trap 'rm -r "$unpacked"' EXIT
-    dpkg-deb --raw-extract "$1" "$unpacked/package"
-    sed -i "s/^\\(Version: .*\\)-[^-]*$/\\1-0/" "$unpacked/package/DEBIAN/control"
-    dpkg-deb --root-owner-group -Znone --build "$unpacked/package" "$2"
+    dpkg-deb --raw-extract "$1" "$3/package"
+    sed -i "s/^\\(Version: .*\\)-[^-]*$/\\1-0/" "$3/package/DEBIAN/control"
+    dpkg-deb --root-owner-group -Znone --build "$3/package" "$2"
 """
 
 
@@ -28,7 +27,8 @@ def two_versions(built: Path, architecture: str, directory: Path):
 
 def repack(package: Path, target: Path):
     """Build the same package with a lower Debian revision."""
-    command = ["sh", "-ec", SCRIPT, "repack", package, target]
-    result = subprocess.run(command, capture_output=True, text=True, check=False)
+    with tempfile.TemporaryDirectory() as unpacked:
+        command = ["sh", "-ec", SCRIPT, "repack", package, target, unpacked]
+        result = subprocess.run(command, capture_output=True, text=True, check=False)
     if result.returncode != 0:
         raise LabError(f"{package} cannot be repacked: {result.stderr}")

@@ -35,8 +35,15 @@ def restarts(node: Node) -> int:
     return int(properties(node, "NRestarts")[0])
 
 
-def starts(node: Node) -> int:
-    return int(node.run("journalctl --unit=ternhad --output=cat | grep --count '^Started ' || true"))
+def installation(node: Node) -> tuple[str, int, str]:
+    """Return the version of the package, how often the daemon was started, and its configuration."""
+    output = node.run(
+        "dpkg-query --show --showformat='${Version}\\n' ternhad;"
+        " journalctl --unit=ternhad --output=cat | grep --count '^Started ' || true;"
+        f" cat {FILE}"
+    )
+    version, starts, configuration = output.split("\n", 2)
+    return version, int(starts), configuration
 
 
 def ends(node: Node) -> list[str]:

@@ -1,6 +1,7 @@
 """Scenes of the daemon as a service, for any kind of nodes."""
 
 import time
+from typing import Callable
 
 import service
 from checks import Checks
@@ -26,13 +27,14 @@ def unknown_request(lab, checks: Checks, well: dict):
     checks.equal("node-a has never declared the peer dead", times_dead, service.times_dead(lab.a))
 
 
-def hung_thread(lab, checks: Checks, well: dict, setting: str):
-    """`setting` replaces the service's /proc/drbd by a FIFO, so that open() blocks."""
+def hung_thread(lab, checks: Checks, well: dict, setting: str, release: Callable[[], None]):
+    """`setting` replaces the service's /proc/drbd by a FIFO, so that open() blocks; `release` ends
+    that for the next start."""
     checks.scene("A thread of node-b's daemon hangs")
     times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
     service.override(lab.b, "WatchdogSec=10", setting)
     lab.b.run("systemctl restart ternhad")
-    service.override(lab.b)  # for the restart
+    release()
     check_restarted(lab, checks, [*ends, ABORTED], well)
     watchdog = lab.b.run("journalctl --unit=ternhad --output=cat | grep -c 'Watchdog timeout'").strip()
     checks.equal("by the watchdog", "1", watchdog)
@@ -69,18 +71,14 @@ def upgrade(lab, checks: Checks, well: dict, command: str):
     checks.scene("Rolling upgrade: node-a, then node-b")
     times_dead = [service.times_dead(node) for node in lab.nodes]
     for node in lab.nodes:
-        configuration = node.run(f"cat {service.FILE}")
-        starts, version = service.starts(node), installed_version(node)
+        old_version, starts, configuration = service.installation(node)
         node.run(command, 300)
-        checks.that(f"{node} has another version", installed_version(node) != version, f"not {version}", version)
-        checks.equal("its edited configuration is kept", configuration, node.run(f"cat {service.FILE}"))
-        checks.equal("the daemon was restarted once", starts + 1, service.starts(node))
+        version, new_starts, new_configuration = service.installation(node)
+        checks.that(f"{node} has another version", version != old_version, f"not {old_version}", version)
+        checks.equal("its edited configuration is kept", configuration, new_configuration)
+        checks.equal("the daemon was restarted once", starts + 1, new_starts)
         checks.within(RETURN_LIMIT, "both are in normal operation again", lab.statuses, [well] * 2)
     checks.equal("neither node has declared its peer dead", times_dead, [service.times_dead(node) for node in lab.nodes])
-
-
-def installed_version(node) -> str:
-    return node.run("dpkg-query --show --showformat='${Version}' ternhad")
 
 
 def send(lab, request: str):
