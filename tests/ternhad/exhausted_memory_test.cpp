@@ -22,7 +22,10 @@ class ExhaustedMemoryTest : public ::testing::Test {
         command.insert(command.end(), arguments.begin(), arguments.end());
         a.daemon.emplace(a.node.start(command));
         b.start();
-        EXPECT_TRUE(test::eventually(20s, [this] { return bothSee(true); }));
+        // Without memory it could not start, nor would it try for long.
+        EXPECT_TRUE(test::eventually(20s, [this] {
+            return bothSee(true) && a.log().find("Started on") != std::string::npos;
+        })) << a.daemon->error();
     }
 
     bool bothSee(bool alive) { return a.sees("isRemoteAlive", alive) && b.sees("isRemoteAlive", alive); }
@@ -64,7 +67,7 @@ TEST_F(ExhaustedMemoryTest, LastingExhaustionEndsTheDaemon) {
     const auto status = a.daemon->waitFor(60s);
     ASSERT_TRUE(status.has_value());
     EXPECT_TRUE(WIFSIGNALED(*status)) << *status;
-    EXPECT_GE(stopwatch.elapsed(), 10s);
+    EXPECT_GE(stopwatch.elapsed(), 10s) << a.daemon->error();
 }
 
 }  // namespace
