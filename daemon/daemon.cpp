@@ -115,10 +115,8 @@ bool Daemon::startThreads() try {
         return complain("bind the control socket " + _options.socket, errno);
     }
     _threads.start("reboot", [this] { _reboot.flush(); });
-    _threads.start("clients", [this] { _controlServer.run(&_progress); });
     _threads.start("orders", [this] { _controlServer.runOrders(); });
     _threads.start("streams", [this] { _streams.run(); });
-    startStatusServer();
     _threads.start("journal", [this] { _announcer.run(); });
     if (!_options.notify.empty()) {
         _threads.start("notify", [this] { _notifier.run(); });
@@ -126,6 +124,9 @@ bool Daemon::startThreads() try {
     _threads.start("peer", [this] { _peerWatcher.run(); });
     _threads.start("checks", [this] { _nodeWatcher.runChecks(); });
     _threads.start("link", [this] { _nodeWatcher.runMeasurements(); });
+    // Last: a daemon that replies runs completely.
+    startStatusServer();
+    _threads.start("clients", [this] { _controlServer.run(&_progress); });
     return true;
 } catch (const std::exception& error) {
     std::cerr << "ternhad: cannot start its threads: " << error.what() << '\n';

@@ -50,11 +50,11 @@ void Threads::start(const char* name, std::function<void()> body) {
     std::promise<void> promise;
     std::future<void> end = promise.get_future();
     // An uncaught exception ends the process: a daemon that lacks a thread would only seem to work.
-    std::thread thread([body = std::move(body), done = std::move(promise)]() mutable noexcept {
+    std::thread thread([name, body = std::move(body), done = std::move(promise)]() mutable noexcept {
+        pthread_setname_np(pthread_self(), name);
         body();
         done.set_value();
     });
-    pthread_setname_np(thread.native_handle(), name);
     _workers.push_back({std::move(thread), std::move(end)});
 }
 

@@ -16,7 +16,7 @@ class Threads {
     // Set up SIGUSR1, which interrupts blocking system calls.
     Threads();
 
-    // name: at most 15 characters, for ps and top.
+    // name: for ps and top; at most 15 characters, which stay valid.
     void start(const char* name, std::function<void()> body);
 
     // Interrupt all threads, terminate the programs that they wait for, and join them. Returns
