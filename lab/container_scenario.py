@@ -7,7 +7,7 @@ import service
 from checks import Checks
 from containers import THIRD_HOST, Containers
 from node import Node
-from service_scenes import RETURN_LIMIT, hung_thread, kill, reload, stop, unknown_request, upgrade
+from service_scenes import RETURN_LIMIT, WATCHDOG, hung_thread, kill, reload, stop, unknown_request, upgrade
 
 PORT = 7499
 ALIVE = {"isRemoteAlive": True}
@@ -25,7 +25,8 @@ def run(pair: Containers, checks: Checks):
     kill(pair, checks, ALIVE)
     unknown_request(pair, checks, ALIVE)
     private_proc(pair.b, "mkfifo drbd")
-    hung_thread(pair, checks, ALIVE, PRIVATE_PROC, lambda: service.override(pair.b))
+    service.override(pair.b, WATCHDOG, PRIVATE_PROC)
+    hung_thread(pair, checks, ALIVE, lambda: service.override(pair.b))
     reload(pair, checks)
     reboot_trigger(pair, checks)
     stop(pair, checks, ALIVE)

@@ -3,19 +3,21 @@
 import base64
 import lzma
 import time
+from dataclasses import dataclass
 
 import service
 from checks import Checks
 from lab import Lab
 from node import Node, parse_status
 from pair_state import (
-    DEAD, DEAD_LIMIT, RETURN_LIMIT, SOME_ROUNDS, START_WRITER, STOP_WRITER, STORAGE, WELL, drbd_disks,
+    DEAD, DEAD_LIMIT, OUTLAST_RESTARTS, RETURN_LIMIT, START_WRITER, STOP_WRITER, STORAGE, WELL, drbd_disks,
 )
 
 ON_DISK = (
     "cd /var/log/ha; for file in $(ls -rv ha.daemon.log.*.xz 2>/dev/null); do xz -dc $file; done;"
     " cat ha.daemon.log 2>/dev/null || true"
 )
+NEWEST_ON_DISK = "cat /var/log/ha/ha.daemon.log 2>/dev/null || true"
 READS_STANDARD_INPUT = ["3", "0x0"]  # system call and argument, on 32-bit ARM
 
 
@@ -46,25 +48,40 @@ def rotate_log(lab: Lab, checks: Checks):
     checks.equal("and all earlier lines", before, unpacked.splitlines()[: len(before)])
 
 
-def full_disk(lab: Lab, checks: Checks):
+@dataclass
+class Before:
+    """What was on a node before it lost power, was rebooted, or ran out of space."""
+
+    log: list[str]
+    boot_id: str = ""
+    pid: int = 0
+    resets: int = 0
+
+
+def fill_disk(lab: Lab, checks: Checks) -> Before:
     checks.scene("/var/log/ha of node-a is full")
     node = lab.a
-    pid, before = service.pid(node), lab_lines(on_disk(node))
+    before = Before(lab_lines(on_disk(node)), pid=service.pid(node))
     node.run("dd if=/dev/zero of=/var/log/ha/filler bs=64k 2>&1 | grep -q 'No space left on device'")
     log_lines(node, 201, 250)
     node.run("systemctl reload ternhad")
-    checks.within(RETURN_LIMIT, "the buffer is emptied nevertheless", lambda: node.run("cat /tmp/ha/ha.daemon.log"), "")
-    checks.holds(SOME_ROUNDS, "both report alive and connected", lab.statuses, [WELL] * 2)
-    checks.equal("by the same daemon", pid, service.pid(node))
-    checks.equal("earlier lines are still on the disk", before, lab_lines(on_disk(node))[: len(before)])
+    checks.within(RETURN_LIMIT, "the buffer is emptied nevertheless",
+                  lambda: lab_lines(node.run("cat /tmp/ha/ha.daemon.log").splitlines()), [])
+    return before
+
+
+def free_disk(lab: Lab, checks: Checks, before: Before):
+    checks.scene("/var/log/ha of node-a, full until now, has space again")
+    node = lab.a
+    checks.equal("the daemon is the same", before.pid, service.pid(node))
+    checks.equal("earlier lines are still on the disk", before.log, lab_lines(on_disk(node))[: len(before.log)])
     node.run("rm /var/log/ha/filler")
     log_lines(node, 251, 300)
     node.run("systemctl reload ternhad")
-    checks.within(RETURN_LIMIT, "with space again, lines get there", lambda: lab_lines(on_disk(node))[-50:],
-                  expected_lines(251, 300))
+    checks.within(RETURN_LIMIT, "new lines get there", lambda: lab_lines(on_disk(node))[-50:], expected_lines(251, 300))
 
 
-def lose_power(lab: Lab, checks: Checks):
+def lose_power(lab: Lab, checks: Checks) -> Before:
     checks.scene("node-b loses power: its emulator is killed and started again")
     node = lab.b
     log_lines(node, 301, 350)
@@ -73,14 +90,19 @@ def lose_power(lab: Lab, checks: Checks):
                   expected_lines(301, 350))
     checks.within(RETURN_LIMIT, "the log keeper waits for its next request",
                   lambda: node.run("cat /proc/$(pgrep -x ternhad-logs)/syscall 2>/dev/null || true").split()[:2], READS_STANDARD_INPUT)
-    before, boot_id = on_disk(node), node.boot_id
+    before = Before(on_disk(node), node.boot_id)
     lab.a.run(START_WRITER)
     begin = time.monotonic()
     lab.lose_power(node)
     checks.within(DEAD_LIMIT, "node-a reports dead", lab.a.status, DEAD, begin)
-    node.wait_for_boot()
-    checks.that("node-b has another boot id", node.boot_id != boot_id, f"other than {boot_id}", node.boot_id)
-    checks.equal("its log holds every line that was moved", before, on_disk(node)[: len(before)])
+    return before
+
+
+def return_with_disks(lab: Lab, checks: Checks, before: Before):
+    checks.scene("node-b, which lost power, is back")
+    node = lab.b
+    wait_for_boot(lab, checks, before)
+    checks.equal("its log holds every line that was moved", before.log, on_disk(node)[: len(before.log)])
     node.run(STORAGE)
     checks.within(RETURN_LIMIT, "both report alive and connected", lab.statuses, [WELL] * 2)
     lab.a.run(STOP_WRITER)
@@ -88,16 +110,12 @@ def lose_power(lab: Lab, checks: Checks):
     checks.within(RETURN_LIMIT, "and both disks are up to date", lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
 
 
-def reboot_peer(lab: Lab, checks: Checks):
+def reboot_peer(lab: Lab, checks: Checks) -> Before:
     checks.scene("node-a requests a reboot of node-b")
     log_lines(lab.b, 351, 400)
-    log = "cat /var/log/ha/ha.daemon.log 2>/dev/null || true"
-    expected = expected_lines(351, 400)
-    checks.equal("50 lines are not on the disk of node-b yet", [], lab_lines(lab.b.run(log).splitlines()))
-    resets = len(lab.b.emulator.events("RESET"))
-    boot_id = lab.b.boot_id
-    before = lab.b.log()
-    checks.equal("but in its log", expected, lab_lines(before))
+    checks.equal("50 lines are not on the disk of node-b yet", [], lab_lines(lab.b.run(NEWEST_ON_DISK).splitlines()))
+    before = Before(lab.b.log(), lab.b.boot_id, resets=len(lab.b.emulator.events("RESET")))
+    checks.equal("but in its log", expected_lines(351, 400), lab_lines(before.log))
 
     # All three at once, before the node is back.
     order, rebooting, record = lab.a.run(
@@ -107,22 +125,34 @@ def reboot_peer(lab: Lab, checks: Checks):
     checks.equal("node-a reports rebooting", "yes", rebooting)
     checks.equal("and dead", False, parse_status(record)["isRemoteAlive"])
     checks.that("node-a has logged it", lab.a.has_logged(" Remote offline"), "Remote offline", lab.a.log()[-5:])
+    return before
 
-    lab.b.wait_for_boot()
-    new_resets = lab.b.emulator.events("RESET")[resets:]
+
+def return_rebooted(lab: Lab, checks: Checks, before: Before):
+    """Afterwards the daemon of node-a outlasts restarts of its peer's; that of node-b started so."""
+    checks.scene("node-b, which was rebooted, is back")
+    wait_for_boot(lab, checks, before)
     checks.equal(
         "the emulator saw the guest reset itself, once",
         [{"guest": True, "reason": "guest-reset"}],
-        [event["data"] for event in new_resets],
+        [event["data"] for event in lab.b.emulator.events("RESET")[before.resets :]],
     )
-    checks.that("node-b has another boot id", lab.b.boot_id != boot_id, f"other than {boot_id}", lab.b.boot_id)
-    after = lab.b.run(log).splitlines()
-    checks.equal("the 50 lines are on its disk", expected, lab_lines(after))
-    checks.equal("and every earlier line", before, after[: len(before)])
+    after = lab.b.run(NEWEST_ON_DISK).splitlines()
+    checks.equal("the 50 lines are on its disk", expected_lines(351, 400), lab_lines(after))
+    checks.equal("and every earlier line", before.log, after[: len(before.log)])
 
-    lab.b.run(STORAGE)
+    storage = lab.b.channel.start(STORAGE)
+    checks.within(RETURN_LIMIT, "node-a no longer reports rebooting", lambda: lab.a.try_run("ternhactl rebooting"),
+                  (1, "no\n"))
+    lab.a.run(f"{OUTLAST_RESTARTS} && systemctl restart ternhad")
+    lab.b.result(STORAGE, storage)
     checks.within(RETURN_LIMIT, "both report alive and connected", lab.statuses, [WELL] * 2)
-    checks.equal("node-a no longer reports rebooting", (1, "no\n"), lab.a.try_run("ternhactl rebooting"))
+
+
+def wait_for_boot(lab: Lab, checks: Checks, before: Before):
+    lab.b.wait_for_boot()
+    boot_id = lab.b.boot_id
+    checks.that("it has another boot id", boot_id != before.boot_id, f"other than {before.boot_id}", boot_id)
 
 
 def lab_lines(lines: list[str]) -> list[str]:

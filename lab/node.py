@@ -36,7 +36,8 @@ class Channel:
 
     def start(self, script: str) -> int:
         self._last_id = time.monotonic_ns()  # unique on this channel
-        line = f"{self._last_id} {base64.b64encode(script.encode()).decode()}\n"
+        escaped = script.replace("\\", "\\\\").replace("\n", "\\n")
+        line = f"{self._last_id} {escaped}\n"
         self._socket.settimeout(COMMAND_LIMIT)
         try:
             self._socket.sendall(line.encode())

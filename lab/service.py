@@ -6,6 +6,7 @@ from node import Node
 
 FILE = "/etc/ternha/ternhad.conf"
 DROP_IN = "/run/systemd/system/ternhad.service.d/lab.conf"
+LASTING_DROP_IN = "/etc/systemd/system/ternhad.service.d/lab.conf"
 PACKAGES = ["libterncore6", "libternhadaemon6", "ternhad"]
 
 
@@ -54,9 +55,14 @@ def ends(node: Node) -> list[str]:
 
 def override(node: Node, *settings: str):
     """Add a drop-in to the unit, or remove it."""
+    prepare_override(node, DROP_IN, *settings)
+    node.run("systemctl daemon-reload")
+
+
+def prepare_override(node: Node, path: str, *settings: str):
+    """The same from the next time on that systemd is reloaded or started."""
     lines = "\\n".join(["[Service]", *settings])
-    edit = f"mkdir -p {Path(DROP_IN).parent} && printf '{lines}\\n' >{DROP_IN}" if settings else f"rm -f {DROP_IN}"
-    node.run(f"{edit} && systemctl daemon-reload")
+    node.run(f"mkdir -p {Path(path).parent} && printf '{lines}\\n' >{path}" if settings else f"rm -f {path}")
 
 
 def times_dead(node: Node) -> int:

@@ -9,6 +9,7 @@ from checks import Checks
 RETURN_LIMIT = 30  # seconds until both nodes are in normal operation again
 STOP_LIMIT = 10
 ABORTED = "code=killed, status=6/ABRT"
+WATCHDOG = "WatchdogSec=10"
 
 
 def kill(lab, checks: Checks, well: dict):
@@ -27,12 +28,11 @@ def unknown_request(lab, checks: Checks, well: dict):
     checks.equal("node-a has never declared the peer dead", times_dead, service.times_dead(lab.a))
 
 
-def hung_thread(lab, checks: Checks, well: dict, setting: str, release: Callable[[], None]):
-    """`setting` replaces the service's /proc/drbd by a FIFO, so that open() blocks; `release` ends
-    that for the next start."""
+def hung_thread(lab, checks: Checks, well: dict, release: Callable[[], None]):
+    """Expects a drop-in with WATCHDOG that replaces the service's /proc/drbd by a FIFO, so that open()
+    blocks; `release` ends that for the next start."""
     checks.scene("A thread of node-b's daemon hangs")
     times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
-    service.override(lab.b, "WatchdogSec=10", setting)
     lab.b.run("systemctl restart ternhad")
     release()
     check_restarted(lab, checks, [*ends, ABORTED], well)

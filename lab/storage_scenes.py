@@ -27,7 +27,7 @@ def initial_sync(lab: Lab, checks: Checks):
         lambda: connected_during_state(lab),
         [("SyncSource", True), ("SyncTarget", True)],
     )
-    lab.run("drbdadm disk-options --resync-rate=8M r0")
+    lab.run("drbdadm disk-options --resync-rate=50M r0")
     checks.within(RETURN_LIMIT, "the sync ends: DRBD is Connected, both disks up to date",
                   lambda: drbd_disks(lab), ["UpToDate/UpToDate"] * 2)
     checks.holds(SOME_ROUNDS, "both still report alive and connected", lab.statuses, [WELL] * 2)
