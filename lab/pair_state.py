@@ -10,7 +10,6 @@ DEAD_LIMIT = 5  # seconds until a silent peer is declared dead
 CUT_LIMIT = 8  # until both nodes declare the peer dead after a link cut
 RESYNC_LIMIT = 3  # until both nodes report a resync
 RETURN_LIMIT = 30  # until both nodes are in normal operation again
-RESTART_LIMIT = 15  # until a daemon is restarted: on an emulated processor that takes seconds
 SOME_ROUNDS = 2  # seconds; the daemons check twice a second
 
 ALIVE = {"isRemoteAlive": True}
@@ -24,8 +23,9 @@ START_WRITER = (
     " 'while dd if=/dev/urandom of=/dev/drbd0 bs=64k count=1 conv=fsync status=none; do sleep 0.5; done'"
 )
 STOP_WRITER = "systemctl stop writer && drbdadm secondary r0"
-OUTLAST_RESTARTS = f"sed -i 's/^#dead-after = .*/dead-after = {RESTART_LIMIT}/' {service.FILE}"
-STORAGE = f"mdadm --quiet --assemble /dev/md0 {MIRROR} && drbdadm up r0"  # after a boot
+# For scenes in which a daemon is restarted: on an emulated processor that takes seconds.
+RAISE_DEAD_AFTER = f"sed -i 's/^#dead-after = .*/dead-after = 15/' {service.FILE}"
+STORAGE = f"drbdadm up r0 && mdadm --quiet --assemble /dev/md0 {MIRROR}"  # after a boot
 
 
 def drbd_states(lab: Lab) -> list[str]:

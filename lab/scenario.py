@@ -7,18 +7,18 @@ import service
 from checks import Checks
 from lab import Lab
 from log_scenes import (
-    fill_disk, free_disk, lose_power, reboot_peer, return_rebooted, return_with_disks, rotate_log,
+    fill_disk, free_disk, lose_power, reboot_peer, return_after_reboot, return_after_power_loss, rotate_log,
 )
 from node import Node
 from pair_state import (
-    APART, CUT_LIMIT, DEAD, DEAD_LIMIT, MIRROR, OUTLAST_RESTARTS, RETURN_LIMIT, SOME_ROUNDS, START_WRITER, STOP_WRITER,
+    APART, CUT_LIMIT, DEAD, DEAD_LIMIT, MIRROR, RAISE_DEAD_AFTER, RETURN_LIMIT, SOME_ROUNDS, START_WRITER, STOP_WRITER,
     WELL, count_disconnects, drbd_received, drbd_states,
 )
 from service_scenes import WATCHDOG, hung_thread, unknown_request, upgrade
 from storage_scenes import initial_sync, md_actions, split_brain
 
 LONGER_THAN_DEAD_AFTER = 4  # seconds
-IDLE = 6  # seconds over which processor use is measured
+IDLE = 10  # seconds over which processor use is measured: the longest default interval
 IDLE_LIMIT = 1200  # CPU seconds per hour on an emulated processor; a thread that never sleeps uses 3600
 INTERVALS = {  # suitable for an emulated machine on a busy host; the scenario moves the logs itself
     "check-interval": 0.5,
@@ -47,21 +47,23 @@ def run(lab: Lab, checks: Checks):
     kill_daemon(lab, checks)
     freeze_node(lab, checks)
     step_clock(lab, checks)
-    # Scenes of node-a alone while node-b boots.
+    # node-b boots twice; meanwhile scenes of node-a alone.
     power_loss = lose_power(lab, checks)
     rotate_log(lab, checks)
     full_disk = fill_disk(lab, checks)
-    return_with_disks(lab, checks, power_loss)
+    return_after_power_loss(lab, checks, power_loss)
     prepare_next_boot(lab.b)
     reboot = reboot_peer(lab, checks)
     free_disk(lab, checks, full_disk)
-    return_rebooted(lab, checks, reboot)
+    return_after_reboot(lab, checks, reboot)
+    raise_dead_after(lab, checks)
     unknown_request(lab, checks, WELL)
     lab.b.run(f"mkfifo {FIFO}")
     hung_thread(lab, checks, WELL, lambda: lab.b.run(f"rm {FIFO}"))
     upgrade_while_replicating(lab, checks)
+    begin, use = time.monotonic(), processor_use(lab)
     firewall(lab, checks)
-    measure(lab, checks)
+    measure(lab, checks, begin, use)
 
 
 def install(lab: Lab, checks: Checks):
@@ -145,6 +147,7 @@ def kill_daemon(lab: Lab, checks: Checks):
     begin = time.monotonic()
     checks.within(DEAD_LIMIT, "node-a reports dead", lab.a.status, DEAD | {"isDRBDConnect": True}, begin)
     checks.equal("systemd saw it killed", "code=killed, status=9/KILL", service.ends(lab.b)[-1])
+    checks.equal("and does not restart it", "failed", service.state(lab.b))
     lab.b.run("systemctl start ternhad")
     checks.within(RETURN_LIMIT, "both report alive after its start", lab.statuses, [WELL] * 2)
 
@@ -174,9 +177,15 @@ def step_clock(lab: Lab, checks: Checks):
 
 def prepare_next_boot(node: Node):
     """Change settings of the daemon without the seconds that a restart takes."""
-    node.run(OUTLAST_RESTARTS)
     # For hung_thread(): the optional source (-) is only there at one start.
     service.prepare_override(node, service.LASTING_DROP_IN, WATCHDOG, f"BindPaths=-{FIFO}:/proc/drbd")
+    node.run(f"{RAISE_DEAD_AFTER} && sync")  # the reset flushes nothing
+
+
+def raise_dead_after(lab: Lab, checks: Checks):
+    checks.scene("dead-after is raised on node-a, as on node-b before its boot")
+    lab.a.run(f"{RAISE_DEAD_AFTER} && systemctl restart ternhad")
+    checks.within(RETURN_LIMIT, "both report alive and connected", lab.statuses, [WELL] * 2)
 
 
 def upgrade_while_replicating(lab: Lab, checks: Checks):
@@ -207,14 +216,13 @@ def firewall(lab: Lab, checks: Checks):
     checks.holds(SOME_ROUNDS, "which does not reach the daemon", lambda: service.ends(lab.b), ends)
 
 
-def measure(lab: Lab, checks: Checks):
+def measure(lab: Lab, checks: Checks, begin: float, before: list[float]):
+    """`before` is the processor time used at the time `begin`."""
     checks.scene("Resource use of ternhad")
     for node in lab.nodes:
         for process, resident, anonymous in memory(node):
             checks.fact(f"memory on {node}: {process} {resident} KiB resident, {anonymous} KiB of it anonymous")
-    before = processor_use(lab)
-    begin = time.monotonic()
-    time.sleep(IDLE)
+    time.sleep(max(0, begin + IDLE - time.monotonic()))
     after = processor_use(lab)
     hour = 3600 / (time.monotonic() - begin)
     for node, use_before, use_after in zip(lab.nodes, before, after):

@@ -6,7 +6,7 @@ from node import Node
 
 FILE = "/etc/ternha/ternhad.conf"
 DROP_IN = "/run/systemd/system/ternhad.service.d/lab.conf"
-LASTING_DROP_IN = "/etc/systemd/system/ternhad.service.d/lab.conf"
+LASTING_DROP_IN = "/etc/systemd/system/ternhad.service.d/lab.conf"  # survives a reboot
 PACKAGES = ["libterncore6", "libternhadaemon6", "ternhad"]
 
 
@@ -60,7 +60,7 @@ def override(node: Node, *settings: str):
 
 
 def prepare_override(node: Node, path: str, *settings: str):
-    """The same from the next time on that systemd is reloaded or started."""
+    """Write a drop-in, or remove it; it takes effect when systemd is reloaded or started."""
     lines = "\\n".join(["[Service]", *settings])
     node.run(f"mkdir -p {Path(path).parent} && printf '{lines}\\n' >{path}" if settings else f"rm -f {path}")
 

@@ -9,7 +9,7 @@ from checks import Checks
 RETURN_LIMIT = 30  # seconds until both nodes are in normal operation again
 STOP_LIMIT = 10
 ABORTED = "code=killed, status=6/ABRT"
-WATCHDOG = "WatchdogSec=10"
+WATCHDOG = "WatchdogSec=10"  # with it a daemon also ends when its peer is silent for some 7 seconds
 
 
 def kill(lab, checks: Checks, well: dict):
