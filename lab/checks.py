@@ -6,7 +6,7 @@ from typing import Any, Callable
 from consoles import Consoles
 from failure import CheckFailed
 
-POLL = 0.1  # seconds between two polls
+POLL = 0.2  # seconds between two polls: an emulated processor needs as long for one
 LONGEST = 3000  # characters of the expected and the actual state that a failed run prints
 
 

@@ -10,7 +10,7 @@ from failure import LabError
 
 PROMPT = 10  # seconds within which an emulator replies
 KERNEL_OPTIONS = (
-    "console=ttyAMA0 quiet panic=5 net.ifnames=0 root=/dev/vda rw rootflags=noatime"
+    "console=ttyAMA0 quiet panic=5 cryptomgr.notests net.ifnames=0 root=/dev/vda rw rootflags=noatime"
     " systemd.show_status=0 systemd.journald.forward_to_console=1"
 )
 

@@ -111,19 +111,11 @@ class Node:
 
     def log(self) -> list[str]:
         """Return the daemon log: lines on disk, then buffered lines."""
-        return self._read_log("")
+        return self.run(READ_LOG % "").splitlines()
 
     def full_log(self) -> list[str]:
         """Return the daemon log with its archives."""
-        return self._read_log("for file in $(ls -rv ha.daemon.log.*.xz 2>/dev/null); do xz -dc $file; done;")
-
-    def _read_log(self, archives: str) -> list[str]:
-        # Repeat if the daemon moved lines meanwhile: the read could miss them.
-        return self.run(
-            "cd /var/log/ha || exit 0; state() { stat --format=%i-%s ha.daemon.log 2>/dev/null; };"
-            f" while before=$(state); text=$({archives} cat ha.daemon.log /tmp/ha/ha.daemon.log 2>/dev/null);"
-            ' [ "$before" != "$(state)" ]; do :; done; printf "%s\n" "$text"'
-        ).splitlines()
+        return self.run(FULL_LOG).splitlines()
 
     def has_logged(self, text: str) -> bool:
         return any(line.endswith(text) for line in self.log())
@@ -133,6 +125,13 @@ class Node:
         return parse_drbd_state(self.run("cat /proc/drbd"))
 
 
+# Repeats if the daemon moved lines meanwhile: the read could miss them.
+READ_LOG = (
+    "cd /var/log/ha || exit 0; state() { stat --format=%%i-%%s ha.daemon.log 2>/dev/null; };"
+    " while before=$(state); text=$(%s cat ha.daemon.log /tmp/ha/ha.daemon.log 2>/dev/null);"
+    ' [ "$before" != "$(state)" ]; do :; done; printf "%%s\\n" "$text"'
+)
+FULL_LOG = READ_LOG % "for file in $(ls -rv ha.daemon.log.*.xz 2>/dev/null); do xz -dc $file; done;"
 # A daemon that is starting or was killed has no status.
 STATUS = "ternhactl status --json 2>/dev/null || echo null"
 

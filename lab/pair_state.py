@@ -20,7 +20,7 @@ APART = {"isRemoteAlive": False, "isDRBDConnect": False}
 MIRROR = "/dev/disk/by-id/virtio-md0 /dev/disk/by-id/virtio-md1"
 START_WRITER = (
     "drbdadm primary r0 && systemd-run --quiet --unit=writer sh -c"
-    " 'while dd if=/dev/urandom of=/dev/drbd0 bs=64k count=1 conv=fsync status=none; do sleep 0.5; done'"
+    " 'while dd if=/dev/urandom of=/dev/drbd0 bs=4k count=1 conv=fsync status=none; do sleep 1; done'"
 )
 STOP_WRITER = "systemctl stop writer && drbdadm secondary r0"
 # For scenes in which a daemon is restarted: on an emulated processor that takes seconds.

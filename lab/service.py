@@ -2,11 +2,13 @@
 
 from pathlib import Path
 
-from node import Node
+from node import FULL_LOG, Node
+from node_pair import NodePair
 
 FILE = "/etc/ternha/ternhad.conf"
 DROP_IN = "/run/systemd/system/ternhad.service.d/lab.conf"
 LASTING_DROP_IN = "/etc/systemd/system/ternhad.service.d/lab.conf"  # survives a reboot
+ENDS = "journalctl --unit=ternhad --output=cat | grep 'Main process exited' || true"
 PACKAGES = ["libterncore6", "libternhadaemon6", "ternhad"]
 
 
@@ -49,8 +51,7 @@ def installation(node: Node) -> tuple[str, int, str]:
 
 def ends(node: Node) -> list[str]:
     """Return how the main process ended in each failure."""
-    lines = node.run("journalctl --unit=ternhad --output=cat | grep 'Main process exited' || true").splitlines()
-    return [line.partition("exited, ")[2] for line in lines]
+    return [line.partition("exited, ")[2] for line in node.run(ENDS).splitlines()]
 
 
 def override(node: Node, *settings: str):
@@ -65,6 +66,6 @@ def prepare_override(node: Node, path: str, *settings: str):
     node.run(f"mkdir -p {Path(path).parent} && printf '{lines}\\n' >{path}" if settings else f"rm -f {path}")
 
 
-def times_dead(node: Node) -> int:
-    """Return how often the node declared its peer dead."""
-    return sum(line.endswith("Remote server status changed to dead") for line in node.full_log())
+def times_dead(pair: NodePair) -> list[int]:
+    """Return how often each node declared its peer dead."""
+    return [output.count(" Remote server status changed to dead\n") for output in pair.run(FULL_LOG)]

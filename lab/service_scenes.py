@@ -14,31 +14,31 @@ WATCHDOG = "WatchdogSec=10"  # with it a daemon also ends when its peer is silen
 
 def kill(lab, checks: Checks, well: dict):
     checks.scene("The daemon of node-b is killed")
-    times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
+    times_dead, ends = service.times_dead(lab), service.ends(lab.b)
     lab.b.run("systemctl kill --signal=KILL ternhad")
     check_restarted(lab, checks, [*ends, "code=killed, status=9/KILL"], well)
-    checks.equal("node-a has never declared the peer dead", times_dead, service.times_dead(lab.a))
+    checks.equal("neither node has declared its peer dead", times_dead, service.times_dead(lab))
 
 
 def unknown_request(lab, checks: Checks, well: dict):
     checks.scene("node-a sends node-b an unknown request")
-    times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
+    times_dead, ends = service.times_dead(lab), service.ends(lab.b)
     send(lab, "no_such_request")
     check_restarted(lab, checks, [*ends, ABORTED], well)
-    checks.equal("node-a has never declared the peer dead", times_dead, service.times_dead(lab.a))
+    checks.equal("neither node has declared its peer dead", times_dead, service.times_dead(lab))
 
 
 def hung_thread(lab, checks: Checks, well: dict, release: Callable[[], None]):
     """Expects a drop-in with WATCHDOG that replaces the service's /proc/drbd by a FIFO, so that open()
     blocks; `release` ends that for the next start."""
     checks.scene("A thread of node-b's daemon hangs")
-    times_dead, ends = service.times_dead(lab.a), service.ends(lab.b)
+    times_dead, ends = service.times_dead(lab), service.ends(lab.b)
     lab.b.run("systemctl restart ternhad")
     release()
     check_restarted(lab, checks, [*ends, ABORTED], well)
     watchdog = lab.b.run("journalctl --unit=ternhad --output=cat | grep -c 'Watchdog timeout'").strip()
     checks.equal("by the watchdog", "1", watchdog)
-    checks.equal("node-a has never declared the peer dead", times_dead, service.times_dead(lab.a))
+    checks.equal("neither node has declared its peer dead", times_dead, service.times_dead(lab))
 
 
 def reload(lab, checks: Checks):
@@ -69,7 +69,7 @@ def stop(lab, checks: Checks, well: dict):
 
 def upgrade(lab, checks: Checks, well: dict, command: str):
     checks.scene("Rolling upgrade: node-a, then node-b")
-    times_dead = [service.times_dead(node) for node in lab.nodes]
+    times_dead = service.times_dead(lab)
     for node in lab.nodes:
         old_version, starts, configuration = service.installation(node)
         node.run(command, 300)
@@ -78,7 +78,7 @@ def upgrade(lab, checks: Checks, well: dict, command: str):
         checks.equal("its edited configuration is kept", configuration, new_configuration)
         checks.equal("the daemon was restarted once", starts + 1, new_starts)
         checks.within(RETURN_LIMIT, "both are in normal operation again", lab.statuses, [well] * 2)
-    checks.equal("neither node has declared its peer dead", times_dead, [service.times_dead(node) for node in lab.nodes])
+    checks.equal("neither node has declared its peer dead", times_dead, service.times_dead(lab))
 
 
 def send(lab, request: str):
@@ -88,10 +88,9 @@ def send(lab, request: str):
 
 def check_restarted(lab, checks: Checks, ends: list[str], well: dict):
     """Check that the daemon of node-b failed in the last of these ways and was restarted."""
-    checks.within(
-        RETURN_LIMIT,
-        f"it ends ({ends[-1].rpartition('/')[2]}) and is restarted",
-        lambda: (service.ends(lab.b), service.state(lab.b)),
-        (ends, "active"),
-    )
+    def look() -> tuple[str, list[str]]:
+        state = service.state(lab.b)
+        return state, service.ends(lab.b) if state == "active" else []
+
+    checks.within(RETURN_LIMIT, f"it ends ({ends[-1].rpartition('/')[2]}) and is restarted", look, ("active", ends))
     checks.within(RETURN_LIMIT, "both are in normal operation again", lab.statuses, [well] * 2)
