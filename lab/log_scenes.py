@@ -58,7 +58,7 @@ class Before:
     """node-b before its machine went down."""
 
     boot_id: str
-    resets: int
+    resets: int  # of the guest by itself, since the emulator was started
     log: list[str]
 
 
@@ -95,7 +95,7 @@ def lose_power(lab: Lab, checks: Checks) -> Before:
                   expected_lines(301, 350))
     checks.within(RETURN_LIMIT, "the log keeper waits for its next request",
                   lambda: node.run("cat /proc/$(pgrep -x ternhad-logs)/syscall 2>/dev/null || true").split()[:2], READS_STANDARD_INPUT)
-    before = Before(node.boot_id, 0, on_disk(node))
+    before = Before(boot_id=node.boot_id, resets=0, log=on_disk(node))  # no resets of the next emulator
     lab.a.run(START_WRITER)
     begin = time.monotonic()
     lab.lose_power(node)
@@ -120,7 +120,7 @@ def reboot_peer(lab: Lab, checks: Checks) -> Before:
     checks.scene("node-a requests a reboot of node-b")
     log_lines(lab.b, 351, 400)
     checks.equal("50 lines are not on the disk of node-b yet", [], lab_lines(lab.b.run(NEWEST_ON_DISK).splitlines()))
-    before = Before(lab.b.boot_id, len(lab.b.emulator.events("RESET")), lab.b.log())
+    before = Before(boot_id=lab.b.boot_id, resets=len(lab.b.emulator.events("RESET")), log=lab.b.log())
     checks.equal("but in its log", expected_lines(351, 400), lab_lines(before.log))
 
     # All three at once, before the node is back.
