@@ -17,9 +17,10 @@ ON_DISK = (
     "cd /var/log/ha; for file in $(ls -rv ha.daemon.log.*.xz 2>/dev/null); do xz -dc $file; done;"
     " cat ha.daemon.log 2>/dev/null || true"
 )
-# Until not even a block can be added: a large write leaves blocks that a small one can use.
+# Until not even a block can be added: a large write leaves blocks that a small one can use, and so
+# does an archive that is still being written, which fails then.
 FILL = (
-    "cd /var/log/ha; add() { dd if=/dev/zero of=filler oflag=append conv=notrunc,fsync \"$@\" 2>/dev/null; };"
+    "while pgrep -x xz >/dev/null; do sleep 0.1; done; cd /var/log/ha; add() { dd if=/dev/zero of=filler oflag=append conv=notrunc,fsync \"$@\" 2>/dev/null; };"
     " add bs=64k; add bs=1k; ! add bs=1k count=1"
 )
 NEWEST_ON_DISK = "cat /var/log/ha/ha.daemon.log 2>/dev/null || true"
